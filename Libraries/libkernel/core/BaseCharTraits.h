@@ -1,0 +1,106 @@
+#pragma once
+
+#include "libkernel/core/Types.h"
+#include <cstring>
+#include <string>
+#include <type_traits>
+
+namespace Kernel {
+
+/// Operations on raw arrays of code units, whatever the encoding. T is char, char16_t or unsigned int. Lengths are in
+/// units; nothing here looks at code points, and nothing checks its pointers.
+template <class T>
+struct BaseCharTraits
+{
+    /// Units before the terminator.
+    static int GetLength(T const* p)
+    {
+        if constexpr (sizeof(T) == 1) return static_cast<int>(std::strlen(p));
+        T const* end = p;
+        while (*end != 0) ++end;
+        return static_cast<int>(end - p);
+    }
+
+    static void Copy(T* dst, T const* src, int n)
+    {
+        if (n > 0) std::memcpy(dst, src, static_cast<size_t>(n) * sizeof(T));
+    }
+
+    /// Difference of the first differing units, or n minus m. Units of char compare as signed bytes, so that bytes
+    /// above 127 sort before ASCII.
+    static int Compare(T const* a, int n, T const* b, int m)
+    {
+        int const common = n < m ? n : m;
+        for (int i = 0; i < common; ++i)
+            if (a[i] != b[i]) return Difference(a[i], b[i]);
+        return n - m;
+    }
+    static int Compare(T const* a, int n, T const* b) { return Compare(a, n, b, GetLength(b)); }
+    static int Compare(T const* a, T const* b) { return Compare(a, GetLength(a), b, GetLength(b)); }
+
+    static bool IsEqual(T const* a, int n, T const* b, int m)
+    {
+        return n == m && (n <= 0 || std::memcmp(a, b, static_cast<size_t>(n) * sizeof(T)) == 0);
+    }
+    static bool IsEqual(T const* a, int n, T const* b) { return IsEqual(a, n, b, GetLength(b)); }
+
+    /// Index of the first match at or after @p start, or -1. An empty needle matches at @p start.
+    static int Find(T const* s, int n, T const* needle, int m, int start)
+    {
+        if (start < 0) start = 0;
+        for (int i = start; i <= n - m; ++i)
+            if (IsEqual(s + i, m, needle, m)) return i;
+        return -1;
+    }
+    static int Find(T const* s, int n, T unit, int start)
+    {
+        for (int i = start < 0 ? 0 : start; i < n; ++i)
+            if (s[i] == unit) return i;
+        return -1;
+    }
+
+    /// 32-bit hash of the units, sign-extended where they are char. Not for untrusted keys: it is easy to collide.
+    static u32 GenerateHash(T const* s, int n)
+    {
+        u32 h = 0;
+        for (int i = 0; i < n; ++i)
+        {
+            u32 c;
+            if constexpr (sizeof(T) == 1) c = static_cast<u32>(static_cast<i32>(static_cast<signed char>(s[i])));
+            else c = static_cast<u32>(s[i]);
+            h = (h >> 2) + 0x9E3779B9u + c + (h << 6);
+        }
+        return h;
+    }
+
+    static bool IsSpace(T c) { return c == 32; }
+    /// Space, tab or line feed; a carriage return is not white space here.
+    static bool IsWhiteSpace(T c) { return c == 32 || c == 9 || c == 10; }
+
+    /// Removes leading IsWhiteSpace units in place and terminates; the new length.
+    static int TrimLeft(T* s, int n)
+    {
+        int first = 0;
+        while (first < n && IsWhiteSpace(s[first])) ++first;
+        std::memmove(s, s + first, static_cast<size_t>(n - first) * sizeof(T));
+        s[n - first] = 0;
+        return n - first;
+    }
+    /// Removes trailing IsWhiteSpace units in place and terminates; the new length.
+    static int TrimRight(T* s, int n)
+    {
+        while (n > 0 && IsWhiteSpace(s[n - 1])) --n;
+        s[n] = 0;
+        return n;
+    }
+
+private:
+    static int Difference(T a, T b)
+    {
+        if constexpr (sizeof(T) == 1) return static_cast<signed char>(a) - static_cast<signed char>(b);
+        else if constexpr (sizeof(T) == 2) return static_cast<int>(a) - static_cast<int>(b);
+        else return a < b ? -1 : 1; // The difference of two 32-bit units does not fit.
+    }
+};
+
+} // namespace Kernel

@@ -1,0 +1,162 @@
+#include "libkernel/core/String.h"
+
+#include "libkernel/core/BaseCharTraits.h"
+#include <algorithm>
+#include <cstdlib>
+#include <limits>
+#include <new>
+
+namespace Kernel {
+
+template <class Enc>
+constinit typename StringT<Enc>::EmptyBlock StringT<Enc>::s_empty{};
+
+// Block bytes are the header, the units and the terminator, rounded down to 8 after adding 7; the capacity is what then
+// fits. Header and terminator together are 13, 14 and 16 bytes.
+template <class Enc>
+auto StringT<Enc>::Allocate(int units) -> Header*
+{
+    constexpr u64 overhead = sizeof(Header) + sizeof(Unit);
+    u64 const bytes = (static_cast<u64>(units) * sizeof(Unit) + overhead + 7) & ~u64{7};
+    u64 const capacity = (bytes - overhead) / sizeof(Unit);
+    if (capacity > static_cast<u64>(std::numeric_limits<i32>::max())) throw std::bad_alloc();
+    void* const memory = std::malloc(bytes);
+    if (!memory) throw std::bad_alloc();
+    Header* const block = new (memory) Header{{1}, 0, static_cast<i32>(capacity)};
+    return block;
+}
+
+template <class Enc>
+void StringT<Enc>::Free(Header* block)
+{
+    std::free(block);
+}
+
+template <class Enc>
+StringT<Enc>::StringT(Unit const* text) : StringT(text, text ? BaseCharTraits<Unit>::GetLength(text) : 0)
+{
+}
+
+template <class Enc>
+StringT<Enc>::StringT(Unit const* text, int length) : StringT()
+{
+    if (length > 0) BaseCharTraits<Unit>::Copy(SetLength(length), text, length);
+}
+
+template <class Enc>
+void StringT<Enc>::Reserve(int n)
+{
+    if (n <= m_block->capacity && m_block->references.load(std::memory_order_acquire) < 2) return;
+    if (n <= 0)
+    {
+        *this = StringT();
+        return;
+    }
+    Header* const fresh = Allocate(n);
+    fresh->length = std::min(n, m_block->length);
+    BaseCharTraits<Unit>::Copy(UnitsOf(fresh), UnitsOf(m_block), fresh->length);
+    UnitsOf(fresh)[fresh->length] = 0;
+    Release();
+    m_block = fresh;
+}
+
+template <class Enc>
+auto StringT<Enc>::SetLength(int n) -> Unit*
+{
+    Reserve(n);
+    // The shared empty block already says 0 and holds the terminator; writing to it would race with other threads.
+    if (m_block == &s_empty.header) return UnitsOf(m_block);
+    m_block->length = n;
+    UnitsOf(m_block)[n] = 0;
+    return UnitsOf(m_block);
+}
+
+template <class Enc>
+StringT<Enc>& StringT<Enc>::Append(Unit const* text, int length)
+{
+    if (length <= 0) return *this;
+    int const old = GetLength();
+    if (length > std::numeric_limits<i32>::max() - old) throw std::bad_alloc();
+    // The text may lie in this very block: it is kept alive until the copy is made.
+    StringT const keep(*this);
+    BaseCharTraits<Unit>::Copy(SetLength(old + length) + old, text, length);
+    return *this;
+}
+
+template <class Enc>
+StringT<Enc> StringT<Enc>::Joined(StringT const& a, StringT const& b)
+{
+    StringT result(a);
+    result.Append(b);
+    return result;
+}
+
+template <class Enc>
+StringT<Enc> StringT<Enc>::GetSubstring(int start, int count) const
+{
+    int const length = GetLength();
+    start = std::max(start, 0);
+    if (start >= length || count <= 0) return StringT();
+    count = std::min(count, length - start);
+    if (count == length) return *this;
+    return StringT(GetData() + start, count);
+}
+
+template <class Enc>
+int StringT<Enc>::Find(StringT const& needle, int start) const
+{
+    return BaseCharTraits<Unit>::Find(GetData(), GetLength(), needle.GetData(), needle.GetLength(), start);
+}
+
+template <class Enc>
+int StringT<Enc>::Find(Unit unit, int start) const
+{
+    return BaseCharTraits<Unit>::Find(GetData(), GetLength(), unit, start);
+}
+
+template <class Enc>
+int StringT<Enc>::FindLast(Unit unit) const
+{
+    for (int i = GetLength() - 1; i >= 0; --i)
+        if (GetData()[i] == unit) return i;
+    return -1;
+}
+
+template <class Enc>
+bool StringT<Enc>::BeginsWith(StringT const& prefix) const
+{
+    int const n = prefix.GetLength();
+    return n <= GetLength() && BaseCharTraits<Unit>::IsEqual(GetData(), n, prefix.GetData(), n);
+}
+
+template <class Enc>
+bool StringT<Enc>::EndsWith(StringT const& suffix) const
+{
+    int const n = suffix.GetLength();
+    return n <= GetLength() && BaseCharTraits<Unit>::IsEqual(end() - n, n, suffix.GetData(), n);
+}
+
+template <class Enc>
+int StringT<Enc>::Compare(StringT const& o) const
+{
+    return BaseCharTraits<Unit>::Compare(GetData(), GetLength(), o.GetData(), o.GetLength());
+}
+
+template <class Enc>
+bool StringT<Enc>::IsEqual(Unit const* text, int length) const
+{
+    return text == GetData() ? length == GetLength()
+                             : BaseCharTraits<Unit>::IsEqual(GetData(), GetLength(), text, length);
+}
+
+template <class Enc>
+u32 StringT<Enc>::GenerateHash() const
+{
+    return BaseCharTraits<Unit>::GenerateHash(GetData(), GetLength());
+}
+
+template class StringT<TEncUtf8>;
+template class StringT<TEncUtf16>;
+template class StringT<TEncUtf32>;
+
+} // namespace Kernel

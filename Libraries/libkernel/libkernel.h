@@ -1,0 +1,13 @@
+#pragma once
+
+// Every public header of the library. Scripts/check keeps this list whole.
+#include "libkernel/core/BaseCharTraits.h"
+#include "libkernel/core/CheckedMath.h"
+#include "libkernel/core/Countable.h"
+#include "libkernel/core/Endian.h"
+#include "libkernel/core/Exception.h"
+#include "libkernel/core/Export.h"
+#include "libkernel/core/IDTag.h"
+#include "libkernel/core/Limits.h"
+#include "libkernel/core/String.h"
+#include "libkernel/core/Types.h"
