@@ -11,3 +11,8 @@
 #include "libkernel/core/Limits.h"
 #include "libkernel/core/String.h"
 #include "libkernel/core/Types.h"
+#include "libkernel/streams/InOutStream.h"
+#include "libkernel/streams/InStream.h"
+#include "libkernel/streams/OutStream.h"
+#include "libkernel/streams/SeekMethod.h"
+#include "libkernel/streams/StreamCopyProgress.h"
