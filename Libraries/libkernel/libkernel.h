@@ -11,6 +11,7 @@
 #include "libkernel/core/Limits.h"
 #include "libkernel/core/String.h"
 #include "libkernel/core/Types.h"
+#include "libkernel/serialisation/SerialisationStrategy.h"
 #include "libkernel/streams/InOutStream.h"
 #include "libkernel/streams/InStream.h"
 #include "libkernel/streams/OutStream.h"

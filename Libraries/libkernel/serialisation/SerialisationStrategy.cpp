@@ -1,0 +1,7 @@
+#include "libkernel/serialisation/SerialisationStrategy.h"
+
+namespace Kernel {
+
+SerialisationStrategy::~SerialisationStrategy() = default;
+
+} // namespace Kernel
