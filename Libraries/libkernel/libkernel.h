@@ -1,14 +1,18 @@
 #pragma once
 
 // Every public header of the library. Scripts/check keeps this list whole.
+#include "libkernel/core/Abortable.h"
 #include "libkernel/core/BaseCharTraits.h"
+#include "libkernel/core/Buffer.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/Countable.h"
 #include "libkernel/core/Endian.h"
 #include "libkernel/core/Exception.h"
 #include "libkernel/core/Export.h"
+#include "libkernel/core/FragmentedRawData.h"
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/Limits.h"
+#include "libkernel/core/RawData.h"
 #include "libkernel/core/String.h"
 #include "libkernel/core/Types.h"
 #include "libkernel/serialisation/SerialisationStrategy.h"

@@ -10,6 +10,10 @@ namespace Kernel {
 /// Levels of objects, inline classes, parent records, default objects and delay loads in one parse or save.
 constexpr u32 c_maxNesting = 1024;
 
+/// No block is asked for above this size: no machine that runs this has it, and refusing early gives one answer, "no
+/// memory", on systems that would promise the pages and on tools that end the process over such a request.
+constexpr u64 c_maxAllocation = u64{1} << 39;
+
 /// The most that memory may run ahead of the bytes delivered by a source that does not know its size.
 constexpr u64 c_unsizedReadAhead = 1u << 20;
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "libkernel/core/Export.h"
 #include "libkernel/core/Types.h"
 #include <atomic>
 #include <compare>
