@@ -1,0 +1,34 @@
+#pragma once
+
+#include "libkernel/core/Export.h"
+#include "libkernel/core/Types.h"
+
+namespace Kernel::Platform {
+
+/// The operating system's id of the calling thread. Never 0.
+KERNEL_API u64 GetCurrentThreadId();
+
+/// Gives the rest of the time slice away.
+KERNEL_API void YieldThread();
+
+/// Starts a thread that nobody joins. False if the system has no more.
+KERNEL_API bool StartDetachedThread(void (*run)(void*), void* context);
+
+struct CpuCounts
+{
+    int logical = 1;
+    int cores = 1;
+};
+
+/// Processors of the machine, counted anew at each call. Never below 1.
+KERNEL_API CpuCounts CountCpus();
+
+/// Names of the machine and of the user, cut at @p size with the terminator; empty on failure.
+KERNEL_API bool GetHostName(char* name, u64 size);
+KERNEL_API bool GetUserName(char* name, u64 size);
+/// Bytes of memory installed; 0 if unknown.
+KERNEL_API u64 GetMemorySize();
+
+KERNEL_API u64 GetCurrentProcessId();
+
+} // namespace Kernel::Platform
