@@ -1,8 +1,8 @@
 #pragma once
 
 #include "libkernel/core/Types.h"
+
 #include <cstring>
-#include <string>
 #include <type_traits>
 
 namespace Kernel {
@@ -15,10 +15,13 @@ struct BaseCharTraits
     /// Units before the terminator.
     static int GetLength(T const* p)
     {
-        if constexpr (sizeof(T) == 1) return static_cast<int>(std::strlen(p));
-        T const* end = p;
-        while (*end != 0) ++end;
-        return static_cast<int>(end - p);
+        if constexpr (sizeof(T) == 1)
+            return static_cast<int>(std::strlen(p));
+        else {
+            T const* end = p;
+            while (*end != 0) ++end;
+            return static_cast<int>(end - p);
+        }
     }
 
     static void Copy(T* dst, T const* src, int n)
@@ -31,9 +34,8 @@ struct BaseCharTraits
     static int Compare(T const* a, int n, T const* b, int m)
     {
         int const common = n < m ? n : m;
-        for (int i = 0; i < common; ++i)
-            if (a[i] != b[i]) return Difference(a[i], b[i]);
-        return n - m;
+        int const i = CommonPrefix(a, b, common);
+        return i < common ? Difference(a[i], b[i]) : n - m;
     }
     static int Compare(T const* a, int n, T const* b) { return Compare(a, n, b, GetLength(b)); }
     static int Compare(T const* a, T const* b) { return Compare(a, GetLength(a), b, GetLength(b)); }
@@ -48,26 +50,35 @@ struct BaseCharTraits
     static int Find(T const* s, int n, T const* needle, int m, int start)
     {
         if (start < 0) start = 0;
-        for (int i = start; i <= n - m; ++i)
-            if (IsEqual(s + i, m, needle, m)) return i;
+        if (m <= 0) return start <= n ? start : -1;
+        int const ends = n - m + 1; // A match begins before here.
+        for (int i = start; (i = Find(s, ends, needle[0], i)) >= 0; ++i)
+            if (IsEqual(s + i + 1, m - 1, needle + 1, m - 1)) return i;
         return -1;
     }
     static int Find(T const* s, int n, T unit, int start)
     {
-        for (int i = start < 0 ? 0 : start; i < n; ++i)
-            if (s[i] == unit) return i;
-        return -1;
+        if (start < 0) start = 0;
+        if (start >= n) return -1;
+        if constexpr (sizeof(T) == 1) {
+            void const* const found = std::memchr(s + start, static_cast<u8>(unit), static_cast<size_t>(n - start));
+            return found ? static_cast<int>(static_cast<T const*>(found) - s) : -1;
+        } else {
+            while (start < n && s[start] != unit) ++start;
+            return start < n ? start : -1;
+        }
     }
 
     /// 32-bit hash of the units, sign-extended where they are char. Not for untrusted keys: it is easy to collide.
     static u32 GenerateHash(T const* s, int n)
     {
         u32 h = 0;
-        for (int i = 0; i < n; ++i)
-        {
+        for (int i = 0; i < n; ++i) {
             u32 c;
-            if constexpr (sizeof(T) == 1) c = static_cast<u32>(static_cast<i32>(static_cast<signed char>(s[i])));
-            else c = static_cast<u32>(s[i]);
+            if constexpr (sizeof(T) == 1)
+                c = static_cast<u32>(static_cast<i32>(static_cast<signed char>(s[i])));
+            else
+                c = static_cast<u32>(s[i]);
             h = (h >> 2) + 0x9E3779B9u + c + (h << 6);
         }
         return h;
@@ -95,11 +106,24 @@ struct BaseCharTraits
     }
 
 private:
+    // Units that are equal at the start, eight bytes at a time.
+    static int CommonPrefix(T const* a, T const* b, int n)
+    {
+        constexpr int wide = static_cast<int>(8 / sizeof(T));
+        int i = 0;
+        for (; n - i >= wide; i += wide)
+            if (std::memcmp(a + i, b + i, 8) != 0) break;
+        while (i < n && a[i] == b[i]) ++i;
+        return i;
+    }
     static int Difference(T a, T b)
     {
-        if constexpr (sizeof(T) == 1) return static_cast<signed char>(a) - static_cast<signed char>(b);
-        else if constexpr (sizeof(T) == 2) return static_cast<int>(a) - static_cast<int>(b);
-        else return a < b ? -1 : 1; // The difference of two 32-bit units does not fit.
+        if constexpr (sizeof(T) == 1)
+            return static_cast<signed char>(a) - static_cast<signed char>(b);
+        else if constexpr (sizeof(T) == 2)
+            return static_cast<int>(a) - static_cast<int>(b);
+        else
+            return a < b ? -1 : 1; // The difference of two 32-bit units does not fit.
     }
 };
 

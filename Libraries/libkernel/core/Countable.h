@@ -2,6 +2,7 @@
 
 #include "libkernel/core/Export.h"
 #include "libkernel/core/Types.h"
+
 #include <atomic>
 #include <cstddef>
 #include <functional>
@@ -63,15 +64,10 @@ public:
     Counted(Counted const& o) : Counted(o.m_p) {}
     Counted(Counted&& o) noexcept : m_p(std::exchange(o.m_p, nullptr)) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    Counted(Counted<U> const& o) : Counted(static_cast<T*>(o.Get()))
-    {
-    }
+    requires std::is_convertible_v<U*, T*> Counted(Counted<U> const& o) : Counted(static_cast<T*>(o.Get())) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    Counted(Counted<U>&& o) noexcept : m_p(o.Detach())
-    {
-    }
+    requires std::is_convertible_v<U*, T*> Counted(Counted<U>&& o)
+    noexcept : m_p(o.Detach()) {}
     ~Counted()
     {
         if (m_p) m_p->Release();
@@ -130,15 +126,9 @@ public:
     NonCounted(std::nullptr_t) {}
     NonCounted(T* p) : m_p(p) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    NonCounted(NonCounted<U> const& o) : m_p(o.Get())
-    {
-    }
+    requires std::is_convertible_v<U*, T*> NonCounted(NonCounted<U> const& o) : m_p(o.Get()) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    NonCounted(Counted<U> const& o) : m_p(o.Get())
-    {
-    }
+    requires std::is_convertible_v<U*, T*> NonCounted(Counted<U> const& o) : m_p(o.Get()) {}
 
     T* Get() const { return m_p; }
     T* operator->() const { return m_p; }
@@ -181,10 +171,7 @@ public:
     Consolidated() = default;
     Consolidated(std::nullptr_t) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    Consolidated(Consolidated<U> const& o) : m_p(o.GetCounted())
-    {
-    }
+    requires std::is_convertible_v<U*, T*> Consolidated(Consolidated<U> const& o) : m_p(o.GetCounted()) {}
     /// The caller vouches that @p p is the canonical copy.
     static Consolidated Trust(Counted<T> p)
     {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "libkernel/core/Types.h"
+
 #include <bit>
 #include <cstring>
 #include <type_traits>
@@ -13,10 +14,14 @@ template <class T>
 constexpr T ToLittleEndian(T value)
 {
     static_assert(std::is_integral_v<T>);
-    if constexpr (std::endian::native == std::endian::little || sizeof(T) == 1) return value;
-    else if constexpr (sizeof(T) == 2) return static_cast<T>(__builtin_bswap16(static_cast<u16>(value)));
-    else if constexpr (sizeof(T) == 4) return static_cast<T>(__builtin_bswap32(static_cast<u32>(value)));
-    else return static_cast<T>(__builtin_bswap64(static_cast<u64>(value)));
+    if constexpr (std::endian::native == std::endian::little || sizeof(T) == 1)
+        return value;
+    else if constexpr (sizeof(T) == 2)
+        return static_cast<T>(__builtin_bswap16(static_cast<u16>(value)));
+    else if constexpr (sizeof(T) == 4)
+        return static_cast<T>(__builtin_bswap32(static_cast<u32>(value)));
+    else
+        return static_cast<T>(__builtin_bswap64(static_cast<u64>(value)));
 }
 
 /// Writes @p value at @p to, which need not be aligned.

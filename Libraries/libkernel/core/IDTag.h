@@ -1,6 +1,7 @@
 #pragma once
 
 #include "libkernel/core/Types.h"
+
 #include <compare>
 #include <functional>
 

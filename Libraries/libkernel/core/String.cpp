@@ -1,10 +1,13 @@
 #include "libkernel/core/String.h"
 
 #include "libkernel/core/BaseCharTraits.h"
+
 #include <algorithm>
 #include <cstdlib>
 #include <limits>
 #include <new>
+#include <optional>
+#include <utility>
 
 namespace Kernel {
 
@@ -33,22 +36,42 @@ void StringT<Enc>::Free(Header* block)
 }
 
 template <class Enc>
-StringT<Enc>::StringT(Unit const* text) : StringT(text, text ? BaseCharTraits<Unit>::GetLength(text) : 0)
+int StringT<Enc>::CheckedLength(size_t length)
+{
+    if (length > static_cast<size_t>(std::numeric_limits<i32>::max())) throw std::bad_alloc();
+    return static_cast<int>(length);
+}
+
+template <class Enc>
+int StringT<Enc>::Measure(Unit const* text)
+{
+    return text ? BaseCharTraits<Unit>::GetLength(text) : 0;
+}
+
+template <class Enc>
+StringT<Enc>::StringT(Unit const* text) : StringT(text, Measure(text))
 {
 }
 
 template <class Enc>
-StringT<Enc>::StringT(Unit const* text, int length) : StringT()
+StringT<Enc>::StringT(Unit const* text, int length)
 {
-    if (length > 0) BaseCharTraits<Unit>::Copy(SetLength(length), text, length);
+    if (!text || length <= 0) {
+        m_block = &s_empty.header;
+        Retain();
+        return;
+    }
+    m_block = Allocate(length);
+    m_block->length = length;
+    BaseCharTraits<Unit>::Copy(UnitsOf(m_block), text, length);
+    UnitsOf(m_block)[length] = 0;
 }
 
 template <class Enc>
 void StringT<Enc>::Reserve(int n)
 {
-    if (n <= m_block->capacity && m_block->references.load(std::memory_order_acquire) < 2) return;
-    if (n <= 0)
-    {
+    if (HasRoomFor(n)) return;
+    if (n <= 0) {
         *this = StringT();
         return;
     }
@@ -63,6 +86,7 @@ void StringT<Enc>::Reserve(int n)
 template <class Enc>
 auto StringT<Enc>::SetLength(int n) -> Unit*
 {
+    n = std::max(n, 0);
     Reserve(n);
     // The shared empty block already says 0 and holds the terminator; writing to it would race with other threads.
     if (m_block == &s_empty.header) return UnitsOf(m_block);
@@ -74,20 +98,21 @@ auto StringT<Enc>::SetLength(int n) -> Unit*
 template <class Enc>
 StringT<Enc>& StringT<Enc>::Append(Unit const* text, int length)
 {
-    if (length <= 0) return *this;
+    if (!text || length <= 0) return *this;
     int const old = GetLength();
     if (length > std::numeric_limits<i32>::max() - old) throw std::bad_alloc();
-    // The text may lie in this very block: it is kept alive until the copy is made.
-    StringT const keep(*this);
+    // The text may lie in this very block. If that is about to be replaced, it is kept alive until the copy is made.
+    std::optional<StringT> keep;
+    if (!HasRoomFor(old + length)) keep = *this;
     BaseCharTraits<Unit>::Copy(SetLength(old + length) + old, text, length);
     return *this;
 }
 
 template <class Enc>
-StringT<Enc> StringT<Enc>::Joined(StringT const& a, StringT const& b)
+StringT<Enc> StringT<Enc>::Joined(Unit const* a, int n, Unit const* b, int m)
 {
-    StringT result(a);
-    result.Append(b);
+    StringT result;
+    ConcatString(result, a, n, b, m);
     return result;
 }
 
@@ -155,8 +180,26 @@ u32 StringT<Enc>::GenerateHash() const
     return BaseCharTraits<Unit>::GenerateHash(GetData(), GetLength());
 }
 
+template <class Enc>
+void ConcatString(StringT<Enc>& out, typename Enc::Unit const* a, int n, typename Enc::Unit const* b, int m)
+{
+    using Traits = BaseCharTraits<typename Enc::Unit>;
+    n = std::max(n, 0);
+    m = std::max(m, 0);
+    if (n > std::numeric_limits<i32>::max() - m) throw std::bad_alloc();
+    // Built aside, so that the parts may lie in the target.
+    StringT<Enc> joined;
+    auto* const to = joined.SetLength(n + m);
+    Traits::Copy(to, a, n);
+    Traits::Copy(to + n, b, m);
+    out = std::move(joined);
+}
+
 template class StringT<TEncUtf8>;
 template class StringT<TEncUtf16>;
 template class StringT<TEncUtf32>;
+template KERNEL_API void ConcatString(StringT<TEncUtf8>&, char const*, int, char const*, int);
+template KERNEL_API void ConcatString(StringT<TEncUtf16>&, char16_t const*, int, char16_t const*, int);
+template KERNEL_API void ConcatString(StringT<TEncUtf32>&, unsigned int const*, int, unsigned int const*, int);
 
 } // namespace Kernel

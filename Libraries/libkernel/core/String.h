@@ -2,10 +2,12 @@
 
 #include "libkernel/core/Export.h"
 #include "libkernel/core/Types.h"
+
 #include <atomic>
 #include <compare>
 #include <functional>
 #include <string_view>
+#include <type_traits>
 
 namespace Kernel {
 
@@ -40,11 +42,10 @@ public:
     StringT() : m_block(&s_empty.header) { Retain(); }
     /// Copies up to the terminator; null gives the empty string.
     StringT(Unit const* text);
-    /// Copies @p length units; a length below 1 gives the empty string.
+    /// Copies @p length units; null or a length below 1 gives the empty string.
     StringT(Unit const* text, int length);
-    explicit StringT(std::basic_string_view<Unit> text)
-        requires(!std::is_same_v<Unit, unsigned int>)
-        : StringT(text.data(), static_cast<int>(text.size()))
+    explicit StringT(std::basic_string_view<Unit> text) requires(!std::is_same_v<Unit, unsigned int>)
+        : StringT(text.data(), CheckedLength(text.size()))
     {
     }
     StringT(StringT const& o) : m_block(o.m_block)
@@ -82,6 +83,11 @@ public:
     Unit const* begin() const { return GetData(); }
     Unit const* end() const { return GetData() + GetLength(); }
 
+    /// True if a text of @p n units fits into the block as it is: it is private and large enough.
+    bool HasRoomFor(int n) const
+    {
+        return n <= m_block->capacity && m_block->references.load(std::memory_order_acquire) < 2;
+    }
     /// Makes the block private with room for @p n units: nothing happens when it is both already. Otherwise the new
     /// block is sized for exactly n units and keeps min(n, length) of the text; n = 0 gives the empty string.
     void Reserve(int n);
@@ -91,15 +97,25 @@ public:
     /// Makes the block private and gives its units for writing.
     Unit* GetWritable() { return SetLength(GetLength()); }
 
-    /// Appending grows by exact need: reserve once before a loop.
+    /// Appending grows by exact need: reserve once before a loop. The text may lie in this string; null or a length
+    /// below 1 adds nothing.
     StringT& Append(Unit const* text, int length);
     StringT& Append(StringT const& text) { return Append(text.GetData(), text.GetLength()); }
     StringT& Append(Unit unit) { return Append(&unit, 1); }
     StringT& operator+=(StringT const& text) { return Append(text); }
-    StringT& operator+=(Unit const* text) { return Append(StringT(text)); }
-    friend StringT operator+(StringT const& a, StringT const& b) { return Joined(a, b); }
-    friend StringT operator+(StringT const& a, Unit const* b) { return Joined(a, StringT(b)); }
-    friend StringT operator+(Unit const* a, StringT const& b) { return Joined(StringT(a), b); }
+    StringT& operator+=(Unit const* text) { return Append(text, Measure(text)); }
+    friend StringT operator+(StringT const& a, StringT const& b)
+    {
+        return Joined(a.GetData(), a.GetLength(), b.GetData(), b.GetLength());
+    }
+    friend StringT operator+(StringT const& a, Unit const* b)
+    {
+        return Joined(a.GetData(), a.GetLength(), b, Measure(b));
+    }
+    friend StringT operator+(Unit const* a, StringT const& b)
+    {
+        return Joined(a, Measure(a), b.GetData(), b.GetLength());
+    }
 
     /// @p count units from @p start, cut to the end. The whole string shares the block; a start beyond the end gives
     /// the empty string; anything else is a copy.
@@ -118,14 +134,13 @@ public:
     int Compare(StringT const& o) const;
     u32 GenerateHash() const;
 
-    std::basic_string_view<Unit> GetView() const
-        requires(!std::is_same_v<Unit, unsigned int>)
+    std::basic_string_view<Unit> GetView() const requires(!std::is_same_v<Unit, unsigned int>)
     {
         return {GetData(), static_cast<size_t>(GetLength())};
     }
 
     friend bool operator==(StringT const& a, StringT const& b) { return a.IsEqual(b.GetData(), b.GetLength()); }
-    friend bool operator==(StringT const& a, Unit const* b) { return a == StringT(b); }
+    friend bool operator==(StringT const& a, Unit const* b) { return a.IsEqual(b, Measure(b)); }
     friend std::strong_ordering operator<=>(StringT const& a, StringT const& b) { return a.Compare(b) <=> 0; }
 
     /// True if both share one block; for tests of the sharing rule.
@@ -148,7 +163,9 @@ private:
     static Unit* UnitsOf(Header* h) { return reinterpret_cast<Unit*>(h + 1); }
     static Unit const* UnitsOf(Header const* h) { return reinterpret_cast<Unit const*>(h + 1); }
     static Header* Allocate(int units);
-    static StringT Joined(StringT const& a, StringT const& b);
+    static int CheckedLength(size_t length);
+    static int Measure(Unit const* text);
+    static StringT Joined(Unit const* a, int n, Unit const* b, int m);
     bool IsEqual(Unit const* text, int length) const;
     void Retain() { m_block->references.fetch_add(1, std::memory_order_relaxed); }
     void Release()
@@ -163,9 +180,17 @@ private:
     Header* m_block; // Null only after a move.
 };
 
+/// Makes @p out exactly @p n + @p m units: those at @p a, then those at @p b; a length below 1 adds nothing. Both may
+/// lie in @p out. Throws std::bad_alloc when there is no memory or the text would pass 2^31 units.
+template <class Enc>
+void ConcatString(StringT<Enc>& out, typename Enc::Unit const* a, int n, typename Enc::Unit const* b, int m);
+
 extern template class KERNEL_API StringT<TEncUtf8>;
 extern template class KERNEL_API StringT<TEncUtf16>;
 extern template class KERNEL_API StringT<TEncUtf32>;
+extern template KERNEL_API void ConcatString(StringT<TEncUtf8>&, char const*, int, char const*, int);
+extern template KERNEL_API void ConcatString(StringT<TEncUtf16>&, char16_t const*, int, char16_t const*, int);
+extern template KERNEL_API void ConcatString(StringT<TEncUtf32>&, unsigned int const*, int, unsigned int const*, int);
 
 using String8 = StringT<TEncUtf8>;
 using String16 = StringT<TEncUtf16>;

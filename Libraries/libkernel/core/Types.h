@@ -1,6 +1,7 @@
 #pragma once
 
 #include "libkernel/core/Export.h"
+
 #include <cstddef>
 #include <cstdint>
 

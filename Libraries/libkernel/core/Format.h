@@ -1,0 +1,131 @@
+#pragma once
+
+#include "libkernel/core/BaseCharTraits.h"
+#include "libkernel/core/ConvertEnc.h"
+#include "libkernel/core/NumberText.h"
+
+#include <new>
+
+namespace Kernel {
+
+/// One argument of a format call, made from a value before formatting starts: a string in any encoding, a terminated
+/// array of units, or an integer in decimal. Lives on the stack for the length of the call. A terminated array of the
+/// target's own units is borrowed for that time; everything else is copied or shared.
+template <class S>
+class FormatHolderT
+{
+public:
+    using Unit = typename S::Unit;
+
+    explicit FormatHolderT(S const& text) : m_data(text.GetData()), m_length(text.GetLength()) { Keep(text); }
+    template <class Enc>
+    requires(!std::same_as<StringT<Enc>, S>) explicit FormatHolderT(StringT<Enc> const& text)
+    {
+        Keep(ConvertedTo<typename S::EncodingType>(text));
+        m_data = m_string.text.GetData();
+        m_length = m_string.text.GetLength();
+    }
+    /// Null shows as nothing.
+    explicit FormatHolderT(Unit const* text) : m_data(text), m_length(text ? BaseCharTraits<Unit>::GetLength(text) : 0)
+    {
+    }
+    /// UTF-8 text for a wider target; null shows as nothing.
+    explicit FormatHolderT(char const* text) requires(!std::same_as<Unit, char>) : FormatHolderT(String8(text)) {}
+    template <TextInteger T>
+    explicit FormatHolderT(T value)
+    {
+        Unit* const end = m_digits + NumberTextDetail::c_maxDecimalLength;
+        m_data = NumberTextDetail::WriteDecimal(end, NumberTextDetail::Split(value));
+        m_length = static_cast<int>(end - m_data);
+    }
+    FormatHolderT(FormatHolderT const&) = delete;
+    FormatHolderT& operator=(FormatHolderT const&) = delete;
+    ~FormatHolderT()
+    {
+        if (m_hasString) m_string.text.~S();
+    }
+
+    Unit const* GetData() const { return m_data; }
+    int GetLength() const { return m_length; }
+
+private:
+    // A string member is made only where one is needed: making an empty one costs two atomic operations.
+    union Room
+    {
+        Room() {}
+        ~Room() {}
+        S text;
+    };
+
+    void Keep(S const& text)
+    {
+        new (&m_string.text) S(text);
+        m_hasString = true;
+    }
+
+    Unit const* m_data = nullptr;
+    int m_length = 0;
+    bool m_hasString = false;
+    Room m_string;
+    Unit m_digits[NumberTextDetail::c_maxDecimalLength];
+};
+
+/// The format engine: appends @p format to @p out, with each placeholder replaced by its argument, and gives the number
+/// of units appended.
+///
+/// "%1", "%2" and so on are placeholders; all digits that follow belong to the number, and an argument may be used many
+/// times or never. A number beyond the arguments gives nothing, "%%" gives one "%", "%" before anything else disappears
+/// together with that unit, and at the very end it gives nothing. The target grows once. A null format clears the
+/// target and gives 0. A text that would make the target longer than 2^31 - 1 units gives 0 and leaves the target as it
+/// was. Format and arguments may lie in the target. Throws std::bad_alloc when there is no memory.
+template <class S>
+int AppendFormatVT(S& out, typename S::Unit const* format, FormatHolderT<S> const* args, u64 count);
+
+extern template KERNEL_API int AppendFormatVT<String8>(String8&, char const*, FormatHolderT<String8> const*, u64);
+extern template KERNEL_API int AppendFormatVT<String16>(String16&, char16_t const*, FormatHolderT<String16> const*,
+                                                        u64);
+extern template KERNEL_API int AppendFormatVT<String32>(String32&, unsigned int const*, FormatHolderT<String32> const*,
+                                                        u64);
+
+/// AppendFormatVT with the arguments given one by one.
+template <class S, class... Args>
+int AppendFormatT(S& out, typename S::Unit const* format, Args const&... args)
+{
+    if constexpr (sizeof...(Args) == 0)
+        return AppendFormatVT<S>(out, format, nullptr, 0);
+    else {
+        FormatHolderT<S> const holders[] = {FormatHolderT<S>(args)...};
+        return AppendFormatVT<S>(out, format, holders, sizeof...(Args));
+    }
+}
+template <class S, class... Args>
+S FormatT(typename S::Unit const* format, Args const&... args)
+{
+    S result;
+    AppendFormatT<S>(result, format, args...);
+    return result;
+}
+
+template <class... Args>
+int AppendFormat(String8& out, char const* format, Args const&... args)
+{
+    return AppendFormatT<String8>(out, format, args...);
+}
+template <class... Args>
+int AppendFormat(String8& out, String8 const& format, Args const&... args)
+{
+    return AppendFormatT<String8>(out, format.GetData(), args...);
+}
+/// The formatted text; the empty string for a null format.
+template <class... Args>
+String8 Format(char const* format, Args const&... args)
+{
+    return FormatT<String8>(format, args...);
+}
+template <class... Args>
+String8 Format(String8 const& format, Args const&... args)
+{
+    return FormatT<String8>(format.GetData(), args...);
+}
+
+} // namespace Kernel

@@ -1,0 +1,82 @@
+#include "libkernel/core/Format.h"
+
+#include <gtest/gtest.h>
+#include <memory>
+#include <vector>
+
+namespace Kernel {
+namespace {
+
+TEST(FormatTest, PlaceholdersFollowTheRules)
+{
+    struct Case
+    {
+        char const* format;
+        char const* expected;
+    };
+    for (Case const& c : {Case{"%1%%%2", "a%b"}, Case{"%3", ""}, Case{"100%", "100"}, Case{"%2-%1-%2", "b-a-b"},
+                          Case{"x%0y%xz", "xyz"}, Case{"%12", ""}, Case{"%1.2", "a.2"}, Case{"", ""}, Case{"%", ""},
+                          Case{"%%%", "%"}, Case{"%4294967297", ""}, Case{"%18446744073709551617", ""},
+                          Case{"%99999999999999999999999999999999991 %1", " a"}, Case{"%01", "1"}, Case{"%\n%1", "a"}})
+    {
+        SCOPED_TRACE(c.format);
+        String8 out("<");
+        int const added = AppendFormat(out, c.format, "a", String8("b"));
+        EXPECT_EQ(out, String8("<") + c.expected);
+        EXPECT_EQ(added, static_cast<int>(strlen(c.expected)));
+    }
+}
+
+TEST(FormatTest, ArgumentsOfAllKindsMeetInOneEncoding)
+{
+    EXPECT_EQ(
+        Format("%1 %2 %3 %4", -5, u64{18446744073709551615u}, String16(u"\u00E9"), static_cast<char const*>(nullptr)),
+        "-5 18446744073709551615 \xC3\xA9 ");
+    EXPECT_EQ(FormatT<String16>(u"%1 of %2", "\xE2\x82\xAC", INT64_MIN), u"\u20AC of -9223372036854775808");
+}
+
+TEST(FormatTest, NullFormatClearsTheTarget)
+{
+    String8 out("abc");
+    EXPECT_EQ(AppendFormat(out, static_cast<char const*>(nullptr), 1), 0);
+    EXPECT_TRUE(out.IsEmpty());
+}
+
+TEST(FormatTest, SharedTargetBecomesPrivateAndGrowsOnce)
+{
+    String8 const original("abc");
+    String8 out(original);
+    AppendFormat(out, "%1", 7);
+    EXPECT_EQ(original, "abc");
+    EXPECT_EQ(out, "abc7");
+    String8 roomy;
+    roomy.Reserve(100);
+    char const* const units = roomy.GetData();
+    AppendFormat(roomy, "%1%1", "xyz");
+    EXPECT_EQ(roomy.GetData(), units);
+}
+
+TEST(FormatTest, FormatAndArgumentsMayLieInTheTarget)
+{
+    for (int room : {0, 200}) {
+        SCOPED_TRACE(room);
+        String8 out("<%1|%2>");
+        out.Reserve(room);
+        AppendFormat(out, out, out, out.GetData() + 4);
+        EXPECT_EQ(out, "<%1|%2><<%1|%2>|%2>>");
+    }
+}
+
+TEST(FormatTest, TextBeyondTheLargestLengthLeavesTheTarget)
+{
+    String8 format;
+    for (int i = 0; i < 4096; ++i) format += "%1";
+    String8 big;
+    std::memset(big.SetLength(1 << 20), 'x', 1 << 20);
+    String8 out("abc");
+    EXPECT_EQ(AppendFormat(out, format, big), 0);
+    EXPECT_EQ(out, "abc");
+}
+
+} // namespace
+} // namespace Kernel
