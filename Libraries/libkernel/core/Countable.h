@@ -30,6 +30,18 @@ public:
         if (m_count.fetch_sub(1, std::memory_order_acq_rel) == 1) delete this;
     }
 
+    /// Retains unless the count is 0, and says whether it did. For owners of plain pointers that the object takes back
+    /// in its destructor, under a lock that the caller holds: an object at 0 is being destroyed, or nobody has taken it
+    /// yet.
+    [[nodiscard]] bool RetainIfAlive() const
+    {
+        i32 count = m_count.load(std::memory_order_relaxed);
+        while (count > 0)
+            if (m_count.compare_exchange_weak(count, count + 1, std::memory_order_acquire, std::memory_order_relaxed))
+                return true;
+        return false;
+    }
+
     /// The count at this moment; meaningful only where the caller knows who else can hold the object.
     i32 GetReferenceCount() const { return m_count.load(std::memory_order_acquire); }
 
@@ -108,6 +120,16 @@ template <class T, class... Args>
 Counted<T> MakeCounted(Args&&... args)
 {
     return Counted<T>(new T(std::forward<Args>(args)...));
+}
+
+/// A reference to @p p, or null if it is null or at count 0; see Countable::RetainIfAlive for when that may be asked.
+template <class T>
+Counted<T> CountedIfAlive(T* p)
+{
+    if (!p || !p->RetainIfAlive()) return nullptr;
+    Counted<T> result(p);
+    p->Release();
+    return result;
 }
 
 /// The object as a @p T, or null if it is not one.
