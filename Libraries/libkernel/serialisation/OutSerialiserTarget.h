@@ -1,0 +1,63 @@
+#pragma once
+
+#include "libkernel/core/Export.h"
+#include "libkernel/core/Types.h"
+
+#include <cstring>
+
+namespace Kernel {
+
+class OutStream;
+
+/// The bytes on their way from the serialisers of one save to its stream: a buffer, so that a property costs a few
+/// stores and no call through a table. Large blocks go past it. Belongs to the thread of the save.
+///
+/// Nothing is written after the stream took less than it was given: from then on everything fails.
+class KERNEL_API OutSerialiserTarget
+{
+public:
+    static constexpr u64 c_bufferSize = 16384;
+    /// The most that Claim gives.
+    static constexpr u64 c_maxClaim = 256;
+
+    /// @p stream is borrowed and must live as long.
+    explicit OutSerialiserTarget(OutStream& stream);
+    OutSerialiserTarget(OutSerialiserTarget const&) = delete;
+    OutSerialiserTarget& operator=(OutSerialiserTarget const&) = delete;
+
+    /// Room for @p count bytes, at most c_maxClaim, which the caller fills at once. Null when the stream failed.
+    u8* Claim(u64 count)
+    {
+        if (count > static_cast<u64>(m_end - m_next) && !Flush()) return nullptr;
+        u8* const room = m_next;
+        m_next += count;
+        return room;
+    }
+    /// False when the stream failed.
+    bool Put(void const* bytes, u64 count)
+    {
+        if (count > static_cast<u64>(m_end - m_next)) return PutLarge(bytes, count);
+        if (count) std::memcpy(m_next, bytes, count);
+        m_next += count;
+        return true;
+    }
+    /// Hands what is held back to the stream. False when it failed, now or before.
+    bool Flush();
+    /// Size of the stream with what is held back.
+    u64 GetSize() const;
+    /// The stream, with nothing held back; null when it failed.
+    OutStream* GetFlushedStream();
+    /// Makes everything from now on fail.
+    void MarkAsFailed();
+
+private:
+    bool PutLarge(void const* bytes, u64 count);
+
+    OutStream& m_stream;
+    u8* m_next;
+    u8* m_end; // The start of the buffer once the stream has failed, so that there is never room.
+    bool m_failed = false;
+    u8 m_buffer[c_bufferSize];
+};
+
+} // namespace Kernel
