@@ -41,11 +41,14 @@ public:
 protected:
     explicit Progress(String8 const& description);
     Progress(String8 const& description, Counted<ProgressReporter> const& reporter);
-    /// Detaches the reporter, which may live on.
+    /// Detaches the reporter, which may live on. A class whose reporter may be set while it goes away detaches it in
+    /// its own destructor, before OnProgressUpdate is gone.
     ~Progress() override;
 
 private:
-    CriticalSectionSpin m_lock; // Guards all below but the description, which never changes.
+    mutable CriticalSectionSpin
+        m_attachLock;                   // Held through SetReporter, never while reading; taken before a guard lock.
+    mutable CriticalSectionSpin m_lock; // Guards all below but the description, which never changes.
     String8 const m_description;
     Counted<ProgressReporter> m_reporter;
     bool m_indeterminate = false;

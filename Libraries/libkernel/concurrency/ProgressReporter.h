@@ -106,6 +106,8 @@ protected:
 
     private:
         friend class MultiProgressReporter;
+        void ForgetParent();
+
         CriticalSectionSpin m_parentLock;
         MultiProgressReporter* m_parent; // Not counted; null once the parent has gone. Guarded by m_parentLock.
         double const m_weight;
@@ -118,6 +120,8 @@ protected:
     ~MultiProgressReporter() override;
 
     Counted<SubProgress> AddItemI(double weight, String8 const& description);
+    // The first @p complete children count in full.
+    double GetWeightedMeanCS(u64 complete) const;
 
     mutable CriticalSectionSpin m_valueLock; // Guards m_items and what derived classes add.
     std::vector<Counted<SubProgress>> m_items;
@@ -163,7 +167,10 @@ protected:
     ~SequenceProgressReporter() override;
 
 private:
-    u64 m_current = 0; // At most the list's size.
+    template <class Match>
+    bool BeginFirst(Match&& match);
+
+    u64 m_current = 0; // Guarded by m_valueLock. May lie past the list's end.
 };
 
 } // namespace Kernel

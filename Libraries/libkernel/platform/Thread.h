@@ -11,8 +11,11 @@ KERNEL_API u64 GetCurrentThreadId();
 /// Gives the rest of the time slice away.
 KERNEL_API void YieldThread();
 
-/// Starts a thread that nobody joins. False if the system has no more.
+/// Starts a thread that nobody joins, with every signal blocked. False if the system has no more.
 KERNEL_API bool StartDetachedThread(void (*run)(void*), void* context);
+
+/// True if that thread of this process runs or waits only for a processor.
+KERNEL_API bool IsThreadRunnable(u64 id);
 
 struct CpuCounts
 {
@@ -22,6 +25,9 @@ struct CpuCounts
 
 /// Processors of the machine, counted anew at each call. Never below 1.
 KERNEL_API CpuCounts CountCpus();
+
+/// Processors that this process may run on. Never below 1.
+KERNEL_API int CountUsableCpus();
 
 /// Names of the machine and of the user, cut at @p size with the terminator; empty on failure.
 KERNEL_API bool GetHostName(char* name, u64 size);

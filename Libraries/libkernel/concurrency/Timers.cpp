@@ -1,0 +1,257 @@
+#include "libkernel/concurrency/Timer.h"
+#include "libkernel/platform/Debug.h"
+
+#include <cstdio>
+#include <limits>
+#include <string>
+
+namespace Kernel {
+namespace {
+
+// Decimals rounded half up on the 14 that are printed, as all the library's numbers are.
+std::string ToDecimals(double value, int decimals, int width)
+{
+    char digits[400];
+    int const length = std::snprintf(digits, sizeof digits, "%.14f", value);
+    std::string text(digits, static_cast<size_t>(length));
+    size_t const point = text.find('.');
+    if (point != std::string::npos) {
+        bool const up = text[point + 1 + static_cast<size_t>(decimals)] >= '5';
+        text.resize(point + 1 + static_cast<size_t>(decimals));
+        size_t i = text.size();
+        bool carry = up;
+        while (carry && i-- > 0) {
+            if (text[i] == '.') continue;
+            if (text[i] < '0' || text[i] > '9') break;
+            carry = text[i] == '9';
+            text[i] = carry ? '0' : static_cast<char>(text[i] + 1);
+        }
+        if (carry) text.insert(text[0] == '-' ? 1 : 0, 1, '1');
+    }
+    if (text.size() < static_cast<size_t>(width)) text.insert(0, static_cast<size_t>(width) - text.size(), ' ');
+    return text;
+}
+
+std::string ToField(u64 value, int width)
+{
+    char text[32];
+    std::snprintf(text, sizeof text, "%*llu", width, static_cast<unsigned long long>(value));
+    return text;
+}
+
+} // namespace
+
+Timers::Timers(char const* description) : Timers(10, description) {}
+Timers::Timers(u64 n, char const* description) : m_slots(n), m_description(description) {}
+
+Timers::~Timers()
+{
+    if (m_hasData) Report();
+}
+
+bool Timers::Acquire()
+{
+    if (m_users.fetch_add(1) == 0) return true;
+    m_users.fetch_sub(1);
+    return false;
+}
+
+void Timers::Release()
+{
+    m_users.fetch_sub(1);
+}
+
+void Timers::Start(u64 slot, char const* description)
+{
+    SetDescription(slot, description);
+    m_slots[slot].timer.Reset();
+}
+
+void Timers::Stop(u64 slot, char const* description)
+{
+    m_slots[slot].milliseconds += m_slots[slot].timer.GetMilliseconds();
+    IncrementCount(slot, description);
+}
+
+void Timers::IncrementCount(u64 slot, char const* description)
+{
+    ++m_slots[slot].count;
+    m_hasData = true;
+    SetDescription(slot, description);
+}
+
+void Timers::SetDescription(u64 slot, char const* description)
+{
+    if (description) m_slots[slot].description = description;
+}
+
+void Timers::Clear()
+{
+    m_slots.assign(m_slots.size(), Slot());
+    m_hasData = false;
+}
+
+u64 Timers::GetTotalCount() const
+{
+    u64 total = 0;
+    for (Slot const& slot : m_slots) total += slot.count;
+    return total;
+}
+
+double Timers::GetTotalMilliseconds() const
+{
+    double total = 0.0;
+    for (Slot const& slot : m_slots) total += slot.milliseconds;
+    return total;
+}
+
+String8 Timers::GetReportString() const
+{
+    u64 const count = GetTotalCount();
+    if (count == 0) return {};
+    double const total = GetTotalMilliseconds();
+    std::string text;
+    if (m_description && *m_description) text.append(m_description).append(":\n");
+    text.append("     Id   Count  Total tm    Tm/call   Rel tm\n");
+    for (u64 i = 0; i < m_slots.size(); ++i) {
+        Slot const& slot = m_slots[i];
+        if (slot.count == 0) continue;
+        double const share = total == 0.0 ? 0.0 : slot.milliseconds / total * 100.0;
+        text.append(ToField(i, 7)).append(" ").append(ToField(slot.count, 7)).append(" ");
+        text.append(ToDecimals(slot.milliseconds, 3, 9)).append(" ");
+        text.append(ToDecimals(slot.milliseconds / slot.count, 6, 11)).append(" ");
+        text.append(ToDecimals(share, 1, 5)).append(" ");
+        text.append(slot.description ? slot.description : "").append("\n");
+    }
+    text.append("Totals: ").append(ToField(count, 7)).append(" ").append(ToDecimals(total, 3, 9)).append(" ");
+    text.append(ToDecimals(total / static_cast<double>(count), 6, 11)).append(" 100.0\n");
+    return String8(std::string_view(text));
+}
+
+void Timers::Report()
+{
+    String8 const text = GetReportString();
+    if (Platform::IsDebuggerAttached())
+        Platform::WriteDebugOutput(text.GetData());
+    else
+        Platform::ShowMessage("Timers::Report", text.GetData());
+    m_hasData = false;
+}
+
+TimersSession::TimersSession(Timers& timers, char const* description) : TimersSession(timers, 0, description) {}
+
+TimersSession::TimersSession(Timers& timers, u64 slot, char const* description) : m_timers(&timers), m_current(slot)
+{
+    Begin(description);
+}
+
+TimersSession::TimersSession(char const* description) : m_timers(new Timers(nullptr)), m_owns(true)
+{
+    Begin(description);
+}
+
+TimersSession::~TimersSession()
+{
+    Release();
+    if (m_owns) delete m_timers;
+}
+
+void TimersSession::Begin(char const* description)
+{
+    if (!m_timers->Acquire()) return;
+    m_active = true;
+    m_stopped = false;
+    Need(m_current);
+    m_timers->Start(m_current, description);
+}
+
+void TimersSession::Need(u64 slot)
+{
+    if (slot >= m_timers->size()) m_timers->resize(slot + 10);
+}
+
+void TimersSession::StopCurrent()
+{
+    if (!m_stopped) m_timers->Stop(m_current);
+    m_stopped = true;
+}
+
+void TimersSession::Release()
+{
+    if (!m_active) return;
+    StopCurrent();
+    m_timers->Release();
+    m_active = false;
+}
+
+void TimersSession::Next(char const* description)
+{
+    SetNext(m_current + 1, description);
+}
+
+void TimersSession::SetNext(u64 slot, char const* description)
+{
+    if (!m_active) return;
+    StopCurrent();
+    m_current = slot;
+    Need(slot);
+    m_timers->Start(slot, description);
+    m_stopped = false;
+}
+
+void TimersSession::Skip(int n)
+{
+    if (!m_active) return;
+    StopCurrent();
+    u64 const back = n < 0 ? static_cast<u64>(-static_cast<i64>(n)) : 0;
+    m_current = n < 0 ? m_current - (back < m_current ? back : m_current) : m_current + static_cast<u64>(n);
+    Need(m_current);
+}
+
+void TimersSession::Start(u64 slot)
+{
+    if (m_active) m_timers->Start(slot);
+}
+
+void TimersSession::Start(u64 slot, char const* description)
+{
+    if (!m_active) return;
+    m_timers->Start(slot, description);
+    if (slot == m_current) m_stopped = false;
+}
+
+void TimersSession::Stop()
+{
+    if (!m_active) return;
+    m_timers->Stop(m_current);
+    m_stopped = true;
+}
+
+void TimersSession::Stop(u64 slot)
+{
+    if (!m_active) return;
+    m_timers->Stop(slot);
+    if (slot == m_current) m_stopped = true;
+}
+
+void TimersSession::Restart()
+{
+    if (!m_active) return;
+    m_stopped = false;
+    m_timers->Start(m_current);
+}
+
+void TimersSession::IncrementCount(u64 slot, char const* description)
+{
+    if (m_active) m_timers->IncrementCount(slot, description);
+}
+
+void TimersSession::Clear()
+{
+    if (!m_active) return;
+    StopCurrent();
+    m_current = 0;
+    m_timers->Clear();
+}
+
+} // namespace Kernel
