@@ -2,34 +2,81 @@
 
 #include "libkernel/platform/Time.h"
 
-#include <cstdio>
-#include <cstring>
-#include <limits>
+#include <cctype>
+#include <charconv>
 
 namespace Kernel {
 namespace {
 
-// The forms of a zone, in the order in which they are tried, behind the civil fields. Signs are applied to the numbers
-// read; with "follow" the minutes take the sign of the hours.
-struct ZoneForm
+// The forms of a time stamp, in the order in which they are tried: civil fields, then a zone. In a pattern "4" and "2"
+// are whole numbers of that many characters at most, a sign among them, "f" is a number with a fraction, and anything
+// else stands for itself. The scanner is our own, because the C library's depends on the host's locale.
+struct Form
 {
-    char const* pattern;
-    int numbers; // Of the zone, 0 to 2.
-    int sign;
-    bool follow;
+    char const* zone;
+    int sign;    // Of both numbers of the zone.
+    bool follow; // The minutes take the sign of the hours.
     bool hasZone;
 };
 
-#define KERNEL_CIVIL_FIELDS "%4d-%2d-%2dT%2d:%2d:%f"
-constexpr int c_civilNumbers = 6;
-constexpr ZoneForm c_zoneForms[] = {
-    {KERNEL_CIVIL_FIELDS "%2d:%2d%n", 2, 1, true, true},    {KERNEL_CIVIL_FIELDS "+%2d%2d%n", 2, 1, false, true},
-    {KERNEL_CIVIL_FIELDS "-%2d%2d%n", 2, -1, false, true},  {KERNEL_CIVIL_FIELDS "+%2d:%2d%n", 2, 1, false, true},
-    {KERNEL_CIVIL_FIELDS "-%2d:%2d%n", 2, -1, false, true}, {KERNEL_CIVIL_FIELDS "+%2d%n", 1, 1, false, true},
-    {KERNEL_CIVIL_FIELDS "-%2d%n", 1, -1, false, true},     {KERNEL_CIVIL_FIELDS "Z%n", 0, 1, false, true},
-    {KERNEL_CIVIL_FIELDS "%n", 0, 1, false, false},
+constexpr char c_civilPattern[] = "4-2-2T2:2:f";
+constexpr Form c_forms[] = {
+    {"2:2", 1, true, true},   {"+22", 1, false, true},   {"-22", -1, false, true},
+    {"+2:2", 1, false, true}, {"-2:2", -1, false, true}, {"+2", 1, false, true},
+    {"-2", -1, false, true},  {"Z", 1, false, true},     {"", 1, false, false},
 };
-#undef KERNEL_CIVIL_FIELDS
+
+bool IsDigit(char c)
+{
+    return c >= '0' && c <= '9';
+}
+
+bool ScanInteger(char const*& at, int width, int& value)
+{
+    while (std::isspace(static_cast<unsigned char>(*at))) ++at;
+    bool const negative = *at == '-';
+    if (*at == '-' || *at == '+') {
+        ++at;
+        --width;
+    }
+    if (width <= 0 || !IsDigit(*at)) return false;
+    int magnitude = 0;
+    for (; width > 0 && IsDigit(*at); --width) magnitude = magnitude * 10 + (*at++ - '0');
+    value = negative ? -magnitude : magnitude;
+    return true;
+}
+
+// Whole seconds of a number with a fraction.
+bool ScanSeconds(char const*& at, char const* end, int& value)
+{
+    while (std::isspace(static_cast<unsigned char>(*at))) ++at;
+    bool const signedNumber = *at == '-' || *at == '+';
+    bool const negative = *at == '-';
+    char const* const digits = at + signedNumber;
+    if (!IsDigit(*digits) && *digits != '.') return false;
+    float number = 0.0f;
+    std::from_chars_result const result = std::from_chars(digits, end, number);
+    if (result.ec != std::errc() || !(number < 1e6f)) return false;
+    at = result.ptr;
+    value = static_cast<int>(negative ? -number : number);
+    return true;
+}
+
+// Matches @p pattern from @p at on, and puts the numbers that it finds where @p numbers points, one behind the other.
+bool Scan(char const*& at, char const* end, char const* pattern, int*& numbers)
+{
+    for (; *pattern; ++pattern) {
+        bool matched = false;
+        switch (*pattern) {
+        case '4': matched = ScanInteger(at, 4, *numbers++); break;
+        case '2': matched = ScanInteger(at, 2, *numbers++); break;
+        case 'f': matched = ScanSeconds(at, end, *numbers++); break;
+        default: matched = *at++ == *pattern;
+        }
+        if (!matched) return false;
+    }
+    return true;
+}
 
 struct Parsed
 {
@@ -38,41 +85,29 @@ struct Parsed
     bool hasZone = false;
 };
 
-bool Matches(char const* text, int length, ZoneForm const& form, Parsed& out)
+bool Matches(char const* at, char const* end, Form const& form, Parsed& out)
 {
-    int year = 0;
-    int month = 0;
-    int hours = 0;
-    int minutes = 0;
-    int end = -1;
-    float seconds = 0.0f;
-    std::tm f = {};
-    // What a pattern doesn't use it doesn't write: the end goes where the pattern has its "%n".
-    void* const zone[] = {&hours, &minutes, &end};
-    void* const first = form.numbers > 0 ? zone[0] : zone[2];
-    void* const second = form.numbers > 1 ? zone[1] : zone[2];
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wformat-nonliteral"
-    int const got = std::sscanf(text, form.pattern, &year, &month, &f.tm_mday, &f.tm_hour, &f.tm_min, &seconds, first,
-                                second, &end);
-#pragma GCC diagnostic pop
-    if (got != c_civilNumbers + form.numbers || end != length) return false;
-    if (!(seconds > -1e6f && seconds < 1e6f)) return false; // Not a number of seconds that an int can take.
-    f.tm_year = year - 1900;
-    f.tm_mon = month - 1;
-    f.tm_sec = static_cast<int>(seconds);
-    f.tm_isdst = -1;
-    if (form.follow && hours < 0) minutes = -minutes;
-    out.fields = f;
-    out.offsetMinutes = form.sign * (hours * i64{60} + minutes);
+    int numbers[8] = {}; // Year to seconds, and the zone's.
+    int* next = numbers;
+    if (!Scan(at, end, c_civilPattern, next) || !Scan(at, end, form.zone, next) || at != end) return false;
+    std::tm& f = out.fields;
+    f.tm_year = numbers[0] - 1900;
+    f.tm_mon = numbers[1] - 1;
+    f.tm_mday = numbers[2];
+    f.tm_hour = numbers[3];
+    f.tm_min = numbers[4];
+    f.tm_sec = numbers[5];
+    f.tm_isdst = -1; // Summer time as the date has it.
+    int const minutes = form.follow && numbers[6] < 0 ? -numbers[7] : numbers[7];
+    out.offsetMinutes = form.sign * (numbers[6] * i64{60} + minutes);
     out.hasZone = form.hasZone;
     return true;
 }
 
 bool Parse(String8 const& text, Parsed& out)
 {
-    for (ZoneForm const& form : c_zoneForms) {
-        if (Matches(text.GetData(), text.GetLength(), form, out)) return true;
+    for (Form const& form : c_forms) {
+        if (Matches(text.begin(), text.end(), form, out)) return true;
     }
     return false;
 }

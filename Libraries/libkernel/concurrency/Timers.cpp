@@ -1,8 +1,8 @@
 #include "libkernel/concurrency/Timer.h"
 #include "libkernel/platform/Debug.h"
 
+#include <charconv>
 #include <cstdio>
-#include <limits>
 #include <string>
 
 namespace Kernel {
@@ -11,9 +11,9 @@ namespace {
 // Decimals rounded half up on the 14 that are printed, as all the library's numbers are.
 std::string ToDecimals(double value, int decimals, int width)
 {
-    char digits[400];
-    int const length = std::snprintf(digits, sizeof digits, "%.14f", value);
-    std::string text(digits, static_cast<size_t>(length));
+    char digits[400]; // 309 digits before the point at most.
+    std::to_chars_result const end = std::to_chars(digits, digits + sizeof digits, value, std::chars_format::fixed, 14);
+    std::string text(digits, end.ptr);
     size_t const point = text.find('.');
     if (point != std::string::npos) {
         bool const up = text[point + 1 + static_cast<size_t>(decimals)] >= '5';

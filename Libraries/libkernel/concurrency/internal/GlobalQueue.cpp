@@ -81,7 +81,7 @@ private:
 class Pool
 {
 public:
-    Pool() : m_processors(Platform::CountUsableCpus()) {}
+    explicit Pool(Pool* before) : m_processors(Platform::CountUsableCpus()), m_before(before) {}
 
     int GetProcessors() const { return m_processors; }
     void Add(Queue queue, Pending const& job, int copies);
@@ -113,6 +113,7 @@ private:
     void Unlock() { m_lock.Release(); }
 
     int const m_processors;
+    [[maybe_unused]] Pool* const m_before;   // The parent process's, kept reachable in a child.
     Platform::RecursiveLock m_lock{4000, 0}; // Guards everything but the atomics.
     Ring m_rings[c_queueCount];
     u64 m_pending = 0;
@@ -274,7 +275,10 @@ void Pool::RunManager() noexcept
     Lock();
     for (;;) {
         u32 const bell = m_managerBell.load(std::memory_order_relaxed);
-        if (m_pending == 0) m_managed = false;
+        if (m_pending == 0) {
+            m_managed = false;
+            m_surplus = 0;
+        }
         bool const managed = m_managed;
         Unlock();
         bool const inTime = Platform::WaitOnWord(m_managerBell, bell, managed ? pause : c_idleNs);

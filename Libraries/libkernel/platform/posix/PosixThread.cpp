@@ -17,6 +17,8 @@
 namespace Kernel::Platform {
 namespace {
 
+thread_local u64 t_id = 0;
+
 struct Start
 {
     void (*run)(void*);
@@ -53,8 +55,13 @@ size_t ReadSmallFile(char const* path, char* text, size_t size)
 
 u64 GetCurrentThreadId()
 {
-    static thread_local u64 const id = static_cast<u64>(::gettid());
-    return id;
+    if (t_id == 0) {
+        // A child process has its parent's memory, but its one thread has an id of its own.
+        static int const watched = ::pthread_atfork(nullptr, nullptr, [] { t_id = 0; });
+        (void)watched;
+        t_id = static_cast<u64>(::gettid());
+    }
+    return t_id;
 }
 
 void YieldThread()
