@@ -319,7 +319,7 @@ Pool* s_pool = nullptr;
 // A child process has none of the threads, so it begins anew. What the parent had pending stays the parent's.
 void BeginAnew()
 {
-    s_pool = new Pool;
+    s_pool = new Pool(s_pool);
 }
 
 Pool& GetPool()
