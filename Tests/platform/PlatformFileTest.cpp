@@ -1,0 +1,383 @@
+#include "libkernel/platform/PlatformFile.h"
+
+#include "libkernel/platform/Errors.h"
+#include "libkernel/platform/StdioFile.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+
+#include <algorithm>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace Kernel;
+using namespace Kernel::Platform;
+using TestSupport::ReadWholeFile;
+using TestSupport::TempFolder;
+using TestSupport::WriteWholeFile;
+
+FileCalls const& Calls()
+{
+    return GetFileCalls();
+}
+
+class OpenHandle
+{
+public:
+    OpenHandle(std::string const& path, OpenFlags const& flags) : error(Calls().open(path.c_str(), flags, handle)) {}
+    ~OpenHandle()
+    {
+        if (handle != c_noHandle) Calls().close(handle);
+    }
+
+    FileHandle handle = c_noHandle;
+    int error;
+};
+
+// Root may read everything, so a test about permissions runs as somebody else, who owns the given paths.
+class AsOrdinaryUser
+{
+public:
+    explicit AsOrdinaryUser(std::vector<std::string> const& paths) : m_isRoot(::geteuid() == 0)
+    {
+        for (auto const& path : paths) EXPECT_TRUE(!m_isRoot || ::chown(path.c_str(), c_nobody, c_nobody) == 0);
+        EXPECT_TRUE(!m_isRoot || ::seteuid(c_nobody) == 0);
+    }
+    ~AsOrdinaryUser() { EXPECT_TRUE(!m_isRoot || ::seteuid(0) == 0); }
+
+private:
+    static constexpr uid_t c_nobody = 65534;
+    bool const m_isRoot;
+};
+
+constexpr OpenFlags c_read = {.read = true};
+constexpr OpenFlags c_readWrite = {.read = true, .write = true};
+constexpr OpenFlags c_create = {.read = true, .write = true, .create = true};
+
+TEST(PlatformFile, OpeningNamesWhyItFailed)
+{
+    TempFolder const folder;
+    WriteWholeFile(folder / "file", "text");
+    ASSERT_EQ(0, ::mkfifo((folder / "pipe").c_str(), 0600));
+    ASSERT_EQ(0, ::symlink("file", (folder / "link").c_str()));
+    ASSERT_EQ(0, ::symlink("nowhere", (folder / "dangling").c_str()));
+    ASSERT_EQ(0, ::mkdir((folder / "sub").c_str(), 0700));
+
+    struct Case
+    {
+        char const* what;
+        char const* name;
+        OpenFlags flags;
+        int error;
+    };
+    OpenFlags exclusive = c_create;
+    exclusive.exclusive = true;
+    Case const cases[] = {
+        {"missing", "none", c_read, ENOENT},
+        {"missing folder", "none/file", c_create, ENOENT},
+        {"a file as a folder", "file/x", c_read, ENOTDIR},
+        {"exclusive on a file", "file", exclusive, EEXIST},
+        {"exclusive on a dangling link", "dangling", exclusive, EEXIST},
+        {"folder for reading", "sub", c_read, EISDIR},
+        {"folder for writing", "sub", c_readWrite, EISDIR},
+        {"folder, any kind", "sub", {.read = true, .anyKind = true}, EISDIR},
+        {"pipe for reading", "pipe", c_read, ENXIO},
+        {"pipe for writing", "pipe", {.write = true}, ENXIO},
+        {"link not followed", "link", {.read = true, .noFollow = true}, ELOOP},
+        {"link followed", "link", c_read, 0},
+        {"neither reading nor writing", "file", {}, EINVAL},
+        {"created", "new", exclusive, 0},
+    };
+    for (Case const& c : cases) {
+        SCOPED_TRACE(c.what);
+        OpenHandle const file(folder / c.name, c.flags);
+        EXPECT_EQ(c.error, file.error);
+        EXPECT_EQ(c.error != 0, file.handle == c_noHandle);
+    }
+    FileHandle handle;
+    EXPECT_EQ(EINVAL, Calls().open(nullptr, c_read, handle));
+    EXPECT_EQ("", ReadWholeFile(folder / "nowhere")) << "an exclusive create went through a link";
+}
+
+TEST(PlatformFile, ShareModesRefuseWhomTheyName)
+{
+    TempFolder const folder;
+    std::string const path = folder / "file";
+    WriteWholeFile(path, "text");
+    struct Opener
+    {
+        char const* what;
+        OpenFlags flags;
+    };
+    Opener const openers[] = {
+        {"reads", c_read},
+        {"reads, denies", {.read = true, .share = FileShare::DenyWrite}},
+        {"writes only", {.write = true}},
+        {"reads and writes", c_readWrite},
+        {"writes, denies", {.read = true, .write = true, .share = FileShare::DenyWrite}},
+    };
+    // Row: who holds the file. Column: who comes.
+    bool const granted[5][5] = {
+        {true, true, true, true, true},   {true, true, false, false, false},  {true, false, true, true, false},
+        {true, false, true, true, false}, {true, false, false, false, false},
+    };
+    for (int i = 0; i < 5; ++i) {
+        for (int k = 0; k < 5; ++k) {
+            SCOPED_TRACE(std::string(openers[i].what) + " / " + openers[k].what);
+            OpenHandle const first(path, openers[i].flags);
+            ASSERT_EQ(0, first.error);
+            OpenHandle const second(path, openers[k].flags);
+            EXPECT_EQ(granted[i][k] ? 0 : EACCES, second.error);
+        }
+    }
+    OpenHandle const after(path, openers[4].flags);
+    EXPECT_EQ(0, after.error) << "a closed handle still denies";
+}
+
+TEST(PlatformFile, DenyWriteHoldsBetweenProcesses)
+{
+    TempFolder const folder;
+    std::string const path = folder / "file";
+    OpenFlags flags = c_create;
+    flags.share = FileShare::DenyWrite;
+    OpenHandle const mine(path, flags);
+    ASSERT_EQ(0, mine.error);
+    pid_t const child = ::fork();
+    if (child == 0) {
+        // The inherited descriptor shares our lock, but an opening of its own is another opener.
+        OpenHandle const writer(path, c_readWrite);
+        OpenHandle const reader(path, c_read);
+        ::_exit(writer.error == EACCES && reader.error == 0 ? 0 : 1);
+    }
+    int status = 1;
+    ASSERT_EQ(child, ::waitpid(child, &status, 0));
+    EXPECT_EQ(0, status);
+}
+
+TEST(PlatformFile, RefusedTruncationLeavesTheFileWhole)
+{
+    TempFolder const folder;
+    std::string const path = folder / "file";
+    WriteWholeFile(path, "text");
+    {
+        OpenHandle const holder(path, {.read = true, .write = true, .share = FileShare::DenyWrite});
+        OpenHandle const other(path, {.write = true, .create = true, .truncate = true});
+        EXPECT_EQ(EACCES, other.error);
+        EXPECT_EQ("text", ReadWholeFile(path));
+    }
+    OpenHandle const other(path, {.write = true, .create = true, .truncate = true});
+    EXPECT_EQ(0, other.error);
+    EXPECT_EQ("", ReadWholeFile(path));
+}
+
+TEST(PlatformFile, WriteOnlyFileCanBeWritten)
+{
+    TempFolder const folder;
+    WriteWholeFile(folder / "file", "text");
+    ASSERT_EQ(0, Calls().setMode((folder / "file").c_str(), 0200));
+    AsOrdinaryUser const user({folder.GetPath(), folder / "file"});
+    OpenHandle const file(folder / "file", {.write = true});
+    EXPECT_EQ(0, file.error);
+    OpenHandle const denier(folder / "file", {.write = true, .share = FileShare::DenyWrite});
+    EXPECT_EQ(0, denier.error);
+    OpenHandle const late(folder / "file", {.write = true});
+    EXPECT_EQ(EACCES, late.error);
+}
+
+TEST(PlatformFile, CountsStopAtTheEndAndOffsetsAreChecked)
+{
+    TempFolder const folder;
+    OpenHandle const file(folder / "file", c_create);
+    char data[16] = "0123456789";
+    EXPECT_EQ(10u, Calls().write(file.handle, data, 10).count);
+
+    IoResult result = Calls().readAt(file.handle, data, 16, 4);
+    EXPECT_EQ(6u, result.count);
+    EXPECT_EQ(0, result.error);
+    result = Calls().readAt(file.handle, data, 16, 10);
+    EXPECT_EQ(0u, result.count + static_cast<u64>(result.error));
+    result = Calls().readAt(file.handle, data, 16, INT64_MAX - 2);
+    EXPECT_EQ(0u, result.count);
+    EXPECT_EQ(EINVAL, Calls().readAt(file.handle, data, 1, ~u64{0}).error);
+    EXPECT_EQ(EFBIG, Calls().writeAt(file.handle, data, 16, INT64_MAX - 2).error);
+    EXPECT_EQ(EFBIG, Calls().setSize(file.handle, ~u64{0}));
+
+    u64 at = 7;
+    EXPECT_EQ(EINVAL, Calls().seek(file.handle, -1, SeekFrom::Start, at));
+    EXPECT_EQ(7u, at);
+    EXPECT_EQ(0, Calls().seek(file.handle, 0, SeekFrom::Current, at));
+    EXPECT_EQ(10u, at) << "reading at an offset moved the position";
+    EXPECT_EQ(0, Calls().seek(file.handle, -3, SeekFrom::End, at));
+    EXPECT_EQ(7u, at);
+    EXPECT_EQ(EBADF, Calls().read(c_noHandle, data, 1).error);
+    EXPECT_EQ(EBADF, Calls().flush(c_noHandle, FlushKind::Data));
+}
+
+TEST(PlatformFile, AppendingHandlesDoNotOverwriteEachOther)
+{
+    TempFolder const folder;
+    OpenFlags flags = c_create;
+    flags.append = true;
+    OpenHandle const a(folder / "file", flags);
+    OpenHandle const b(folder / "file", flags);
+    for (FileHandle const handle : {a.handle, b.handle, a.handle}) Calls().write(handle, "ab", 2);
+    EXPECT_EQ("ababab", ReadWholeFile(folder / "file"));
+}
+
+TEST(PlatformFile, RenameReplacesAndFoldersList)
+{
+    TempFolder const folder;
+    WriteWholeFile(folder / "a", "new");
+    WriteWholeFile(folder / "b", "old");
+    ASSERT_EQ(0, Calls().makeFolder((folder / "sub").c_str()));
+    ASSERT_EQ(0, ::symlink("sub", (folder / "link").c_str()));
+    EXPECT_EQ(0, Calls().rename((folder / "a").c_str(), (folder / "b").c_str()));
+    EXPECT_EQ(0, Calls().flushFolder(folder.GetPath().c_str()));
+    EXPECT_EQ("new", ReadWholeFile(folder / "b"));
+
+    std::vector<FolderEntry> entries;
+    ASSERT_EQ(0, Calls().listFolder(folder.GetPath().c_str(), entries));
+    std::sort(entries.begin(), entries.end(), [](auto const& x, auto const& y) { return x.name < y.name; });
+    ASSERT_EQ(3u, entries.size());
+    EXPECT_EQ("b", entries[0].name);
+    EXPECT_EQ(FileKind::File, entries[0].kind);
+    EXPECT_EQ(FileKind::Link, entries[1].kind);
+    EXPECT_EQ(FileKind::Folder, entries[2].kind);
+    EXPECT_EQ(ENOENT, Calls().listFolder((folder / "none").c_str(), entries));
+    EXPECT_EQ(ENOENT, Calls().flushFolder((folder / "none").c_str()));
+    EXPECT_EQ(ENOENT, Calls().unlink((folder / "a").c_str()));
+    EXPECT_NE(0, Calls().unlink((folder / "sub").c_str())) << "unlink must leave folders alone";
+
+    std::string target;
+    EXPECT_EQ(0, Calls().readLink((folder / "link").c_str(), target));
+    EXPECT_EQ("sub", target);
+    EXPECT_EQ(EINVAL, Calls().readLink((folder / "b").c_str(), target));
+}
+
+TEST(PlatformFile, TimesAndKindsComeBackAsSet)
+{
+    TempFolder const folder;
+    std::string const path = folder / "file";
+    WriteWholeFile(path, "text");
+    FileInfo before;
+    ASSERT_EQ(0, Calls().stat(path.c_str(), true, before));
+    ASSERT_EQ(0, Calls().setTimes(path.c_str(), -1'500'000'000, c_keepTime));
+    FileInfo info;
+    ASSERT_EQ(0, Calls().stat(path.c_str(), true, info));
+    EXPECT_EQ(-1'500'000'000, info.accessTime) << "1.5 s before 1970";
+    EXPECT_EQ(before.modifyTime, info.modifyTime);
+    EXPECT_EQ(4u, info.size);
+    EXPECT_EQ(FileKind::File, info.kind);
+    EXPECT_EQ(before.inode, info.inode);
+    EXPECT_EQ(ENOENT, Calls().stat((folder / "none").c_str(), true, info));
+    EXPECT_EQ(FileKind::None, info.kind);
+}
+
+TEST(PlatformFile, AttributesComeBackAsSet)
+{
+    TempFolder const folder;
+    std::string const path = folder / "file";
+    WriteWholeFile(path, "text");
+    std::string const value("a\0b", 3);
+    int const error = Calls().setAttribute(path.c_str(), "kernel.test", value.data(), value.size());
+    if (error == EOPNOTSUPP) GTEST_SKIP() << "the temporary folder's file system has no extended attributes";
+    ASSERT_EQ(0, error);
+    std::string got;
+    EXPECT_EQ(0, Calls().getAttribute(path.c_str(), "kernel.test", got));
+    EXPECT_EQ(value, got);
+    EXPECT_EQ(0, Calls().removeAttribute(path.c_str(), "kernel.test"));
+    EXPECT_EQ(ENODATA, Calls().getAttribute(path.c_str(), "kernel.test", got));
+    EXPECT_EQ("", got);
+}
+
+TEST(PlatformFile, FolderOfAPathIsWhatItsNameLiesIn)
+{
+    struct Case
+    {
+        char const* path;
+        char const* folder;
+    };
+    for (Case const& c : {Case{"/a/b", "/a"},
+                          {"/a", "/"},
+                          {"a", "."},
+                          {"a/b/", "a"},
+                          {"a//b", "a"},
+                          {"/", "/"},
+                          {"", "."},
+                          {"//a", "/"}})
+    {
+        EXPECT_EQ(c.folder, GetFolderOf(c.path)) << c.path;
+    }
+    EXPECT_EQ(".", GetFolderOf(nullptr));
+}
+
+class StdioTest : public testing::Test
+{
+protected:
+    std::FILE* Open(OpenFlags const& flags, char const* mode)
+    {
+        FileHandle handle = c_noHandle;
+        int error = Calls().open((m_folder / "file").c_str(), flags, handle);
+        return error ? nullptr : MakeStdioFile(handle, mode, error);
+    }
+
+    TempFolder m_folder;
+};
+
+TEST_F(StdioTest, StreamReadsWritesAndSeeksItsHandle)
+{
+    TestSupport::FaultyFiles files;
+    std::FILE* const file = Open(c_create, "w+");
+    ASSERT_TRUE(file);
+    EXPECT_EQ(10u, std::fwrite("0123456789", 1, 10, file));
+    EXPECT_EQ(0, std::fseek(file, -4, SEEK_END));
+    EXPECT_EQ("0123456789", ReadWholeFile(m_folder / "file"));
+    char text[8] = {};
+    EXPECT_EQ(4u, std::fread(text, 1, 8, file));
+    EXPECT_STREQ("6789", text);
+    EXPECT_TRUE(std::feof(file));
+    u64 size = 0;
+    EXPECT_EQ(0, Calls().getSize(GetStdioHandle(file), size));
+    EXPECT_EQ(10u, size);
+    EXPECT_EQ(0, std::fclose(file));
+    EXPECT_EQ(0, files.GetOpenHandles());
+    EXPECT_EQ(2, GetStdioHandle(stderr)) << "a stream made elsewhere has its own descriptor";
+    EXPECT_EQ(c_noHandle, GetStdioHandle(nullptr));
+}
+
+TEST_F(StdioTest, FaultShowsThroughTheStream)
+{
+    TestSupport::FaultyFiles files;
+    std::FILE* const file = Open(c_create, "w");
+    ASSERT_TRUE(file);
+    std::setvbuf(file, nullptr, _IONBF, 0);
+    files.Plan({.call = TestSupport::FileCall::Write, .error = ENOSPC, .part = TestSupport::Fault::Part::Half});
+    errno = 0;
+    EXPECT_EQ(5u, std::fwrite("0123456789", 1, 10, file));
+    EXPECT_EQ(ENOSPC, errno);
+    EXPECT_TRUE(std::ferror(file));
+    files.Plan({.call = TestSupport::FileCall::Close, .error = EIO});
+    EXPECT_EQ(EOF, std::fclose(file));
+    EXPECT_EQ(0, files.GetOpenHandles()) << "a failed close must not leak the handle";
+    EXPECT_EQ("01234", ReadWholeFile(m_folder / "file"));
+}
+
+TEST_F(StdioTest, AppendingStreamWritesBehindOthers)
+{
+    OpenFlags flags = c_create;
+    flags.append = true;
+    std::FILE* const file = Open(flags, "a+");
+    ASSERT_TRUE(file);
+    std::fputs("ab", file);
+    std::fflush(file);
+    WriteWholeFile(m_folder / "file", "longer text");
+    std::rewind(file);
+    std::fputs("cd", file);
+    std::fclose(file);
+    EXPECT_EQ("longer textcd", ReadWholeFile(m_folder / "file"));
+}
+
+} // namespace
