@@ -1,0 +1,156 @@
+#include "libkernel/concurrency/CriticalSection.h"
+
+#include "libkernel/concurrency/MultiSemaphore.h"
+#include "libkernel/concurrency/Semaphore.h"
+#include "libkernel/concurrency/System.h"
+#include "libkernel/concurrency/ThreadId.h"
+
+#include <atomic>
+#include <chrono>
+#include <gtest/gtest.h>
+#include <thread>
+#include <vector>
+
+namespace {
+
+using namespace Kernel;
+
+template <class T>
+class LockTest : public testing::Test
+{
+};
+using LockTypes = testing::Types<CriticalSection, CriticalSectionSpin>;
+TYPED_TEST_SUITE(LockTest, LockTypes);
+
+TYPED_TEST(LockTest, OneThreadTakesItTwiceAndOthersWaitForBothReleases)
+{
+    TypeParam lock;
+    int value = 0;
+    lock.AcquireLock();
+    lock.AcquireLock();
+    std::thread other([&] {
+        LockScope<TypeParam> const scope(lock);
+        value *= 10;
+    });
+    value = 1;
+    lock.ReleaseLock();
+    value = 2;
+    EXPECT_TRUE(lock.IsHeldByCurrentThread());
+    lock.ReleaseLock();
+    other.join();
+    EXPECT_EQ(20, value);
+    EXPECT_FALSE(lock.IsHeldByCurrentThread());
+}
+
+TEST(CriticalSection, TryFailsWhileAnotherThreadHoldsIt)
+{
+    CriticalSection lock;
+    EXPECT_TRUE(lock.TryAcquireLock());
+    std::thread([&] { EXPECT_FALSE(lock.TryAcquireLock()); }).join();
+    lock.ReleaseLock();
+    std::thread([&] {
+        EXPECT_TRUE(lock.TryAcquireLock());
+        lock.ReleaseLock();
+    }).join();
+}
+
+TEST(CriticalSection, HeldLockSurvivesAMoveOfItsObject)
+{
+    std::vector<CriticalSection> locks(1);
+    locks[0].AcquireLock();
+    locks.resize(100);
+    EXPECT_TRUE(locks[0].IsHeldByCurrentThread());
+    locks[0].ReleaseLock();
+}
+
+TEST(CriticalSection, ScopeMayEndEarly)
+{
+    Counted<CountableCriticalSection> const lock = MakeCounted<CountableCriticalSection>();
+    CriticalSectionScope scope(*lock);
+    EXPECT_TRUE(lock->IsHeldByCurrentThread());
+    scope.Release();
+    EXPECT_FALSE(lock->IsHeldByCurrentThread());
+}
+
+TEST(Semaphore, EachSignalLetsOneWaiterThrough)
+{
+    auto const semaphore = MakeCounted<Semaphore>();
+    std::atomic<int> through{0};
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 4; ++i) {
+        threads.emplace_back([&] {
+            for (int k = 0; k < 500; ++k) {
+                semaphore->Wait(0); // For ever, so every signal is needed.
+                ++through;
+            }
+        });
+    }
+    for (int i = 0; i < 4 * 500; ++i) semaphore->Signal();
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(4 * 500, through);
+}
+
+TEST(Semaphore, InitialCountIsTakenFirstAndATimeOutComesBack)
+{
+    auto const semaphore = MakeCounted<Semaphore>(2);
+    semaphore->Wait(0);
+    semaphore->Wait(0);
+    auto const start = std::chrono::steady_clock::now();
+    semaphore->Wait(5);
+    EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(5));
+    semaphore->Signal(); // The wait that timed out took nothing along.
+    semaphore->Wait(0);
+}
+
+TEST(Semaphore, CountStopsAtItsMaximum)
+{
+    auto const semaphore = MakeCounted<Semaphore>(0x7FFFFFFF);
+    semaphore->Signal();
+    semaphore->Wait(1);
+    semaphore->AcquireLock();
+    semaphore->ReleaseLock();
+}
+
+TEST(MultiSemaphore, OpensOnceForAllAndStaysOpen)
+{
+    auto const gate = MakeCounted<MultiSemaphore>();
+    std::atomic<int> through{0};
+    std::atomic<int> arrived{0};
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 8; ++i) {
+        threads.emplace_back([&] {
+            ++arrived;
+            gate->Wait(0);
+            ++through;
+        });
+    }
+    while (arrived < 4) std::this_thread::yield(); // Some wait, some come late.
+    gate->Wait(1);                                 // Times out, and stays counted.
+    EXPECT_EQ(0, through);
+    gate->Signal();
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(8, through);
+    gate->Wait(0);
+    gate->Signal();
+    gate->Wait(0);
+}
+
+TEST(ThreadId, NamesThreadsApart)
+{
+    ThreadId const mine = ThreadId::GetCurrent();
+    EXPECT_EQ(mine, ThreadId::GetCurrent());
+    EXPECT_NE(mine, ThreadId(nullptr));
+    EXPECT_EQ(nullptr, ThreadId(nullptr).GetId());
+    std::thread([&] { EXPECT_NE(mine, ThreadId::GetCurrent()); }).join();
+}
+
+TEST(System, FactsArePlausible)
+{
+    EXPECT_GE(System::GetCpuCount(true), System::GetCpuCount(false));
+    EXPECT_GE(System::GetCpuCount(false), 1);
+    EXPECT_EQ(0u, System::GetRamCount() % 1024);
+    EXPECT_GT(System::GetRamCount(), 1u << 24);
+    EXPECT_FALSE(System::GetHostName().IsEmpty());
+}
+
+} // namespace
