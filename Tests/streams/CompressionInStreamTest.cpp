@@ -1,0 +1,236 @@
+#include "libkernel/streams/ZStandardInStream.h"
+#include "libkernel/streams/ZStandardOutStream.h"
+#include "libkernel/streams/ZipInStream.h"
+#include "support/CompressionFixture.h"
+
+#include <gtest/gtest.h>
+
+namespace Kernel {
+namespace {
+
+using DecompressException = CompressionInStream::DecompressException;
+using Type = CompressionPredictorType;
+using Striping = CompressionPredictorStripingType;
+using Testing::Bytes;
+using Testing::ByteSource;
+
+Counted<CompressionInStream> Make(bool zstd, Counted<InStream> source, u32 type, bool striped, bool throwOnError)
+{
+    Striping const striping = striped ? Striping::Striping64k : Striping::None;
+    if (zstd) return ZStandardInStream::Create(source, static_cast<Type>(type), striping, throwOnError);
+    return ZipInStream::Create(source, static_cast<Type>(type), striping, throwOnError);
+}
+
+// What a peer has packed of what the definition makes of the data.
+Bytes Pack(bool zstd, Bytes const& plain, u32 type, bool striped)
+{
+    return Testing::PeerCompress(zstd, Testing::TransformSlowly(plain, type, striped));
+}
+
+Bytes ReadAll(CompressionInStream& stream, u64 room)
+{
+    Bytes got(room);
+    got.resize(stream.ReadBlock(got.data(), room));
+    return got;
+}
+
+class CompressionInStreamTest : public testing::TestWithParam<bool>
+{
+};
+
+INSTANTIATE_TEST_SUITE_P(BackEnds, CompressionInStreamTest, testing::Bool(),
+                         [](auto const& info) { return info.param ? "Zstandard" : "Zlib"; });
+
+TEST_P(CompressionInStreamTest, AnyReadAndSkipSizesGiveTheData)
+{
+    std::mt19937 random(7);
+    for (u64 size : {u64(1), u64(65535), u64(65537), u64(262144), u64(262145), u64(9 * 65536 + 4098)}) {
+        Bytes const plain = Testing::MakePixels(size, static_cast<u32>(size));
+        for (u32 type = 0; type <= 3; ++type)
+            for (bool striped : {false, true}) {
+                SCOPED_TRACE(testing::Message() << size << " type " << type << " striped " << striped);
+                Bytes const packed = Pack(GetParam(), plain, type, striped);
+                Counted<CompressionInStream> const stream =
+                    Make(GetParam(), MakeCounted<ByteSource>(packed, 1 + random() % 40000), type, striped, true);
+                // Without striping the sizes must be whole elements, but for the last.
+                u64 const unit = striped || type == 0 ? 1 : u64(1) << (type - 1);
+                for (u64 at = 0, part; at < size; at += part) {
+                    part = std::min<u64>(size - at, unit * (1 + (random() % 3 ? random() % 9000 : random() % 200000)));
+                    if (random() % 4 == 0) {
+                        ASSERT_TRUE(stream->SkipBlock(part));
+                        continue;
+                    }
+                    Bytes got(part);
+                    ASSERT_EQ(stream->ReadBlock(got.data(), part), part);
+                    ASSERT_TRUE(std::equal(got.begin(), got.end(), plain.begin() + static_cast<i64>(at))) << at;
+                }
+                EXPECT_TRUE(stream->EOS());
+                EXPECT_EQ(stream->GetSize() + stream->Tell(), 0u);
+                EXPECT_TRUE(stream->SkipBlock(0));
+                u8 more;
+                EXPECT_EQ(stream->ReadBlock(&more, 1), 0u);
+                EXPECT_FALSE(stream->SkipBlock(1));
+            }
+    }
+}
+
+TEST_P(CompressionInStreamTest, WithoutStripingABrokenElementComesBackUndecoded)
+{
+    Bytes const plain{1, 0, 3, 0, 6, 0}; // Differences 1, 2, 3.
+    Counted<CompressionInStream> const stream =
+        Make(GetParam(), MakeCounted<ByteSource>(Pack(GetParam(), plain, 2, false)), 2, false, false);
+    EXPECT_EQ(ReadAll(*stream, 3), (Bytes{1, 0, 2}));
+    EXPECT_EQ(ReadAll(*stream, 2), (Bytes{1, 3})); // 0x0300 and 1, as it stands in the bytes of two elements.
+}
+
+TEST_P(CompressionInStreamTest, CutDataIsAShortRead)
+{
+    Bytes const plain = Testing::MakePixels(200001, 8);
+    for (bool striped : {false, true}) {
+        Bytes const packed = Pack(GetParam(), plain, 2, striped);
+        for (u64 cut : {u64(0), u64(1), u64(5), packed.size() / 3, packed.size() / 2, packed.size() - 20}) {
+            SCOPED_TRACE(testing::Message() << striped << " cut at " << cut);
+            Bytes const left(packed.begin(), packed.begin() + static_cast<i64>(cut));
+            Bytes const got =
+                ReadAll(*Make(GetParam(), MakeCounted<ByteSource>(left), 2, striped, false), plain.size());
+            EXPECT_LT(got.size(), plain.size());
+            // What lies before the chunk of the cut is whole.
+            u64 const whole = striped ? got.size() & ~u64(0xFFFF) : got.size() & ~u64(1);
+            EXPECT_TRUE(std::equal(got.begin(), got.begin() + static_cast<i64>(whole), plain.begin()));
+            EXPECT_FALSE(Make(GetParam(), MakeCounted<ByteSource>(left), 2, striped, false)->SkipBlock(plain.size()));
+        }
+    }
+}
+
+TEST_P(CompressionInStreamTest, DamageIsAnExceptionOrAShortReadByTheFlag)
+{
+    Bytes const plain = Testing::MakePixels(300000, 9);
+    for (bool striped : {false, true}) {
+        Bytes damaged = Pack(GetParam(), plain, 3, striped);
+        // A header that neither format knows, and a source that breaks half way.
+        Bytes const noise(1000, 0xFF);
+        Bytes const half(damaged.begin(), damaged.begin() + static_cast<i64>(damaged.size() / 2));
+        struct Case
+        {
+            char const* what;
+            Bytes bytes;
+            bool broken;
+        };
+        for (Case const& c : {Case{"noise", noise, false}, Case{"broken source", half, true}}) {
+            SCOPED_TRACE(testing::Message() << c.what << striped);
+            auto const source = [&] { return MakeCounted<ByteSource>(c.bytes, 5000, c.broken); };
+            EXPECT_LT(ReadAll(*Make(GetParam(), source(), 3, striped, false), plain.size()).size(), plain.size());
+            EXPECT_FALSE(Make(GetParam(), source(), 3, striped, false)->SkipBlock(plain.size()));
+            EXPECT_THROW(Make(GetParam(), source(), 3, striped, true)->SkipBlock(plain.size()), DecompressException);
+            Counted<CompressionInStream> const thrower = Make(GetParam(), source(), 3, striped, true);
+            EXPECT_THROW(ReadAll(*thrower, plain.size()), DecompressException);
+            EXPECT_THROW(ReadAll(*thrower, 4), DecompressException);
+        }
+    }
+}
+
+TEST_P(CompressionInStreamTest, BytesBeforeTheBreakAreDecodedBeforeTheThrow)
+{
+    Bytes const plain = Testing::MakePixels(300000, 10);
+    Bytes const packed = Pack(GetParam(), plain, 2, false);
+    Bytes const half(packed.begin(), packed.begin() + static_cast<i64>(packed.size() / 2));
+    u64 const expected =
+        ReadAll(*Make(GetParam(), MakeCounted<ByteSource>(half, 5000, true), 2, false, false), plain.size()).size();
+    ASSERT_GT(expected, 1000u);
+    Bytes got(plain.size());
+    EXPECT_THROW(
+        Make(GetParam(), MakeCounted<ByteSource>(half, 5000, true), 2, false, true)->ReadBlock(got.data(), got.size()),
+        DecompressException);
+    EXPECT_TRUE(std::equal(got.begin(), got.begin() + static_cast<i64>(expected & ~u64(1)), plain.begin()));
+}
+
+TEST_P(CompressionInStreamTest, FlippedBytesNeverOverrun)
+{
+    Bytes const plain = Testing::MakePixels(70001, 11);
+    Bytes const packed = Pack(GetParam(), plain, 3, true);
+    std::mt19937 random(12);
+    for (int i = 0; i < 300; ++i) {
+        Bytes bad = packed;
+        bad[i < 40 ? static_cast<u64>(i) : random() % bad.size()] ^= static_cast<u8>(1 + random() % 255);
+        EXPECT_LE(ReadAll(*Make(GetParam(), MakeCounted<ByteSource>(bad, 999), 3, true, false), plain.size()).size(),
+                  plain.size());
+    }
+    EXPECT_FALSE(Make(GetParam(), nullptr, 0, false, true));
+}
+
+TEST(ZipInStreamTest, BytesBehindTheEndAreTheEndOfTheData)
+{
+    Bytes const plain = Testing::MakePixels(1000, 13);
+    for (bool striped : {false, true}) {
+        Bytes packed = Pack(false, plain, 1, striped);
+        packed.push_back(0x78);
+        EXPECT_EQ(ReadAll(*Make(false, MakeCounted<ByteSource>(packed), 1, striped, true), 5000), plain);
+    }
+}
+
+TEST(ZipInStreamTest, PresetDictionaryIsDamage)
+{
+    Bytes const asksForOne{0x78, 0xBB, 1, 2, 3, 4, 0x4B, 0x04, 0x00};
+    EXPECT_EQ(ReadAll(*Make(false, MakeCounted<ByteSource>(asksForOne), 0, false, false), 10).size(), 0u);
+    EXPECT_THROW(ReadAll(*Make(false, MakeCounted<ByteSource>(asksForOne), 0, false, true), 10), DecompressException);
+}
+
+TEST(ZStandardInStreamTest, WindowsAboveTwoToThe27AreDamage)
+{
+    // Magic, descriptor without single segment, window byte, one last raw block of a byte.
+    struct Case
+    {
+        u8 windowLog;
+        bool good;
+    };
+    for (Case const& c : {Case{10, true}, Case{27, true}, Case{28, false}, Case{31, false}, Case{41, false}}) {
+        SCOPED_TRACE(int(c.windowLog));
+        Bytes const frame{0x28, 0xB5, 0x2F, 0xFD, 0x00, static_cast<u8>((c.windowLog - 10) << 3), 0x09, 0, 0, 'x'};
+        EXPECT_EQ(ReadAll(*Make(true, MakeCounted<ByteSource>(frame), 0, false, false), 4).size(), c.good ? 1u : 0u);
+        if (c.good) continue;
+        EXPECT_THROW(ReadAll(*Make(true, MakeCounted<ByteSource>(frame), 0, false, true), 4), DecompressException);
+    }
+}
+
+TEST(ZStandardInStreamTest, FramesOneBehindTheOtherReadAsOne)
+{
+    Bytes packed = Testing::PeerCompress(true, {1, 2});
+    Bytes const second = Testing::PeerCompress(true, {3});
+    packed.insert(packed.end(), second.begin(), second.end());
+    EXPECT_EQ(ReadAll(*Make(true, MakeCounted<ByteSource>(packed, 3), 0, false, true), 9), (Bytes{1, 2, 3}));
+}
+
+TEST(ZStandardDecompressExactTest, GivesWhatTheStreamGives)
+{
+    Bytes const plain = Testing::MakePixels(3 * 65536 + 4097, 14);
+    for (u32 type = 0; type <= 3; ++type)
+        for (bool striped : {false, true}) {
+            SCOPED_TRACE(testing::Message() << type << striped);
+            Striping const striping = striped ? Striping::Striping64k : Striping::None;
+            Counted<Testing::ByteSink> sink = MakeCounted<Testing::ByteSink>();
+            auto const out = ZStandardOutStream::Create(sink, static_cast<Type>(type), striping);
+            out->WriteBlock(plain.data(), plain.size());
+            out->Finalise();
+            Bytes& packed = sink->bytes;
+            auto const unpack = [&](u64 size) {
+                Bytes got(size);
+                bool const good = ZStandardDecompressExact(packed.data(), packed.size(), got.data(), size,
+                                                           static_cast<Type>(type), striping);
+                return good ? got : Bytes();
+            };
+            EXPECT_EQ(unpack(plain.size()), plain);
+            EXPECT_TRUE(unpack(plain.size() + 1).empty());
+            packed.push_back(0xFF); // What lies behind the data does not matter.
+            EXPECT_EQ(unpack(plain.size()), plain);
+            EXPECT_EQ(unpack(65536), Bytes(plain.begin(), plain.begin() + 65536));
+            packed.resize(packed.size() - 10);
+            EXPECT_TRUE(unpack(plain.size()).empty());
+        }
+    u8 byte;
+    EXPECT_FALSE(ZStandardDecompressExact("noise and more", 14, &byte, 1));
+    EXPECT_FALSE(ZStandardDecompressExact(nullptr, 0, &byte, 1));
+    EXPECT_TRUE(ZStandardDecompressExact(nullptr, 0, nullptr, 0));
+}
+
+} // namespace
+} // namespace Kernel
