@@ -60,42 +60,48 @@ struct Job
     Job* next = nullptr; // While it is free.
 };
 
-// Jobs are made on one thread and freed on another, which a general allocator likes least. Freed ones go onto a shared
-// stack; a thread that needs one and has none takes the whole stack for itself. Nobody ever pops a single element from
-// the shared stack, so it can't be fooled by an element that went and came back.
+// Jobs are made on one thread and freed on another, which a general allocator likes least. Each thread keeps some free
+// ones of its own; those of a thread that frees more than it makes go onto a shared stack in batches, and a thread that
+// has none takes the whole stack. Nobody ever pops a single element from the shared stack, so it can't be fooled by an
+// element that went and came back.
 std::atomic<Job*> s_free{nullptr};
-std::atomic<int> s_freeCount{0};
+std::atomic<int> s_freeCount{0}; // On the stack, roughly: a batch may be on its way.
 constexpr int c_mostFree = 4096;
-
-void PutBack(Job* first, Job* last)
-{
-    last->next = s_free.load(std::memory_order_relaxed);
-    while (!s_free.compare_exchange_weak(last->next, first, std::memory_order_release, std::memory_order_relaxed)) {
-    }
-}
+constexpr int c_batch = 32;
 
 struct OwnFreeJobs
 {
     Job* first = nullptr;
+    Job* last = nullptr; // Of those freed here; what came from the stack isn't counted.
+    int count = 0;
 
-    ~OwnFreeJobs()
+    void Share()
     {
         if (!first) return;
-        Job* last = first;
         while (last->next) last = last->next;
-        PutBack(first, last);
-        first = nullptr;
+        last->next = s_free.load(std::memory_order_relaxed);
+        s_freeCount.fetch_add(count, std::memory_order_relaxed);
+        while (!s_free.compare_exchange_weak(last->next, first, std::memory_order_release, std::memory_order_relaxed)) {
+        }
+        first = last = nullptr;
+        count = 0;
     }
+    ~OwnFreeJobs() { Share(); }
 };
 thread_local OwnFreeJobs t_free;
 
 Job* NewJob()
 {
-    if (!t_free.first) t_free.first = s_free.exchange(nullptr, std::memory_order_acquire);
-    Job* const job = t_free.first;
+    OwnFreeJobs& own = t_free;
+    if (!own.first && s_free.load(std::memory_order_relaxed)) {
+        own.first = own.last = s_free.exchange(nullptr, std::memory_order_acquire);
+        own.count = 0;
+        s_freeCount.store(0, std::memory_order_relaxed);
+    }
+    Job* const job = own.first;
     if (!job) return new Job;
-    t_free.first = job->next;
-    s_freeCount.fetch_sub(1, std::memory_order_relaxed);
+    own.first = job->next;
+    if (own.last == job) own.last = own.first;
     return job;
 }
 
@@ -107,8 +113,11 @@ void FreeJob(Job* job)
         delete job;
         return;
     }
-    s_freeCount.fetch_add(1, std::memory_order_relaxed);
-    PutBack(job, job);
+    OwnFreeJobs& own = t_free;
+    job->next = own.first;
+    own.first = job;
+    if (!own.last) own.last = job;
+    if (++own.count >= c_batch) own.Share();
 }
 
 void RunJob(void* context)

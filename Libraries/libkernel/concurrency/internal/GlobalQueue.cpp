@@ -36,6 +36,24 @@ struct Pending
     void* context;
 };
 
+// Held so briefly that whoever finds it taken spins, and gives way only if the holder lost its processor. Letting go is
+// a plain store, which a lock that can sleep could not afford.
+class BriefLock
+{
+public:
+    void Acquire()
+    {
+        for (u32 tries = 0; m_taken.exchange(true, std::memory_order_acquire); ++tries) {
+            for (u32 i = 0; i < 64 && m_taken.load(std::memory_order_relaxed); ++i) Platform::PauseProcessor();
+            if (tries > 8) Platform::YieldThread();
+        }
+    }
+    void Release() { m_taken.store(false, std::memory_order_release); }
+
+private:
+    std::atomic<bool> m_taken{false};
+};
+
 // First in, first out; grows by doubling and gives a large block back when it runs empty.
 class Ring
 {
@@ -113,8 +131,8 @@ private:
     void Unlock() { m_lock.Release(); }
 
     int const m_processors;
-    [[maybe_unused]] Pool* const m_before;   // The parent process's, kept reachable in a child.
-    Platform::RecursiveLock m_lock{4000, 0}; // Guards everything but the atomics.
+    [[maybe_unused]] Pool* const m_before; // The parent process's, kept reachable in a child.
+    alignas(64) BriefLock m_lock;          // Guards everything but the atomics.
     Ring m_rings[c_queueCount];
     u64 m_pending = 0;
     std::vector<u64> m_threadIds; // Of all workers.
@@ -125,8 +143,8 @@ private:
     int m_surplus = 0;            // Workers to be sent home after their present job.
     bool m_managed = false;       // The manager has work to do.
     bool m_managerThere = false;
-    std::atomic<u64> m_hint{0}; // m_pending, for a look without the lock.
-    std::atomic<u32> m_bell{0}; // Rung for a sleeping worker.
+    alignas(64) std::atomic<u64> m_hint{0}; // m_pending, for a look without the lock.
+    std::atomic<u32> m_bell{0};             // Rung for a sleeping worker.
     std::atomic<u32> m_managerBell{0};
 };
 
@@ -357,10 +375,10 @@ public:
     }
 
 private:
-    // An index that takes this long is claimed alone, so that one slow index never holds up others behind it. Runs of
-    // shorter ones grow until a claim is worth its cost.
-    static constexpr i64 c_longRunNs = 20'000;
-    static constexpr i64 c_shortRunNs = 4'000;
+    // A run is to take about this long: an index that takes longer is claimed alone, so that a slow one never holds up
+    // others behind it, and runs of short ones grow until a claim is worth its cost.
+    static constexpr i64 c_runNs = 16'000;
+    static constexpr u64 c_fastestGrowth = 8;
 
     u64 Claim(u64 wanted, u64& begin);
 
@@ -401,12 +419,8 @@ void Loop::Work() noexcept
         i64 const end = counter();
         i64 const took = end - start;
         start = end;
-        if (took < c_shortRunNs)
-            wanted = std::min<u64>(run * 8, 1u << 20);
-        else if (took > c_longRunNs)
-            wanted = std::max<u64>(1, run / 4);
-        else
-            wanted = run;
+        u64 const growth = c_fastestGrowth * static_cast<u64>(took);
+        wanted = growth <= c_runNs ? run * c_fastestGrowth : std::max<u64>(1, run * c_runNs / static_cast<u64>(took));
     }
 }
 
