@@ -117,47 +117,58 @@ private:
         bool valid = false; // The store holds the bytes at that revision and path. Otherwise it only knows the path.
     };
     using OwnerMap = LinkMapT<Owner, 1>;
-    enum class LoadResult
-    {
-        Loaded,   // Flag set, item there.
-        Failed,   // Flag set, no item.
-        Postponed // Flag clear.
-    };
     class LoadScope;
 
     explicit DelayLoadHolder(FileStoreItemType const* type) : m_type(type) {}
     ~DelayLoadHolder() override;
 
-    /// As GetItemBase; @p wasLoaded tells whether another call has done the load.
-    bool GetItemI(JailCounted<FileStoreItem>& item, bool& wasLoaded);
-    LoadResult LoadItemCSLoad();
-    Counted<FileStoreItem> LoadFromBackData(FileStoreBackData const& backData) const;
-    Counted<FileStoreItem> LoadFromStores(std::vector<FileStoreLink*>& tried, bool& dying);
-    LoadResult FinishLoad(Counted<FileStoreItem> const& item, std::vector<FileStoreLink*> const& tried,
-                          FileStoreLink const* source, LoadResult otherwise);
+    /// As GetItemBase. @p wasLoaded tells that the load was done before; only if not, @p snapshot (may be null) gets
+    /// the states that the item came with.
+    bool GetItemI(JailCounted<FileStoreItem>& item, bool& wasLoaded, FileStoreStateObject::StateSnapshot* snapshot);
+    bool TakeLoadedItem(JailCounted<FileStoreItem>& item) const;
+    Counted<FileStoreItem> LoadItemCSLoad(FileStoreStateObject::StateSnapshot* snapshot);
+    struct LoadAttempt;
+    void LoadFromBackData(LoadAttempt& attempt) const;
+    void LoadFromStores(LoadAttempt& attempt) const;
+    bool TakeNextOwner(LoadAttempt const& attempt, Counted<FileStoreLink>& link, Owner& owner) const;
+    void FinishLoad(LoadAttempt const& attempt, FileStoreStateObject::StateSnapshot* snapshot);
     bool ReleaseItemI(FileStoreStateObject::StateSnapshot const* snapshot);
     bool ReleaseTempItem(FileStoreStateObject::StateSnapshot const& snapshot);
-    bool HasValidOwnerCSOwners(bool livingOnly, FileStoreLink const* excluding) const;
+    void DetachCSItem(FileStoreItem& item) const;
+    bool HasValidOwnerCSOwners() const;
     void DropBackData(FileStoreItem const& item);
     void SetBackDataCSItem(Counted<FileStoreBackData const> const& data);
 
-    // The stores' side. These take the owners lock and the item lock, never the load lock.
+    // The stores' side. These take the owners lock and the item lock, never the load lock: a store that commits must
+    // not wait for a load that may be waiting for the store.
     void SetOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> revision, String8 const& path, bool valid);
     void UpdateOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> revision);
+    Owner FindOrCreateOwner(FileStoreLink& link, String8 const& path);
+    bool IsOwnedAt(FileStoreLink const& link, std::set<NonCounted<FileStoreRevision const>> const& revisions) const;
+    /// The store goes away.
     void ClearOwner(FileStore& store);
+    /// The store has dropped these revisions. False if the holder's bytes lie elsewhere.
     bool BreakDeadLink(FileStore& store, std::set<NonCounted<FileStoreRevision const>> const& revisions);
+    /// The store is about to delete the file.
     void FileRemoveFromFileStore(FileStore& store);
-    void FindOrCreateOwner(FileStoreLink& link, String8 const& path, Owner& owner);
     void RemoveDirtyState(FileStoreLink& link);
+
+    enum class Entry
+    {
+        Invalidate, // The store goes on knowing the path.
+        Erase
+    };
+    void Backstore(FileStore& store, Entry entry);
+    void LeaveCSBoth(FileStoreLink& link, Entry entry);
+    bool IsLastMeansCSBoth(FileStoreLink const& leaving) const;
     void RemoveDirtyStateCSItem(FileStoreLink& link);
-    bool NeedsBackstoreCSBoth(FileStoreLink const& leaving) const;
 
     FileStoreItemType const* const m_type;
-    CriticalSection m_loadLock;          // Held over loads and backing. Outside every lock of a store.
-    std::atomic<void const*> m_loader{}; // The thread that holds m_loadLock, or null.
-    CriticalSectionSpin m_ownersLock;    // Inside the store lock.
-    CriticalSectionSpin m_itemLock;      // Inside the owners lock. Guards the members below m_owners.
-    OwnerMap m_owners;                   // Guarded by m_ownersLock.
+    CriticalSection m_loadLock;                  // Held over loads and backing. Outside every lock of a store.
+    mutable std::atomic<void const*> m_loader{}; // Mark of the thread that holds m_loadLock, or null.
+    CriticalSectionSpin m_ownersLock;            // Inside the store lock.
+    OwnerMap m_owners;                           // Guarded by m_ownersLock.
+    CriticalSectionSpin m_itemLock;              // Inside the owners lock. Guards all that follows.
     bool m_loaded = false;
     bool m_loading = false;                          // A load is running; its item is not here yet.
     std::vector<Counted<FileStoreLink>> m_forgotten; // Stores that took their state back while a load was running.

@@ -79,8 +79,7 @@ protected:
     /// Erases the states for this store of those items at @p paths that holders have in memory.
     void RemoveDirtyStates(std::set<String8> const& paths);
     /// Takes this store from every holder whose bytes lie at one of these revisions, which are about to be dropped. A
-    /// holder that has no other means takes back data. Exceptions of CreateBackData pass through; holders that were not
-    /// reached then stay as they were.
+    /// holder that has no other means takes back data. The first exception of CreateBackData is passed on in the end.
     void RemoveDelayLoadLinks(std::set<NonCounted<FileStoreRevision const>> const& revisions);
     /// Takes this store from every holder for which @p functor says so, with back data as above. The functor is called
     /// without any lock.
@@ -119,10 +118,9 @@ private:
     using PathMap = std::unordered_map<PathKey, DelayLoadHolder*, PathKeyHash>;
     using HolderMap = std::unordered_map<DelayLoadHolder*, PathKey>;
 
+    Counted<DelayLoadHolder> FindCS(PathKey const& key) const;
     void EnterCS(DelayLoadHolder& holder, PathKey const& key);
-    void RemoveCS(HolderMap::iterator at);
-    std::vector<std::pair<Counted<DelayLoadHolder>, String8>> GetHolders() const;
-    void RemoveFromMaps(DelayLoadHolder& holder);
+    void RemoveCS(DelayLoadHolder& holder);
 
     Counted<FileStoreLink> const m_link;
     CriticalSectionSpin m_storeLock; // Guards all that follows.
