@@ -1,0 +1,333 @@
+#include "libkernel/core/Limits.h"
+#include "libkernel/core/NestingGuard.h"
+#include "libkernel/core/NumberText.h"
+#include "libkernel/filestore/BackstoreException.h"
+#include "support/MemoryFileStore.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace KernelTest;
+using State = FileStoreStateObject::DirtyState;
+using Revision = MemoryFileStore::Revision;
+
+class DelayLoadHolderTest : public testing::Test
+{
+protected:
+    ~DelayLoadHolderTest() override
+    {
+        a.Reset();
+        b.Reset();
+    }
+    /// A holder of one item of text "X" that both stores hold.
+    Counted<DelayLoadHolder> HoldInBoth()
+    {
+        a->Put("x", "X");
+        Counted<DelayLoadHolder> const holder = a->Hold("x");
+        b->SetDelayLoadOwner(holder, b->Put("bx", "X"), "bx");
+        return holder;
+    }
+    static State StateFor(Counted<DelayLoadHolder> const& holder, MemoryFileStore const& store)
+    {
+        State state;
+        return holder->GetDirtyStateForFileStore(store, state) ? state : static_cast<State>(99);
+    }
+
+    static constexpr State c_unknown = static_cast<State>(99);
+    Counted<MemoryFileStore> a = MemoryFileStore::Create();
+    Counted<MemoryFileStore> b = MemoryFileStore::Create();
+};
+
+TEST_F(DelayLoadHolderTest, ItemIsLoadedOnceAndReleasedWhenClean)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    EXPECT_FALSE(holder->IsLoaded());
+    EXPECT_FALSE(holder->GetItemBaseIfLoaded());
+    EXPECT_TRUE(holder->ReleaseItem());
+    EXPECT_EQ("X", TextOf(holder));
+    EXPECT_EQ("X", TextOf(holder));
+    EXPECT_EQ(1, a->loads);
+    EXPECT_EQ(holder, holder->GetItemBaseIfLoaded()->GetDelayLoadHolder());
+
+    holder->GetItemBaseIfLoaded()->MarkAsDirty();
+    EXPECT_FALSE(holder->ReleaseItem());
+    EXPECT_EQ("X", TextOf(holder));
+    a->ClearObjectDirtyState(*holder->GetItemBaseIfLoaded(), FileStoreStateObject::DirtyStateClean);
+    Counted<FileStoreItem> const kept = holder->GetItemBaseIfLoaded().GetCounted();
+    EXPECT_TRUE(holder->ReleaseItem());
+    EXPECT_FALSE(kept->GetDelayLoadHolder());
+    EXPECT_FALSE(holder->IsLoaded());
+    EXPECT_NE(kept.Get(), (TextOf(holder), holder->GetItemBaseIfLoaded().Get()));
+}
+
+TEST_F(DelayLoadHolderTest, IncrementalRevisionLoadsAsIncremental)
+{
+    a->Put("x", "X", true);
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    TextOf(holder);
+    EXPECT_EQ(FileStoreStateObject::DirtyStateIncremental, StateFor(holder, *a));
+    EXPECT_FALSE(holder->ReleaseItem());
+}
+
+TEST_F(DelayLoadHolderTest, OtherStoresWithTheSameBytesAreClean)
+{
+    Counted<DelayLoadHolder> const holder = HoldInBoth();
+    TextOf(holder);
+    EXPECT_EQ(1, a->loads + b->loads);
+    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *a));
+    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *b));
+    EXPECT_TRUE(holder->ObjectIsLinkedToFileStore(*b));
+}
+
+TEST_F(DelayLoadHolderTest, NextStoreServesWhereOneFails)
+{
+    struct
+    {
+        char const* what;
+        std::function<void(MemoryFileStore&, char const* path)> damage;
+    } const cases[] = {
+        {"deleted", [](auto& store, char const* path) { store.UpdateDelayLoadOwners(store.Delete(path)); }},
+        {"refused", [](auto& store, char const* path) { store.UpdateDelayLoadOwners(store.Put(path, "refuse")); }},
+        {"exception", [](auto& store, char const*) { store.onLoad = [] { throw 1; }; }},
+    };
+    for (auto const& c : cases) {
+        // Which store is asked first is a matter of addresses, so each of them is the damaged one once.
+        for (bool const damageA : {true, false}) {
+            SCOPED_TRACE(c.what);
+            a = MemoryFileStore::Create();
+            b = MemoryFileStore::Create();
+            Counted<DelayLoadHolder> const holder = HoldInBoth();
+            MemoryFileStore& bad = damageA ? *a : *b;
+            c.damage(bad, damageA ? "x" : "bx");
+            EXPECT_EQ("X", TextOf(holder));
+            EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, damageA ? *b : *a));
+            // A store that has failed needs the item again; one that was not asked is taken at its word.
+            EXPECT_EQ(bad.loads ? c_unknown : FileStoreStateObject::DirtyStateClean, StateFor(holder, bad));
+        }
+    }
+    EXPECT_EQ(0, MemoryItem::s_living);
+}
+
+TEST_F(DelayLoadHolderTest, FailedLoadIsNotTriedAgainUntilRelease)
+{
+    a->Put("x", "refuse");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    JailCounted<FileStoreItem> item;
+    EXPECT_FALSE(holder->GetItemBase(item));
+    EXPECT_TRUE(holder->IsLoaded());
+    EXPECT_FALSE(holder->GetItemBaseIfLoaded());
+    EXPECT_TRUE(holder->GetItemBase(item));
+    EXPECT_FALSE(item);
+    EXPECT_EQ(1, a->loads);
+    EXPECT_FALSE(holder->ObjectIsLinkedToFileStore(*a));
+    EXPECT_FALSE(holder->IsDead());
+
+    a->UpdateDelayLoadOwners(a->Put("x", "whole"));
+    EXPECT_TRUE(holder->ReleaseItem());
+    EXPECT_EQ("whole", TextOf(holder));
+}
+
+TEST_F(DelayLoadHolderTest, OnlyCopyIsKept)
+{
+    Counted<MemoryItem> const item(new MemoryItem("X"));
+    Counted<DelayLoadHolder> const holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item);
+    EXPECT_TRUE(holder->IsLoaded());
+    EXPECT_TRUE(holder->ExistsOnlyInMemory());
+    EXPECT_FALSE(holder->IsDead());
+    EXPECT_TRUE(item->IsFullyClean());
+    EXPECT_FALSE(holder->ReleaseItem());
+    EXPECT_TRUE(holder->EnsureItemIsBacked());
+    holder->SetBackData(MakeCounted<MemoryBackData>("X"));
+    EXPECT_FALSE(holder->ExistsOnlyInMemory());
+    EXPECT_TRUE(holder->ReleaseItem());
+    EXPECT_FALSE(item->GetDelayLoadHolder());
+}
+
+TEST_F(DelayLoadHolderTest, ItemHasOneHolderAndKeepsThePathOfTheOneItReplaces)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const old = a->Hold("x");
+    Counted<MemoryItem> const item(new MemoryItem("X2"));
+    Counted<DelayLoadHolder> holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item, old, *a);
+    EXPECT_EQ(holder, DelayLoadHolder::Create(&MemoryItem::c_plain, item));
+    EXPECT_EQ(holder, item->GetDelayLoadHolder());
+    String8 path;
+    EXPECT_TRUE(holder->GetPath(*a, path));
+    EXPECT_EQ("x", path);
+    EXPECT_FALSE(holder->GetPath(*b, path));
+    EXPECT_FALSE(holder->IsBackedBy(*a));
+    EXPECT_FALSE(holder->HasLivingOwner());
+
+    // The save that follows puts the new holder in the old one's place.
+    a->SetDelayLoadOwner(holder, a->Put("x", "X2"), "x");
+    EXPECT_EQ(holder, a->Hold("x"));
+    holder.Reset();
+    EXPECT_FALSE(item->GetDelayLoadHolder());
+    EXPECT_EQ(nullptr, DelayLoadHolder::Create(nullptr, item));
+    EXPECT_EQ(nullptr, DelayLoadHolder::Create(&MemoryItem::c_plain, nullptr));
+    EXPECT_TRUE(DelayLoadHolder::Create(&MemoryItem::c_plain, item, nullptr, *a));
+}
+
+TEST_F(DelayLoadHolderTest, ItemWhoseStoreDiedUnseenIsReleasedForGood)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    TextOf(holder);
+    a->diesSuddenly = true;
+    a.Reset();
+    EXPECT_FALSE(holder->HasLivingOwner());
+    EXPECT_TRUE(holder->ReleaseItem());
+    EXPECT_EQ("(none)", TextOf(holder));
+}
+
+TEST_F(DelayLoadHolderTest, TemporaryItemGoesUnlessItWasThereOrWasTouched)
+{
+    a->Put("x", "X", true);
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    {
+        DelayLoadHolder::TempLoadItem const temp(holder);
+        ASSERT_TRUE(temp.GetItem());
+        EXPECT_FALSE(temp.WasLoadedBefore());
+        DelayLoadHolder::TempLoadItem const inner(holder);
+        EXPECT_TRUE(inner.WasLoadedBefore());
+        EXPECT_EQ(temp.GetItem().Get(), inner.GetItem().Get());
+    }
+    EXPECT_FALSE(holder->IsLoaded()) << "incremental, but as it came";
+    {
+        DelayLoadHolder::TempLoadItem const temp(holder);
+        temp.GetItem()->MarkAsDirty();
+    }
+    EXPECT_TRUE(holder->GetItemBaseIfLoaded());
+    {
+        DelayLoadHolder::TempLoadItem const temp(holder);
+        EXPECT_TRUE(temp.WasLoadedBefore());
+    }
+    EXPECT_TRUE(holder->GetItemBaseIfLoaded());
+    EXPECT_FALSE(DelayLoadHolder::TempLoadItem(nullptr).GetItem());
+
+    // Its file goes while it is looked at: the entry goes too, so the item is the last copy and stays.
+    a->Put("y", "Y");
+    Counted<DelayLoadHolder> const other = a->Hold("y");
+    {
+        DelayLoadHolder::TempLoadItem const temp(other);
+        a->RemoveDirtyStates({"y"});
+    }
+    EXPECT_TRUE(other->GetItemBaseIfLoaded());
+}
+
+TEST_F(DelayLoadHolderTest, FirstBackDataStaysUntilTheItemChanges)
+{
+    Counted<DelayLoadHolder> const holder = HoldInBoth();
+    Counted<FileStoreBackData const> const first = MakeCounted<MemoryBackData>("X");
+    holder->SetBackData(nullptr);
+    holder->SetBackData(first);
+    holder->SetBackData(MakeCounted<MemoryBackData>("other"));
+    EXPECT_EQ(first, holder->GetBackData());
+    EXPECT_EQ("X", TextOf(holder));
+    EXPECT_EQ(0, a->loads + b->loads);
+    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *a));
+    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *b));
+
+    holder->GetItemBaseIfLoaded()->MarkAsDirty();
+    EXPECT_FALSE(holder->GetBackData());
+    holder->SetBackData(first);
+    EXPECT_FALSE(holder->GetBackData()) << "its bytes are older than the item";
+
+    a->Put("nest/n", "N");
+    Counted<DelayLoadHolder> const nestable = a->Hold("nest/n");
+    nestable->SetBackData(first);
+    EXPECT_FALSE(nestable->GetBackData());
+}
+
+TEST_F(DelayLoadHolderTest, StoreServesWhereBackDataFails)
+{
+    Counted<DelayLoadHolder> const holder = HoldInBoth();
+    holder->SetBackData(MakeCounted<MemoryBackData>("refuse"));
+    EXPECT_EQ("X", TextOf(holder));
+}
+
+TEST_F(DelayLoadHolderTest, BackingTakesTheFirstStoreThatCan)
+{
+    Counted<DelayLoadHolder> const holder = HoldInBoth();
+    a->UpdateDelayLoadOwners(nullptr);
+    EXPECT_TRUE(holder->EnsureItemIsBacked());
+    EXPECT_EQ(1, b->copies);
+    EXPECT_TRUE(holder->EnsureItemIsBacked());
+    EXPECT_EQ(1, b->copies);
+
+    Counted<DelayLoadHolder> const missing = a->Hold("opt/m");
+    EXPECT_FALSE(missing->EnsureItemIsBacked());
+    a->Put("nest/n", "N");
+    Counted<DelayLoadHolder> const nestable = a->Hold("nest/n");
+    EXPECT_FALSE(nestable->EnsureItemIsBacked());
+    TextOf(nestable);
+    EXPECT_TRUE(nestable->EnsureItemIsBacked()) << "it is in memory";
+
+    a->Put("y", "Y");
+    Counted<DelayLoadHolder> const y = a->Hold("y");
+    a->onCreateBackData = [] { throw BackstoreException(true); };
+    EXPECT_THROW(y->EnsureItemIsBacked(), BackstoreException);
+    a->onCreateBackData = nullptr;
+    EXPECT_TRUE(y->EnsureItemIsBacked()) << "the exception has left no lock behind";
+}
+
+TEST_F(DelayLoadHolderTest, DumpNamesEachOwner)
+{
+    auto const address = [](MemoryFileStore const& s) { return ToStringPointer(s.GetFileStoreLink().Get(), false); };
+    String8 text("Paths: ");
+    Counted<MemoryItem> const item(new MemoryItem);
+    DelayLoadHolder::Create(&MemoryItem::c_plain, item)->DumpPaths(text);
+    EXPECT_EQ("Paths: ", text);
+
+    Counted<DelayLoadHolder> const holder = HoldInBoth();
+    String8 one = "x [" + address(*a) + "]";
+    String8 two = "bx [" + address(*b) + "]";
+    if (b->GetFileStoreLink() < a->GetFileStoreLink()) one.Swap(two);
+    holder->DumpPaths(text);
+    EXPECT_EQ("Paths: " + one + ", " + two, text);
+
+    String8 missing;
+    a->Hold("opt/m")->DumpPaths(missing);
+    EXPECT_EQ("opt/m [" + address(*a) + "] (not in filestore)", missing);
+}
+
+TEST_F(DelayLoadHolderTest, ItemThatNamesItselfLoadsWithoutItsInnerSelf)
+{
+    a->Put("x", "X\n!x");
+    a->Put("y", "Y\n!z");
+    a->Put("z", "Z\n!y");
+    Counted<DelayLoadHolder> x = a->Hold("x");
+    EXPECT_EQ("X", TextOf(x));
+    Counted<MemoryItem> item = CountedCast<MemoryItem>(x->GetItemBaseIfLoaded().GetCounted());
+    EXPECT_EQ((std::vector<bool>{false}), item->eager);
+    EXPECT_EQ(x, item->parts[0]);
+    EXPECT_EQ("X", TextOf(item->parts[0])) << "the refusal leaves no mark";
+    EXPECT_EQ(1, a->loads);
+    item->parts.clear();
+
+    Counted<DelayLoadHolder> const y = a->Hold("y");
+    EXPECT_EQ("Y", TextOf(y));
+    item = CountedCast<MemoryItem>(y->GetItemBaseIfLoaded().GetCounted());
+    EXPECT_EQ((std::vector<bool>{true}), item->eager);
+    EXPECT_EQ("Z", TextOf(item->parts[0]));
+    item->parts.clear();
+}
+
+TEST_F(DelayLoadHolderTest, LoadsNestToTheLimit)
+{
+    for (u32 i = 0; i <= c_maxNesting; ++i) a->Put(std::to_string(i).c_str(), ("T\n!" + std::to_string(i + 1)).c_str());
+    a->Put(std::to_string(c_maxNesting + 1).c_str(), "T");
+    std::vector<Counted<DelayLoadHolder>> holders;
+    for (u32 i = 0; i <= c_maxNesting; ++i) holders.push_back(a->Hold(std::to_string(i).c_str()));
+    EXPECT_EQ("T", TextOf(holders[0]));
+    EXPECT_TRUE(holders[c_maxNesting - 1]->IsLoaded());
+    EXPECT_FALSE(holders[c_maxNesting]->IsLoaded());
+    EXPECT_EQ(0u, NestingGuard::GetDepth());
+    EXPECT_EQ("T", TextOf(holders[c_maxNesting])) << "later, with room on the stack, it loads";
+    for (auto const& holder : holders)
+        CountedCast<MemoryItem>(holder->GetItemBaseIfLoaded().GetCounted())->parts.clear();
+}
+
+} // namespace

@@ -1,0 +1,315 @@
+#include "libkernel/core/Trace.h"
+#include "libkernel/filestore/BackstoreException.h"
+#include "libkernel/filestore/VoidFileStore.h"
+#include "libkernel/platform/Debug.h"
+#include "support/MemoryFileStore.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace KernelTest;
+using Revision = MemoryFileStore::Revision;
+
+class FileStoreTest : public testing::Test
+{
+protected:
+    Counted<MemoryFileStore> a = MemoryFileStore::Create();
+    Counted<MemoryFileStore> b = MemoryFileStore::Create();
+    CollectingContext context;
+
+    static String8 PathIn(MemoryFileStore const& store, Counted<DelayLoadHolder> const& holder)
+    {
+        String8 path;
+        return holder->GetPath(store, path) ? path : String8("(unknown)");
+    }
+    static Revision RevisionIn(MemoryFileStore const& store, Counted<DelayLoadHolder> const& holder)
+    {
+        Revision revision;
+        return holder->IsBackedBy(store, revision) ? revision : nullptr;
+    }
+};
+
+TEST_F(FileStoreTest, OnePathHasOneHolderWhileItLives)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> holder = a->Hold("x");
+    EXPECT_EQ(holder, a->Hold("x"));
+    EXPECT_EQ("X", TextOf(holder));
+    holder.Reset();
+    EXPECT_EQ(0, MemoryItem::s_living);
+    holder = a->Hold("x");
+    EXPECT_FALSE(holder->IsLoaded());
+    EXPECT_EQ(nullptr, a->CreateDelayLoadHolderDirect("x", nullptr, &context));
+    EXPECT_TRUE(context.problems.empty());
+}
+
+TEST_F(FileStoreTest, MissingPathIsReportedAndHeldOnlyIfRecoverable)
+{
+    a->Put("gone", "G");
+    a->Delete("gone");
+    EXPECT_EQ(nullptr, a->Hold("nowhere", &context));
+    EXPECT_EQ(nullptr, a->Hold("gone", &context));
+    Counted<DelayLoadHolder> const holder = a->Hold("opt/nowhere", &context);
+    EXPECT_EQ((std::vector<String8>{"Missing file: nowhere", "Missing file: gone", "Missing file: opt/nowhere"}),
+              context.problems);
+    EXPECT_EQ(nullptr, a->Hold("nowhere", nullptr));
+
+    ASSERT_TRUE(holder);
+    EXPECT_EQ(holder, a->Hold("opt/nowhere", &context));
+    EXPECT_EQ(3u, context.problems.size());
+    EXPECT_TRUE(holder->IsDead());
+    EXPECT_FALSE(holder->HasLivingOwner());
+    EXPECT_FALSE(holder->IsBackedBy(*a));
+    EXPECT_EQ("opt/nowhere", PathIn(*a, holder));
+    JailCounted<FileStoreItem> item;
+    EXPECT_FALSE(holder->GetItemBase(item));
+    EXPECT_EQ(0, a->loads);
+}
+
+TEST_F(FileStoreTest, HolderMadeDuringACommitStandsAtTheNewRevision)
+{
+    a->Put("x", "old");
+    Revision newest;
+    a->onFindHead = [&] {
+        a->onFindHead = nullptr;
+        newest = a->Put("x", "new");
+        a->UpdateDelayLoadOwners(newest);
+    };
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    EXPECT_EQ(newest, RevisionIn(*a, holder));
+    EXPECT_EQ("new", TextOf(holder));
+}
+
+TEST_F(FileStoreTest, OwnerMovesWithASaveToAnotherPath)
+{
+    Revision const r1 = a->Put("x", "X");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Revision const r2 = a->Put("y", "X");
+    a->SetDelayLoadOwner(holder, r2, "y");
+    EXPECT_EQ("y", PathIn(*a, holder));
+    EXPECT_EQ(r2, RevisionIn(*a, holder));
+    EXPECT_EQ(holder, a->Hold("y"));
+    Counted<DelayLoadHolder> const second = a->Hold("x");
+    EXPECT_NE(holder, second);
+    EXPECT_EQ(r1, RevisionIn(*a, second));
+
+    // The path passes to the second holder; the first one's end must not take it away.
+    a->SetDelayLoadOwner(second, r2, "y");
+    EXPECT_EQ(second, a->Hold("y"));
+    Counted<DelayLoadHolder> third = a->Hold("x");
+    a->SetDelayLoadOwner(third, r2, "y");
+    third.Reset();
+    a->UpdateDelayLoadOwners(r1);
+    EXPECT_EQ(r1, RevisionIn(*a, holder));
+    EXPECT_EQ(r1, RevisionIn(*a, second));
+    a->SetDelayLoadOwner(nullptr, r1, "z");
+}
+
+TEST_F(FileStoreTest, DeletedPathsLoseTheirStatesAlone)
+{
+    a->Put("x", "X");
+    a->Put("y", "Y");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    Counted<DelayLoadHolder> const y = a->Hold("y");
+    TextOf(x);
+    TextOf(y);
+    a->RemoveDirtyStates({});
+    EXPECT_TRUE(x->ObjectIsLinkedToFileStore(*a));
+    a->RemoveDirtyStates({"x", "unknown"});
+    EXPECT_FALSE(x->ObjectIsLinkedToFileStore(*a));
+    EXPECT_TRUE(y->ObjectIsLinkedToFileStore(*a));
+    EXPECT_TRUE(x->IsBackedBy(*a));
+}
+
+TEST_F(FileStoreTest, DroppedRevisionsLeaveBackDataWhereNothingElseWould)
+{
+    a->Put("x", "X");
+    a->Put("nest/n", "N");
+    a->Put("loaded", "L");
+    a->Put("shared", "S");
+    Revision const kept = a->Put("kept", "K");
+    Revision const inB = b->Put("s", "S");
+    char const* const paths[] = {"x", "nest/n", "loaded", "shared", "kept"};
+    std::vector<Counted<DelayLoadHolder>> h;
+    for (char const* path : paths) h.push_back(a->Hold(path));
+    TextOf(h[2]);
+    b->SetDelayLoadOwner(h[3], inB, "s");
+    std::set<Revision> dropped;
+    for (int i = 0; i < 4; ++i) dropped.insert(RevisionIn(*a, h[i]));
+
+    a->RemoveDelayLoadLinks({});
+    EXPECT_TRUE(h[0]->IsBackedBy(*a));
+    a->RemoveDelayLoadLinks(dropped);
+    for (int i = 0; i < 4; ++i) {
+        SCOPED_TRACE(paths[i]);
+        EXPECT_FALSE(h[i]->IsBackedBy(*a));
+        EXPECT_EQ(i == 0, static_cast<bool>(h[i]->GetBackData()));
+        EXPECT_NE(h[i], a->Hold(paths[i]));
+        EXPECT_EQ(paths[i], PathIn(*a, h[i]));
+    }
+    EXPECT_EQ(1, a->copies);
+    EXPECT_FALSE(h[2]->ObjectIsLinkedToFileStore(*a));
+    EXPECT_EQ(kept, RevisionIn(*a, h[4]));
+    EXPECT_EQ("X", TextOf(h[0]));
+    EXPECT_EQ("S", TextOf(h[3]));
+    EXPECT_TRUE(h[1]->IsDead());
+}
+
+TEST_F(FileStoreTest, DroppedRevisionIsForgottenThoughCopyingFails)
+{
+    Revision const r = a->Put("x", "X");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    a->onCreateBackData = [] { throw BackstoreException(true); };
+    EXPECT_THROW(a->RemoveDelayLoadLinks({r}), BackstoreException);
+    EXPECT_FALSE(x->IsBackedBy(*a));
+    EXPECT_NE(x, a->Hold("x"));
+}
+
+TEST_F(FileStoreTest, PreFileDeleteAsksForEachHolderAndTakesTheChosenOnes)
+{
+    struct Chooser : FileStore::ProcessPreFileDeleteFunctor
+    {
+        bool operator()(Revision revision, String8 const& path) override
+        {
+            seen[path] = revision;
+            return path == "x";
+        }
+        std::map<String8, Revision> seen;
+    } chooser;
+    Revision const rx = a->Put("x", "X");
+    Revision const ry = a->Put("y", "Y");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    Counted<DelayLoadHolder> const y = a->Hold("y");
+    Counted<DelayLoadHolder> const missing = a->Hold("opt/m");
+    a->ProcessPreFileDelete(chooser);
+    EXPECT_EQ((std::map<String8, Revision>{{"x", rx}, {"y", ry}, {"opt/m", nullptr}}), chooser.seen);
+    EXPECT_FALSE(x->IsBackedBy(*a));
+    EXPECT_TRUE(x->GetBackData());
+    EXPECT_NE(x, a->Hold("x"));
+    EXPECT_TRUE(y->IsBackedBy(*a));
+    EXPECT_EQ(y, a->Hold("y"));
+
+    a->onCreateBackData = [] { throw BackstoreException(false); };
+    Counted<DelayLoadHolder> const again = a->Hold("x");
+    EXPECT_THROW(a->ProcessPreFileDelete(chooser), BackstoreException);
+    EXPECT_TRUE(again->IsBackedBy(*a)) << "the file is still there, so its holder goes on";
+}
+
+TEST_F(FileStoreTest, EndOfAStoreLeavesBackDataUnlessAnotherStoreLives)
+{
+    a->Put("x", "X");
+    a->Put("y", "Y");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    Counted<DelayLoadHolder> const y = a->Hold("y");
+    b->SetDelayLoadOwner(y, b->Put("y", "Y"), "y");
+    Counted<FileStoreLink> const link = a->GetFileStoreLink();
+    a.Reset();
+    EXPECT_FALSE(link->IsAlive());
+    EXPECT_EQ(nullptr, link->GetFileStore());
+    EXPECT_TRUE(x->GetBackData());
+    EXPECT_FALSE(y->GetBackData());
+    EXPECT_EQ("X", TextOf(x));
+    EXPECT_EQ("Y", TextOf(y));
+    b.Reset();
+    EXPECT_TRUE(x->ReleaseItem());
+    EXPECT_EQ("X", TextOf(x));
+    EXPECT_FALSE(y->ReleaseItem()) << "no store and no back data: the only copy";
+}
+
+TEST_F(FileStoreTest, EndOfAStoreSurvivesAFailingCopy)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    a->onCreateBackData = [] { throw BackstoreException(true); };
+    a.Reset();
+    EXPECT_TRUE(x->IsDead());
+}
+
+TEST_F(FileStoreTest, HolderThatDiesWhileItsStoreIsDetachedLeavesNoTrace)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> holder = a->Hold("x");
+    a->BreakFileStoreAssociations();
+    EXPECT_FALSE(holder->HasLivingOwner());
+    EXPECT_EQ("(none)", TextOf(holder));
+    holder.Reset();
+    a->RelinkFileStoreAssociations();
+    a->UpdateDelayLoadOwners(a->Put("x", "X2"));
+    EXPECT_EQ("X2", TextOf(a->Hold("x")));
+}
+
+TEST_F(FileStoreTest, BrokenStoreIsNoLivingOwner)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    EXPECT_TRUE(holder->HasLivingOwner());
+    a->broken = true;
+    EXPECT_FALSE(holder->HasLivingOwner());
+}
+
+TEST_F(FileStoreTest, BackDataGoesToTheHolderOfThePath)
+{
+    a->Put("x", "X");
+    Counted<FileStoreBackData const> const data(new MemoryBackData("copy"));
+    a->AddBackData("x", data);
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    EXPECT_FALSE(holder->GetBackData());
+    a->AddBackData("x", nullptr);
+    a->AddBackData("x", data);
+    EXPECT_EQ(data, holder->GetBackData());
+    EXPECT_EQ("copy", TextOf(holder));
+}
+
+TEST(FileStoreItemType, LastRegistrationOfAClassWins)
+{
+    static FileStoreItemType const s_first(ClassUID("Ts01"), MemoryItem::c_plain.GetCreateFunc(),
+                                           FileStoreItemType::IsNestableType, FileStoreItemType::NotRecoverable);
+    static FileStoreItemType const s_second(ClassUID("Ts01"), MemoryItem::c_plain.GetCreateFunc(),
+                                            FileStoreItemType::NotNestable, FileStoreItemType::IsRecoverableType);
+    FileStoreItemType::Init const first(s_first);
+    EXPECT_EQ(&s_first, FileStoreItemType::FindFileStoreItemType(ClassUID("Ts01")));
+    FileStoreItemType::Init const second(s_second);
+    EXPECT_EQ(&s_second, FileStoreItemType::FindFileStoreItemType(ClassUID("Ts01")));
+    EXPECT_EQ(nullptr, FileStoreItemType::FindFileStoreItemType(ClassUID("none")));
+    EXPECT_TRUE(s_first.IsNestable() && !s_first.IsRecoverable());
+    EXPECT_TRUE(!s_second.IsNestable() && s_second.IsRecoverable());
+}
+
+TEST(VoidFileStore, HasNothingAndTakesNothing)
+{
+    VoidFileStore& store = VoidFileStore::GetInstance();
+    Counted<MemoryItem> const item(new MemoryItem);
+    EXPECT_FALSE(store.LoadFile("x", *item));
+    EXPECT_FALSE(store.LoadFile("x", nullptr, *item, true));
+    EXPECT_FALSE(store.CreateBackData(nullptr, "x"));
+    EXPECT_FALSE(store.IsBroken());
+    EXPECT_FALSE(store.CreateDelayLoadHolderDirect("x", &MemoryItem::c_plain, nullptr));
+    Counted<DelayLoadHolder> const holder = store.CreateDelayLoadHolderDirect("x", &MemoryItem::c_recoverable, nullptr);
+    ASSERT_TRUE(holder);
+    EXPECT_TRUE(holder->IsDead());
+
+    VoidFileStoreOut& out = VoidFileStoreOut::GetInstance();
+    EXPECT_EQ(&store, &out.GetFileStore());
+    EXPECT_TRUE(out.IsFullSave());
+    String8 path("before");
+    EXPECT_FALSE(out.GenerateIndexedPath({"a", "b"}, item, holder, path));
+    EXPECT_FALSE(out.AddProlongedObject(item)) << "the process-wide output must not collect objects";
+    EXPECT_EQ(1, item->GetReferenceCount());
+}
+
+TEST(BackstoreException, IsTracedAndCarriesItsReason)
+{
+    static String8 s_traced;
+    Platform::SetDebugSink([](char const* text) { s_traced += text; });
+    bool const was = IsTraceEnabled();
+    SetIsTraceEnabled(true);
+    BackstoreException const exception(true);
+    SetIsTraceEnabled(was);
+    Platform::SetDebugSink(nullptr);
+    EXPECT_TRUE(s_traced.BeginsWith("== BackstoreException"));
+    EXPECT_TRUE(s_traced.EndsWith("\n"));
+    EXPECT_TRUE(exception.GetOutOfSpace());
+}
+
+} // namespace
