@@ -39,8 +39,9 @@ public:
     /// UnknownFlagVersionException for a version beyond those registered, and for a bit beyond a set of fewer than 64.
     void DecodeFromSerial(u64 encoded, unsigned short version, u64& flags, unsigned char& activeBytes) const;
 
-    /// Bytes that a stored flag set takes: @p width, more if @p encoded needs them, without trailing zero bytes.
-    static u8 GetStoredBytes(u64 encoded, u8 width);
+    /// Bytes that a stored flag set takes: those of @p encoded without the trailing zeros. The width of the program's
+    /// flag word does not come in, since a set may place the flags of a narrow word further up.
+    static u8 GetStoredBytes(u64 encoded);
 
 private:
     enum class Shape : u8

@@ -2,6 +2,7 @@
 
 #include "libkernel/core/Countable.h"
 #include "libkernel/core/IDTag.h"
+#include "libkernel/core/NestingGuard.h"
 #include "libkernel/core/String.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
 #include "libkernel/serialisation/FlagSerialiser.h"
@@ -14,6 +15,7 @@
 
 #include <deque>
 #include <memory>
+#include <optional>
 #include <ranges>
 #include <source_location>
 #include <type_traits>
@@ -313,7 +315,8 @@ public:
 
     // State.
 
-    /// Writes the end of the list. Code 3 while a child is open. Further calls do nothing; saving afterwards is code 5.
+    /// Writes the end of the list; at file level also hands everything to the stream, which is not flushed. Code 3
+    /// while a child is open. Further calls do nothing; saving afterwards is code 5.
     void Close();
     bool IsClosed() const { return m_isClosed; }
     bool HaveChildActive() const { return m_isChildActive; }
@@ -347,6 +350,7 @@ protected:
 private:
     friend class OutSerialiserPropertyDataStream;
     friend class OutSerialiserFile;
+    friend class PropWriter;
 
     // What children inherit. A serialiser points to its parent's until it changes something.
     struct Advice
@@ -357,16 +361,19 @@ private:
     static Advice const s_noAdvice;
     Advice& GetOwnAdvice();
 
-    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current());
+    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current()) const;
     u8* ClaimI(u64 count);
     void PutI(void const* bytes, u64 count);
     u8* PutHeaderI(IDTag tag, u8 type, u64 more);
-    u32 CheckCountI(u64 count);
-    int CheckLengthI(u64 length);
+    u32 CheckCountI(u64 count) const;
+    u16 CheckShortI(u64 size) const;
+    int CheckLengthI(u64 length) const;
     template <class Test>
     bool IsDefaultI(IDTag tag, Test const& test) const;
 
     void StartI(IDTag tag);
+    void PutRawDataI(IDTag tag, void const* bytes, u64 size);
+    void PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes);
     void SaveBoolI(IDTag tag, bool value);
     template <class Bools>
     void SaveBoolsI(IDTag tag, Bools const& values, u64 count);
@@ -381,15 +388,18 @@ private:
         value.Save(child);
         child.Close();
     }
+    void PutObjectRecordI(ObjectRecord kind, u32 index);
     template <class T>
-    void SaveObjectBodyI(T const& object, ClassPropertiesBase const& description, u32 index);
+    void SaveObjectBodyI(T const& object, u32 index);
+    template <class T>
+    void EnumerateObjectBodyI(T const& object);
 
     void SaveClassInfoI(ClassPropertiesBase const* description);
     void SaveDefaultI(Defaults::DefaultBase const& item);
     void SaveObjectEnumeratePathsOnlyI(Serialisable const& object);
     void SaveSharedObjectEnumeratePathsOnlyI(SharedSerialisable const& object);
     void SaveClassInfoEnumeratePathsOnlyI(ClassPropertiesBase const* description);
-    String8 GetHolderPathI(DelayLoadHolder& holder, FileStoreOutPathGenerator& generator);
+    String8 GetHolderPathI(Counted<DelayLoadHolder> const& holder, FileStoreOutPathGenerator& generator);
 
     DefaultTable const* m_defaults; // Of the class in hand and its parents; null at file level and in inline classes.
     Advice const* m_advice;
@@ -397,7 +407,8 @@ private:
     bool m_isChildActive = false;
     bool m_isClosed = false;
     bool const m_isFullSave;
-    bool m_isNested; // Takes a level of the nesting.
+    bool const m_isFileLevel;
+    std::optional<NestingGuard> m_level; // Of an inline class; that of an object also spans its class record.
     UsedTagSet m_usedTags;
 };
 

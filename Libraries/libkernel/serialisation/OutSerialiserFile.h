@@ -35,15 +35,13 @@ public:
     OutSerialiserFile(OutStream& stream, FileStoreOut& store, IDTag tag, unsigned short version);
     ~OutSerialiserFile() override;
 
-    /// Close, and hands everything to the stream, which is not flushed.
-    void Close();
-
 private:
     void WriteHeaderI(IDTag tag, unsigned short version);
 
     StubOutStream m_stub;
     OutSerialiserTarget m_fileTarget;
     OutSerialiserObjectList m_objectList;
+    int const m_exceptionsAtStart; // An exception on its way when this dies, but not when it was made, ends the save.
 };
 
 } // namespace Kernel

@@ -40,10 +40,6 @@ public:
     bool IsDescribed(ClassPropertiesBase const* description) const;
     void MarkAsDescribed(ClassPropertiesBase const* description);
 
-    /// One level of objects, inline classes or parents more or less; false when there are too many.
-    bool Enter();
-    void Leave() { --m_nesting; }
-
     /// A save that failed writes nothing more, so that what is destroyed on the way out does no harm.
     void MarkAsHandlingException() { m_isHandlingException = true; }
     bool IsHandlingException() const { return m_isHandlingException; }
@@ -68,7 +64,6 @@ private:
     Map m_objects;
     Map m_sharedObjects;
     u32 m_nextIndex = 0;
-    u32 m_nesting = 0;
     bool m_isHandlingException = false;
     mutable ClassPropertiesBase const* m_lastDescribed = nullptr; // Of the last successful question.
     std::vector<ClassPropertiesBase const*> m_described;          // Sorted by address.

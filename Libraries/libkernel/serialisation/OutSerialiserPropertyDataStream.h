@@ -106,15 +106,13 @@ public:
     void AppendI(void const* bytes, u64 size);
 
 private:
-    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current());
-    bool StartValueI();
-    void CheckTypeI(PropType type, u64 size);
+    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current()) const;
+    bool StartValueI() const;
+    void CheckTypeI(PropType type, u64 size) const;
     void SaveBoolI(bool value);
     void SaveStringI(char const* utf8, u64 length);
     template <class Bools>
     void SaveBoolsI(Bools const& values, u64 count);
-    template <class Enc>
-    void SaveForeignTextsI(StringT<Enc> const* texts, u64 count);
 
     OutSerialiser& m_out;
     bool m_isClosed = false;

@@ -105,7 +105,7 @@ constexpr u32 c_maxRawStructSize = 64;
 constexpr u32 c_maxDataAlignment = 8;
 /// Type byte, tag and length; and the same with the pad field.
 constexpr u32 c_rawDataHeaderSize = 9;
-constexpr u32 c_alignedRawDataHeaderSize = 10;
+constexpr u32 c_alignedRawDataHeaderSize = 11;
 
 /// First byte of an object record.
 enum class ObjectRecord : u8

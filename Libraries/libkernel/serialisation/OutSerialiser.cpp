@@ -1,0 +1,462 @@
+#include "libkernel/serialisation/OutSerialiser.h"
+
+#include "libkernel/core/CheckedMath.h"
+#include "libkernel/core/ConvertEnc.h"
+#include "libkernel/core/Endian.h"
+#include "libkernel/core/FragmentedRawData.h"
+#include "libkernel/core/RawData.h"
+#include "libkernel/filestore/FileStoreOut.h"
+#include "libkernel/serialisation/ClassProperties.h"
+#include "libkernel/serialisation/OutSerialiserObjectList.h"
+#include "libkernel/serialisation/OutSerialiserTarget.h"
+#include "libkernel/serialisation/internal/DefaultTable.h"
+#include "libkernel/serialisation/internal/PropWriter.h"
+
+#include <bit>
+#include <limits>
+
+namespace Kernel {
+
+// Numbers, structs and arrays go to the file as they lie in memory.
+static_assert(std::endian::native == std::endian::little);
+
+namespace {
+
+constexpr u64 c_tagHeaderSize = 5; // Type byte and tag.
+
+bool CompareBools(Defaults::DefaultTypeArray const& item, bool const* values, u64 count)
+{
+    return item.Compare(values, count);
+}
+
+bool CompareBools(Defaults::DefaultTypeArray const& item, std::vector<bool> const& values, u64)
+{
+    return item.Compare(values);
+}
+
+DefaultTable const* GetTableOrNull(DefaultTable const& table)
+{
+    return table.IsEmpty() ? nullptr : &table;
+}
+
+} // namespace
+
+OutSerialiser::SaveException::~SaveException() = default;
+
+OutSerialiser::Advice const OutSerialiser::s_noAdvice;
+
+OutSerialiser::OutSerialiser(OutSerialiserTarget& target, FileStoreOut& store, OutSerialiserObjectList& objects)
+    : m_target(target), m_store(store), m_objects(objects), m_defaults(nullptr), m_advice(&s_noAdvice),
+      m_isFullSave(store.IsFullSave()), m_isFileLevel(true)
+{
+}
+
+OutSerialiser::OutSerialiser(OutSerialiser& parent, ClassPropertiesBase const* description)
+    : m_target(parent.m_target), m_store(parent.m_store), m_objects(parent.m_objects),
+      m_defaults(description ? GetTableOrNull(description->GetDefaultTable()) : nullptr), m_advice(parent.m_advice),
+      m_isFullSave(parent.m_isFullSave), m_isFileLevel(false)
+{
+    if (description) return;
+    m_level.emplace();
+    if (!m_level->IsAllowed()) Fail(SaveException::Misuse);
+}
+
+OutSerialiser::~OutSerialiser() = default;
+
+void OutSerialiser::Fail(int code, std::source_location where) const
+{
+    if (code == SaveException::ShortWrite) m_objects.MarkAsHandlingException();
+    throw SaveException(where.file_name(), static_cast<int>(where.line()), code);
+}
+
+u8* OutSerialiser::ClaimI(u64 count)
+{
+    u8* const room = m_target.Claim(count);
+    if (!room) Fail(SaveException::ShortWrite);
+    return room;
+}
+
+void OutSerialiser::PutI(void const* bytes, u64 count)
+{
+    if (!m_target.Put(bytes, count)) Fail(SaveException::ShortWrite);
+}
+
+u8* OutSerialiser::PutHeaderI(IDTag tag, u8 type, u64 more)
+{
+    u8* const room = ClaimI(c_tagHeaderSize + more);
+    room[0] = type;
+    StoreLittleEndian(room + 1, tag.value);
+    return room + c_tagHeaderSize;
+}
+
+u32 OutSerialiser::CheckCountI(u64 count) const
+{
+    if (count > std::numeric_limits<u32>::max()) Fail(SaveException::TooLarge);
+    return static_cast<u32>(count);
+}
+
+u16 OutSerialiser::CheckShortI(u64 size) const
+{
+    if (size > std::numeric_limits<u16>::max()) Fail(SaveException::TooLarge);
+    return static_cast<u16>(size);
+}
+
+int OutSerialiser::CheckLengthI(u64 length) const
+{
+    if (length > static_cast<u64>(std::numeric_limits<int>::max())) Fail(SaveException::TooLarge);
+    return static_cast<int>(length);
+}
+
+template <class Test>
+bool OutSerialiser::IsDefaultI(IDTag tag, Test const& test) const
+{
+    return m_defaults && m_defaults->Any(tag, test);
+}
+
+void OutSerialiser::StartI(IDTag tag)
+{
+    if (m_store.IsAbortRequested()) {
+        m_store.SetAborted();
+        throw AbortException();
+    }
+    if (m_isClosed) Fail(SaveException::Misuse);
+    if (m_isChildActive || !m_usedTags.Add(tag)) Fail(SaveException::TagOrChild);
+}
+
+void OutSerialiser::SaveTypeI(IDTag tag, PropType type, void const* value, u64 size)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u8 const number = static_cast<u8>(type);
+    if (size == 0 || number >= c_propTypeCount || c_propSizes[number] != size) Fail(SaveException::Misuse);
+    if (IsDefaultI(tag, [&](DefaultTable::Row const& row) { return row.EqualsScalar(type, value, size); })) return;
+    u8* const to = PutHeaderI(tag, number, size);
+    switch (size) {
+    // Copies of a known size are one store.
+    case 1: *to = *static_cast<u8 const*>(value); return;
+    case 4: std::memcpy(to, value, 4); return;
+    case 8: std::memcpy(to, value, 8); return;
+    default: std::memcpy(to, value, size); return;
+    }
+}
+
+void OutSerialiser::SaveTypeArrayI(IDTag tag, PropType type, void const* values, u64 unitSize, u64 count)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u8 const number = static_cast<u8>(type);
+    bool const isPacked = type == PropType::Bool;
+    if (unitSize == 0 || number >= c_propTypeCount || c_propSizes[number] != unitSize || isPacked)
+        Fail(SaveException::Misuse);
+    u32 const stored = CheckCountI(count);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultTypeArray>();
+        return item && item->Compare(type, values, unitSize, count);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    StoreLittleEndian(PutHeaderI(tag, number | c_propArrayBit, 4), stored);
+    PutI(values, unitSize * count);
+}
+
+void OutSerialiser::SaveBoolI(IDTag tag, bool value)
+{
+    u8 const byte = value ? 1 : 0;
+    SaveTypeI(tag, PropType::Bool, &byte, 1);
+}
+
+template <class Bools>
+void OutSerialiser::SaveBoolsI(IDTag tag, Bools const& values, u64 count)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    CheckCountI(count);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultTypeArray>();
+        return item && CompareBools(*item, values, count);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    PutHeaderI(tag, static_cast<u8>(PropType::Bool) | c_propArrayBit, 0);
+    PropWriter(*this).PutBools(values, count);
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, bool const* values, u64 count)
+{
+    SaveBoolsI(tag, values, count);
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, std::vector<bool> const& values)
+{
+    SaveBoolsI(tag, values, values.size());
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, std::deque<bool> const& values)
+{
+    SaveTypes(tag, std::vector<bool>(values.begin(), values.end()));
+}
+
+void OutSerialiser::SaveType(IDTag tag, String8 const& text)
+{
+    SaveStringI(tag, text.GetData(), static_cast<u64>(text.GetLength()));
+}
+
+void OutSerialiser::SaveType(IDTag tag, String16 const& text)
+{
+    if (m_isFullSave) SaveType(tag, ConvertedTo<TEncUtf8>(text));
+}
+
+void OutSerialiser::SaveType(IDTag tag, String32 const& text)
+{
+    if (m_isFullSave) SaveType(tag, ConvertedTo<TEncUtf8>(text));
+}
+
+void OutSerialiser::SaveStringI(IDTag tag, char const* utf8, u64 length)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u32 const stored = CheckCountI(length);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultString>();
+        return item && item->GetText().GetView() == std::string_view(utf8, length);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::String), 4), stored);
+    PutI(utf8, length);
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, String8 const* texts, u64 count)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultStringArray>();
+        return item && item->Compare(texts, count);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    PropWriter writer(*this);
+    u32 const total = writer.CheckTexts(texts, count);
+    PutHeaderI(tag, static_cast<u8>(PropType::String) | c_propArrayBit, 0);
+    writer.PutTexts(texts, count, total);
+}
+
+template <class Enc>
+void OutSerialiser::SaveForeignTextsI(IDTag tag, StringT<Enc> const* texts, u64 count)
+{
+    if (m_isFullSave) SaveTypes(tag, PropWriter::ConvertTexts(texts, count).data(), count);
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, String16 const* texts, u64 count)
+{
+    SaveForeignTextsI(tag, texts, count);
+}
+
+void OutSerialiser::SaveTypes(IDTag tag, String32 const* texts, u64 count)
+{
+    SaveForeignTextsI(tag, texts, count);
+}
+
+void OutSerialiser::SavePropertyStructI(IDTag tag, void const* value, u64 size)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultCustom>();
+        return item && item->Compare(value, size);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    u16 const stored = CheckShortI(size);
+    StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::Custom), 2), stored);
+    PutI(value, size);
+}
+
+void OutSerialiser::SavePropertyStructArrayI(IDTag tag, void const* values, u64 unitSize, u64 count)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u32 const storedCount = CheckCountI(count);
+    u16 const storedSize = CheckShortI(unitSize);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultCustomArray>();
+        return item && item->Compare(values, unitSize, count);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Custom) | c_propArrayBit, 6);
+    StoreLittleEndian(header, storedCount);
+    StoreLittleEndian(header + 4, storedSize);
+    PutI(values, unitSize * count);
+}
+
+void OutSerialiser::SaveRawStructI(IDTag tag, void const* value, u64 size)
+{
+    if (size < 1 || size > c_maxRawStructSize) Fail(SaveException::TooLarge);
+    if (!m_isFullSave) return;
+    StartI(tag);
+    std::memcpy(PutHeaderI(tag, static_cast<u8>(RawStructType(size)), size), value, size);
+}
+
+void OutSerialiser::SaveRawData(IDTag tag, void const* bytes, u64 size)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    PutRawDataI(tag, bytes, size);
+}
+
+void OutSerialiser::PutRawDataI(IDTag tag, void const* bytes, u64 size)
+{
+    u32 const stored = CheckCountI(size);
+    StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::RawData), 4), stored);
+    PutI(bytes, size);
+}
+
+void OutSerialiser::SaveAlignedRawData(IDTag tag, void const* bytes, u64 size, u64 alignment)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    if (alignment > c_maxDataAlignment) Fail(SaveException::Misuse);
+    u64 const position = m_target.GetSize();
+    if (alignment < 2 || (position + c_rawDataHeaderSize) % alignment == 0) return PutRawDataI(tag, bytes, size);
+    u32 const stored = CheckCountI(size);
+    u64 const remainder = (position + c_alignedRawDataHeaderSize) % alignment;
+    u16 const pad = static_cast<u16>(remainder ? alignment - remainder : 0);
+    u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::AlignedRawData), 6 + pad);
+    StoreLittleEndian(header, stored);
+    StoreLittleEndian(header + 4, pad);
+    std::memset(header + 6, 0, pad);
+    PutI(bytes, size);
+}
+
+void OutSerialiser::SaveAlignedRawData(IDTag tag, RawDataT<VoidClass, AllocatorMalloc> const& bytes, u64 alignment)
+{
+    SaveAlignedRawData(tag, bytes.GetData(), bytes.GetSize(), alignment);
+}
+
+void OutSerialiser::SaveFragmentedRawData(IDTag tag, FragmentedRawData const& bytes)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u32 const size = CheckCountI(bytes.GetSize());
+    u32 const blockSize = CheckCountI(bytes.GetBlockSize());
+    u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::FragmentedRawData), 8);
+    StoreLittleEndian(header, size);
+    StoreLittleEndian(header + 4, blockSize);
+    OutStream* const stream = m_target.GetFlushedStream();
+    if (stream && bytes.CopyToStream(*stream)) return;
+    m_target.MarkAsFailed();
+    Fail(SaveException::ShortWrite);
+}
+
+void OutSerialiser::SaveEnumI(IDTag tag, EnumSerialiser const& serialiser, int value)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    unsigned short code = 0;
+    unsigned short version = 0;
+    if (!serialiser.EncodeToSerial(value, code, version)) Fail(SaveException::NoEncoding);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultEnum>();
+        return item && item->Compare(code, version);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    u8* const to = PutHeaderI(tag, static_cast<u8>(PropType::Enum), 4);
+    StoreLittleEndian(to, code);
+    StoreLittleEndian(to + 2, version);
+}
+
+void OutSerialiser::SaveEnumsI(IDTag tag, EnumSerialiser const& serialiser, int const* values, u64 count)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u32 const storedCount = CheckCountI(count);
+    std::vector<unsigned short> codes;
+    unsigned short version = 0;
+    if (!serialiser.EncodeToSerial(values, count, codes, version)) Fail(SaveException::NoEncoding);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultEnumArray>();
+        return item && item->Compare(codes.data(), count, version);
+    };
+    if (IsDefaultI(tag, equals)) return;
+    u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Enum) | c_propArrayBit, 6);
+    StoreLittleEndian(header, storedCount);
+    StoreLittleEndian(header + 4, version);
+    PutI(codes.data(), codes.size() * sizeof(u16));
+}
+
+void OutSerialiser::SaveFlagSetI(IDTag tag, FlagSerialiser const& serialiser, u64 flags, unsigned char)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    u64 encoded = 0;
+    unsigned short version = 0;
+    if (!serialiser.EncodeToSerial(flags, encoded, version)) Fail(SaveException::NoEncoding);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultFlagSet>();
+        return item && item->Compare(encoded, version);
+    };
+    if (!IsDefaultI(tag, equals)) PutFlagSetI(tag, encoded, version, FlagSerialiser::GetStoredBytes(encoded));
+}
+
+void OutSerialiser::PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes)
+{
+    u8* const to = PutHeaderI(tag, static_cast<u8>(PropType::FlagSet), 3 + bytes);
+    StoreLittleEndian(to, version);
+    to[2] = bytes;
+    std::memcpy(to + 3, &encoded, bytes);
+}
+
+void OutSerialiser::Close()
+{
+    if (m_isClosed) return;
+    if (m_isChildActive) Fail(SaveException::TagOrChild);
+    if (m_isFullSave) {
+        *ClaimI(1) = 0;
+        if (m_isFileLevel && !m_target.Flush()) Fail(SaveException::ShortWrite);
+    }
+    m_isClosed = true;
+}
+
+void OutSerialiser::AddProlongedObject(Counted<Countable const> object)
+{
+    if (!m_store.AddProlongedObject(object)) m_objects.KeepAlive(object);
+}
+
+OutSerialiser::Advice& OutSerialiser::GetOwnAdvice()
+{
+    if (!m_ownAdvice) {
+        m_ownAdvice = std::make_unique<Advice>(*m_advice);
+        m_advice = m_ownAdvice.get();
+    }
+    return *m_ownAdvice;
+}
+
+void OutSerialiser::SetFilePath(String8 const& path)
+{
+    GetOwnAdvice().path = path;
+}
+
+void OutSerialiser::PushStrategy(Counted<SerialisationStrategy const> const& strategy)
+{
+    GetOwnAdvice().strategies.push_back(strategy);
+}
+
+void OutSerialiser::PopStrategy()
+{
+    if (!m_advice->strategies.empty()) GetOwnAdvice().strategies.pop_back();
+}
+
+void OutSerialiser::InitStrategies(std::vector<Counted<SerialisationStrategy const>> const& strategies)
+{
+    GetOwnAdvice().strategies = strategies;
+}
+
+SerialisationStrategySession::SerialisationStrategySession(OutSerialiser& out,
+                                                           Counted<SerialisationStrategy const> strategy)
+    : m_out(strategy ? &out : nullptr)
+{
+    if (m_out) m_out->PushStrategy(strategy);
+}
+
+SerialisationStrategySession::~SerialisationStrategySession()
+{
+    if (m_out) m_out->PopStrategy();
+}
+
+} // namespace Kernel

@@ -1,0 +1,359 @@
+#include "libkernel/core/Endian.h"
+#include "libkernel/filestore/DelayLoadHolder.h"
+#include "libkernel/filestore/FileStore.h"
+#include "libkernel/filestore/FileStoreItem.h"
+#include "libkernel/filestore/FileStoreItemType.h"
+#include "libkernel/filestore/FileStoreOut.h"
+#include "libkernel/filestore/FileStoreOutPathGenerator.h"
+#include "libkernel/serialisation/ClassProperties.h"
+#include "libkernel/serialisation/OutSerialiser.h"
+#include "libkernel/serialisation/OutSerialiserObjectList.h"
+#include "libkernel/serialisation/internal/DefaultTable.h"
+#include "libkernel/serialisation/internal/PropWriter.h"
+
+// Objects, classes and references to stored items. Each structure has two forms here: the one that writes, and the one
+// that only walks, so that a store that enumerates hears of every item before the real save begins.
+
+namespace Kernel {
+
+namespace {
+
+constexpr u8 c_objectType = static_cast<u8>(PropType::Object);
+constexpr u8 c_classType = static_cast<u8>(PropType::Class);
+
+} // namespace
+
+void OutSerialiser::SaveObject(IDTag tag, NonCounted<Serialisable const> object, bool isOwner)
+{
+    StartI(tag);
+    if (m_isFullSave) PutHeaderI(tag, c_objectType, 0);
+    SaveObjectI(object, isOwner);
+}
+
+void OutSerialiser::SaveSharedObject(IDTag tag, Consolidated<SharedSerialisable> const& object)
+{
+    StartI(tag);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultSharedObject>();
+        return item && item->Compare(object);
+    };
+    if (m_defaults && m_defaults->Any(tag, equals)) return;
+    if (m_isFullSave) PutHeaderI(tag, c_objectType, 0);
+    SaveSharedObjectI(object);
+}
+
+bool OutSerialiser::TestDefaultObjectsI(IDTag tag, std::vector<Consolidated<SharedSerialisable>> const& objects) const
+{
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultSharedObjectArray>();
+        return item && item->Compare(objects);
+    };
+    return m_defaults && m_defaults->Any(tag, equals);
+}
+
+void OutSerialiser::StartObjectArrayTestI(IDTag tag)
+{
+    StartI(tag);
+}
+
+void OutSerialiser::StartObjectArrayBeginI(IDTag tag, u64 count)
+{
+    if (!m_isFullSave) return;
+    u32 const stored = CheckCountI(count);
+    StoreLittleEndian(PutHeaderI(tag, c_objectType | c_propArrayBit, 4), stored);
+}
+
+void OutSerialiser::PutObjectRecordI(ObjectRecord kind, u32 index)
+{
+    u8* const to = ClaimI(5);
+    to[0] = static_cast<u8>(kind);
+    StoreLittleEndian(to + 1, index);
+}
+
+void OutSerialiser::SaveObjectI(NonCounted<Serialisable const> object, bool isOwner)
+{
+    if (!m_isFullSave) return object ? SaveObjectEnumeratePathsOnlyI(*object) : void();
+    if (!object) {
+        *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
+        return;
+    }
+    bool isNew = false;
+    auto& record = m_objects.FindOrAdd(object.Get(), isNew);
+    record.isOwned |= isOwner;
+    if (isNew)
+        SaveObjectBodyI(*object, record.index);
+    else
+        PutObjectRecordI(ObjectRecord::Back, record.index);
+}
+
+void OutSerialiser::SaveSharedObjectI(Consolidated<SharedSerialisable> const& object)
+{
+    if (!m_isFullSave) return object ? SaveSharedObjectEnumeratePathsOnlyI(*object) : void();
+    if (!object) {
+        *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
+        return;
+    }
+    bool isNew = false;
+    auto& record = m_objects.FindOrAddShared(object.Get(), isNew);
+    if (record.isWriting) Fail(SaveException::Misuse);
+    if (!isNew) return PutObjectRecordI(ObjectRecord::Back, record.index);
+    record.isWriting = true;
+    SaveObjectBodyI(*object, record.index);
+    m_objects.FindShared(object.Get())->isWriting = false;
+}
+
+// On an exception the mark of the active child stays, so that nobody writes on behind half an object.
+template <class T>
+void OutSerialiser::SaveObjectBodyI(T const& object, u32 index)
+{
+    NestingGuard const level;
+    ClassPropertiesBase const* const description = object.GetObjectClassProperties();
+    if (!description || !level.IsAllowed()) Fail(SaveException::Misuse);
+    PutObjectRecordI(ObjectRecord::First, index);
+    SaveClassInfoI(description);
+    m_isChildActive = true;
+    {
+        OutSerialiser child(*this, description);
+        object.Save(child);
+        child.Close();
+    }
+    m_isChildActive = false;
+}
+
+void OutSerialiser::SaveClassInfoI(ClassPropertiesBase const* description)
+{
+    if (!description) {
+        *ClaimI(1) = static_cast<u8>(ClassRecord::None);
+        return;
+    }
+    bool const isKnown = m_objects.IsDescribed(description);
+    u8* const record = ClaimI(isKnown ? 5 : 7);
+    record[0] = static_cast<u8>(isKnown ? ClassRecord::Known : ClassRecord::Described);
+    StoreLittleEndian(record + 1, description->GetClassUID().value);
+    if (isKnown) return;
+    StoreLittleEndian(record + 5, static_cast<u16>(description->GetSchemaVersion()));
+    for (auto const& [tag, item] : description->GetDefaults()) SaveDefaultI(*item);
+    *ClaimI(1) = 0;
+    m_objects.MarkAsDescribed(description);
+    NestingGuard const level;
+    if (!level.IsAllowed()) Fail(SaveException::Misuse);
+    SaveClassInfoI(description->GetParentClassProperties());
+}
+
+void OutSerialiser::SaveDefaultI(Defaults::DefaultBase const& item)
+{
+    using Defaults::DefaultItemType;
+    IDTag const tag = item.GetIDTag();
+    switch (item.GetDefaultType()) {
+    case DefaultItemType::Type: {
+        auto const& scalar = static_cast<Defaults::DefaultType const&>(item);
+        PutHeaderI(tag, static_cast<u8>(scalar.GetPropType()), 0);
+        return PutI(scalar.GetBytes().data(), scalar.GetBytes().size());
+    }
+    case DefaultItemType::TypeArray: {
+        auto const& array = static_cast<Defaults::DefaultTypeArray const&>(item);
+        u32 const count = CheckCountI(array.GetCount());
+        StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(array.GetPropType()) | c_propArrayBit, 4), count);
+        return PutI(array.GetBytes().data(), array.GetBytes().size());
+    }
+    case DefaultItemType::String: {
+        String8 const& text = static_cast<Defaults::DefaultString const&>(item).GetText();
+        u32 const length = static_cast<u32>(text.GetLength());
+        StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::String), 4), length);
+        return PutI(text.GetData(), length);
+    }
+    case DefaultItemType::Custom: {
+        auto const& bytes = static_cast<Defaults::DefaultCustom const&>(item).GetBytes();
+        u16 const size = CheckShortI(bytes.size());
+        StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::Custom), 2), size);
+        return PutI(bytes.data(), bytes.size());
+    }
+    case DefaultItemType::CustomArray: {
+        auto const& array = static_cast<Defaults::DefaultCustomArray const&>(item);
+        u32 const count = CheckCountI(array.GetCount());
+        u16 const unitSize = CheckShortI(array.GetUnitSize());
+        u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Custom) | c_propArrayBit, 6);
+        StoreLittleEndian(header, count);
+        StoreLittleEndian(header + 4, unitSize);
+        return PutI(array.GetBytes().data(), array.GetBytes().size());
+    }
+    case DefaultItemType::Enum: {
+        auto const& value = static_cast<Defaults::DefaultEnum const&>(item);
+        u8* const to = PutHeaderI(tag, static_cast<u8>(PropType::Enum), 4);
+        StoreLittleEndian(to, value.GetCode());
+        StoreLittleEndian(to + 2, value.GetVersion());
+        return;
+    }
+    case DefaultItemType::EnumArray: {
+        auto const& array = static_cast<Defaults::DefaultEnumArray const&>(item);
+        u32 const count = CheckCountI(array.GetCodes().size());
+        u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Enum) | c_propArrayBit, 6);
+        StoreLittleEndian(header, count);
+        StoreLittleEndian(header + 4, array.GetVersion());
+        return PutI(array.GetCodes().data(), array.GetCodes().size() * sizeof(u16));
+    }
+    case DefaultItemType::FlagSet: {
+        auto const& flags = static_cast<Defaults::DefaultFlagSet const&>(item);
+        return PutFlagSetI(tag, flags.GetEncoded(), flags.GetVersion(), flags.GetActiveBytes());
+    }
+    case DefaultItemType::SharedObject:
+        PutHeaderI(tag, c_objectType, 0);
+        return SaveSharedObjectI(static_cast<Defaults::DefaultSharedObject const&>(item).GetObject());
+    case DefaultItemType::SharedObjectArray: {
+        auto const& objects = static_cast<Defaults::DefaultSharedObjectArray const&>(item).GetObjects();
+        StartObjectArrayBeginI(tag, objects.size());
+        for (auto const& object : objects) SaveSharedObjectI(object);
+        return;
+    }
+    case DefaultItemType::StringArray: break; // No wire form.
+    }
+    Fail(SaveException::Misuse);
+}
+
+void OutSerialiser::SaveObjectEnumeratePathsOnlyI(Serialisable const& object)
+{
+    bool isNew = false;
+    m_objects.FindOrAdd(&object, isNew);
+    if (isNew) EnumerateObjectBodyI(object);
+}
+
+void OutSerialiser::SaveSharedObjectEnumeratePathsOnlyI(SharedSerialisable const& object)
+{
+    bool isNew = false;
+    auto& record = m_objects.FindOrAddShared(&object, isNew);
+    if (record.isWriting) Fail(SaveException::Misuse);
+    if (!isNew) return;
+    record.isWriting = true;
+    EnumerateObjectBodyI(object);
+    m_objects.FindShared(&object)->isWriting = false;
+}
+
+template <class T>
+void OutSerialiser::EnumerateObjectBodyI(T const& object)
+{
+    NestingGuard const level;
+    ClassPropertiesBase const* const description = object.GetObjectClassProperties();
+    if (!description || !level.IsAllowed()) Fail(SaveException::Misuse);
+    SaveClassInfoEnumeratePathsOnlyI(description);
+    m_isChildActive = true;
+    {
+        OutSerialiser child(*this, description);
+        object.Save(child);
+        child.Close();
+    }
+    m_isChildActive = false;
+}
+
+void OutSerialiser::SaveClassInfoEnumeratePathsOnlyI(ClassPropertiesBase const* description)
+{
+    using Defaults::DefaultItemType;
+    if (!description || m_objects.IsDescribed(description)) return;
+    for (auto const& [tag, item] : description->GetDefaults()) {
+        DefaultItemType const kind = item->GetDefaultType();
+        if (kind == DefaultItemType::StringArray || kind > DefaultItemType::SharedObjectArray)
+            Fail(SaveException::Misuse);
+        if (kind == DefaultItemType::SharedObject)
+            SaveSharedObjectI(static_cast<Defaults::DefaultSharedObject const&>(*item).GetObject());
+        if (kind != DefaultItemType::SharedObjectArray) continue;
+        for (auto const& object : static_cast<Defaults::DefaultSharedObjectArray const&>(*item).GetObjects())
+            SaveSharedObjectI(object);
+    }
+    m_objects.MarkAsDescribed(description);
+    NestingGuard const level;
+    if (!level.IsAllowed()) Fail(SaveException::Misuse);
+    SaveClassInfoEnumeratePathsOnlyI(description->GetParentClassProperties());
+}
+
+void OutSerialiser::StartClassTestI(IDTag tag)
+{
+    StartI(tag);
+}
+
+void OutSerialiser::StartClassBeginI(IDTag tag, ClassUID const& classUID, unsigned short version)
+{
+    m_isChildActive = true;
+    if (!m_isFullSave) return;
+    u8* const to = PutHeaderI(tag, c_classType, 7);
+    to[0] = 1;
+    StoreLittleEndian(to + 1, classUID.value);
+    StoreLittleEndian(to + 5, version);
+}
+
+void OutSerialiser::EndPropClassI()
+{
+    m_isChildActive = false;
+}
+
+void OutSerialiser::SaveNullPropClassI(IDTag tag)
+{
+    StartI(tag);
+    if (m_isFullSave) *PutHeaderI(tag, c_classType, 1) = 0;
+}
+
+void OutSerialiser::StartClassArrayTestI(IDTag tag)
+{
+    StartI(tag);
+}
+
+void OutSerialiser::StartClassArrayBeginI(IDTag tag, ClassUID const& classUID, unsigned short version, u64 count)
+{
+    u32 const stored = CheckCountI(count);
+    m_isChildActive = true;
+    if (!m_isFullSave) return;
+    u8* const to = PutHeaderI(tag, c_classType | c_propArrayBit, 10);
+    StoreLittleEndian(to, stored);
+    StoreLittleEndian(to + 4, classUID.value);
+    StoreLittleEndian(to + 8, version);
+}
+
+void OutSerialiser::StartClassArrayClassI()
+{
+    if (m_isFullSave) *ClaimI(1) = 1;
+}
+
+void OutSerialiser::StartClassArrayClassNullI()
+{
+    if (m_isFullSave) *ClaimI(1) = 0;
+}
+
+void OutSerialiser::EndPropClassArrayI()
+{
+    m_isChildActive = false;
+}
+
+void OutSerialiser::SaveDelayLoadObject(IDTag tag, Counted<DelayLoadHolder> const& holder,
+                                        FileStoreOutPathGenerator& generator, Counted<FileStoreCompressionHint> hint)
+{
+    StartI(tag);
+    if (!holder && !m_isFullSave) return;
+    ClassUID itemType;
+    String8 path;
+    if (holder) {
+        itemType = holder->GetFileStoreItemType()->GetClassUID();
+        if (m_store.GetPurpose() != FileStoreOut::PurposeEnumerateHolders) path = GetHolderPathI(holder, generator);
+    }
+    if (m_isFullSave) {
+        u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::DelayLoad), 8);
+        StoreLittleEndian(header, itemType.value);
+        StoreLittleEndian(header + 4, static_cast<u32>(path.GetLength()));
+        PutI(path.GetData(), static_cast<u64>(path.GetLength()));
+    }
+    if (holder) m_store.CreateFile(holder, hint);
+}
+
+String8 OutSerialiser::GetHolderPathI(Counted<DelayLoadHolder> const& holder, FileStoreOutPathGenerator& generator)
+{
+    String8 path;
+    if (holder->GetPath(m_store.GetFileStore(), path)) return path;
+    // The path may be made from what the item says, but an item is not loaded only for its name.
+    JailCounted<FileStoreItem> item;
+    if (holder->ExistsOnlyInMemory()) {
+        item = holder->GetItemBaseIfLoaded();
+        if (!item) Fail(SaveException::NoPath);
+    }
+    if (!generator.GeneratePath(item.Get(), holder, path)) Fail(SaveException::NoPath);
+    m_store.AssignDelayLoadHolderPath(holder, path);
+    return path;
+}
+
+} // namespace Kernel

@@ -1,0 +1,31 @@
+#include "libkernel/serialisation/internal/DefaultTable.h"
+
+#include "libkernel/serialisation/ClassProperties.h"
+
+#include <algorithm>
+
+namespace Kernel {
+
+namespace {
+
+DefaultTable::Row MakeRow(Defaults::DefaultBase const& item)
+{
+    DefaultTable::Row row{item.GetIDTag().value, item.GetDefaultType(), PropType::EndOfList, 0, 0, &item};
+    auto const* const scalar = row.As<Defaults::DefaultType>();
+    if (!scalar || scalar->GetBytes().size() > sizeof row.value) return row;
+    row.type = scalar->GetPropType();
+    row.size = static_cast<u8>(scalar->GetBytes().size());
+    std::memcpy(&row.value, scalar->GetBytes().data(), row.size);
+    return row;
+}
+
+} // namespace
+
+DefaultTable::DefaultTable(ClassPropertiesBase const& description)
+{
+    for (auto const* level = &description; level; level = level->GetParentClassProperties())
+        for (auto const& [tag, item] : level->GetDefaults()) m_rows.push_back(MakeRow(*item));
+    std::ranges::stable_sort(m_rows, {}, &Row::tag);
+}
+
+} // namespace Kernel

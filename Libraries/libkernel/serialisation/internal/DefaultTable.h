@@ -1,0 +1,68 @@
+#pragma once
+
+#include "libkernel/core/IDTag.h"
+#include "libkernel/serialisation/Defaults.h"
+
+#include <algorithm>
+#include <cstring>
+#include <vector>
+
+namespace Kernel {
+
+class ClassPropertiesBase;
+
+/// The defaults of a class and all its parents in one table, sorted by tag, and for one tag from the class up to its
+/// root: a save asks this once for each property instead of walking a map for each class. Never changes.
+class DefaultTable
+{
+public:
+    struct Row
+    {
+        u32 tag;
+        Defaults::DefaultItemType kind;
+        PropType type; // The next three are set for a scalar of at most 8 bytes; size is 0 otherwise.
+        u8 size;
+        u64 value; // Its bytes as a little-endian number.
+        Defaults::DefaultBase const* item;
+
+        /// The item as a @p D, or null if it is of another kind.
+        template <class D>
+        D const* As() const
+        {
+            return kind == D::c_kind ? static_cast<D const*>(item) : nullptr;
+        }
+        bool EqualsScalar(PropType valueType, void const* bytes, u64 count) const
+        {
+            if (size == 0) {
+                auto const* const scalar = As<Defaults::DefaultType>();
+                return scalar && scalar->Compare(valueType, bytes, count);
+            }
+            return size == count && type == valueType && std::memcmp(&value, bytes, count) == 0;
+        }
+    };
+
+    explicit DefaultTable(ClassPropertiesBase const& description);
+
+    bool IsEmpty() const { return m_rows.empty(); }
+    /// True if @p test is true of one of the tag's rows; asked from the class upwards.
+    template <class Test>
+    bool Any(IDTag tag, Test const& test) const
+    {
+        auto row = m_rows.begin();
+        auto const end = m_rows.end();
+        if (m_rows.size() > 8)
+            row = std::lower_bound(row, end, tag.value, IsBefore);
+        else
+            while (row != end && row->tag < tag.value) ++row;
+        for (; row != end && row->tag == tag.value; ++row)
+            if (test(*row)) return true;
+        return false;
+    }
+
+private:
+    static bool IsBefore(Row const& row, u32 tag) { return row.tag < tag; }
+
+    std::vector<Row> m_rows;
+};
+
+} // namespace Kernel
