@@ -1,0 +1,341 @@
+#include "libkernel/filestore/DelayLoadHolder.h"
+#include "libkernel/filestore/FileStoreItem.h"
+#include "libkernel/filestore/FileStoreItemType.h"
+#include "libkernel/filestore/FileStoreOutPathGenerator.h"
+#include "libkernel/filestore/VoidFileStore.h"
+#include "libkernel/serialisation/OutSerialiserPropertyDataStream.h"
+#include "serialisation/WriterTestSupport.h"
+
+#include <map>
+
+namespace KernelTest {
+namespace {
+
+using SaveException = OutSerialiser::SaveException;
+
+struct Point
+{
+    static ClassUID GetClassUID() { return "Poin"; }
+    static unsigned short GetSchemaVersion() { return 3; }
+    void Save(OutSerialiser& out) const { out.SaveType("XXXX", u8{1}); }
+};
+
+TEST(OutSerialiserFailures, EachMisuseHasItsCode)
+{
+    EnumSerialiser enums;
+    enums.RegisterEnumSet({{1}, {5, 1}});
+    FlagSerialiser flags;
+    flags.RegisterFlagIndices({{2}, {0}});
+    static u8 const huge[65536] = {};
+    struct
+    {
+        char const* what;
+        SaveFunction save;
+        int code;
+    } const cases[] = {
+        {"tag twice",
+         [](OutSerialiser& o) {
+             o.SaveType("Tag1", 1);
+             o.SaveType("Tag1", String8("other"));
+         },
+         3},
+        {"tag after a class",
+         [](OutSerialiser& o) {
+             o.SaveClass("Tag1", Point());
+             o.SaveObject("Tag1", nullptr);
+         },
+         3},
+        {"struct of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65536); }, 2},
+        {"struct of 65,535 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65535); }, -1},
+        {"structs of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 65536, 1); }, 2},
+        {"2^32 structs", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 1, u64{1} << 32); }, 2},
+        {"2^32 numbers", [](OutSerialiser& o) { o.SaveTypes("Tag1", huge, u64{1} << 32); }, 2},
+        {"2^32 bytes", [](OutSerialiser& o) { o.SaveRawData("Tag1", huge, u64{1} << 32); }, 2},
+        {"raw struct of 0 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 0); }, 2},
+        {"raw struct of 64 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 64); }, -1},
+        {"raw struct of 65 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 65); }, 2},
+        {"unknown enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 2); }, 4},
+        {"retired enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 5); }, 4},
+        {"one unknown of two enums",
+         [&](OutSerialiser& o) {
+             o.SaveEnums("Tag1", enums, std::vector<int>{1, 2});
+         },
+         4},
+        {"unknown flag", [&](OutSerialiser& o) { o.SaveFlagSet("Tag1", flags, u8{2}); }, 4},
+        {"alignment of 9", [](OutSerialiser& o) { o.SaveAlignedRawData("Tag1", huge, 1, 9); }, 5},
+        {"type of variable size", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::String, huge, 4); }, 5},
+        {"size that is not the type's", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::UInt16, huge, 4); }, 5},
+        {"data stream below an open one",
+         [](OutSerialiser& o) {
+             OutSerialiserPropertyDataStream first(o, "Tag1", 1);
+             OutSerialiserPropertyDataStream second(o, "Tag2", 1);
+         },
+         5},
+        {"value beside an open data stream",
+         [](OutSerialiser& o) {
+             OutSerialiserPropertyDataStream stream(o, "Tag1", 1);
+             stream.Close();
+             o.SaveType("Tag2", 1);
+         },
+         3},
+        {"value after the data stream's end",
+         [](OutSerialiser& o) {
+             OutSerialiserPropertyDataStream stream(o, "Tag1", 1);
+             stream.Close();
+             stream.SaveValue(1);
+         },
+         5},
+        {"object in a data stream",
+         [](OutSerialiser& o) { OutSerialiserPropertyDataStream(o, "Tag1", 1).SaveValueI(PropType::Object, huge, 1); },
+         5},
+        {"list closed below a child",
+         [](OutSerialiser& o) {
+             o.StartClassTestI("Tag1");
+             o.StartClassBeginI("Tag1", "Poin", 1);
+             o.Close();
+         },
+         3},
+        {"value beside a child",
+         [](OutSerialiser& o) {
+             o.StartClassTestI("Tag1");
+             o.StartClassBeginI("Tag1", "Poin", 1);
+             o.SaveType("Tag2", 1);
+         },
+         3},
+        {"value after the end",
+         [](OutSerialiser& o) {
+             o.Close();
+             o.SaveType("Tag1", 1);
+         },
+         5},
+    };
+    for (auto const& one : cases) {
+        SCOPED_TRACE(one.what);
+        EXPECT_EQ(ListCode(one.save), one.code);
+    }
+}
+
+TEST(OutSerialiserFailures, LongListRemembersEveryTag)
+{
+    for (u32 const again : {0u, 20u, 30u, 199u}) {
+        SCOPED_TRACE(again);
+        int const code = ListCode([&](OutSerialiser& out) {
+            for (u32 i = 0; i < 200; ++i) out.SaveType(IDTag(i * 0x9E3779B9u), u8{1});
+            EXPECT_FALSE(out.HasProperty(IDTag(200 * 0x9E3779B9u)));
+            out.SaveType(IDTag(again * 0x9E3779B9u), u8{1});
+        });
+        EXPECT_EQ(code, 3);
+    }
+}
+
+TEST(OutSerialiserFailures, AbandonedDataStreamDoesNotBlockTheList)
+{
+    std::string const list = SaveList([](OutSerialiser& out) {
+        {
+            OutSerialiserPropertyDataStream const stream(out, "Strm", 1);
+            EXPECT_TRUE(out.HaveChildActive());
+        }
+        out.SaveType("Next", u8{1});
+    });
+    EXPECT_EQ(Show(list), Show(Bytes("30 [Strm] 01 00 | 01 [Next] 01 | 00")));
+}
+
+// Whatever the number of bytes that the stream takes, the save fails with code 0 unless it takes them all, and what it
+// took is the beginning of the file.
+TEST(OutSerialiserFailures, ShortWriteAtAnyByteIsReported)
+{
+    std::string const block(40000, 'b');
+    auto const save = [&](OutStream& stream) {
+        OutSerialiserFile out(stream, IDTag("Test"), 1);
+        for (u32 i = 0; i < 3; ++i) {
+            out.SaveType(IDTag(3 * i), "text");
+            out.SaveClass(IDTag(3 * i + 1), Point());
+            out.SaveRawData(IDTag(3 * i + 2), block.data(), block.size() >> (4 * i));
+        }
+        out.Close();
+    };
+    auto const whole = MakeCounted<BytesOutStream>();
+    save(*whole);
+    std::string const expected = whole->m_bytes;
+    for (u64 limit = 0; limit < expected.size(); limit += limit < 200 || limit + 200 > expected.size() ? 1 : 997) {
+        auto const stream = MakeCounted<BytesOutStream>(limit);
+        ASSERT_EQ(SaveCode([&] { save(*stream); }), 0) << limit;
+        ASSERT_TRUE(expected.starts_with(stream->m_bytes)) << limit;
+    }
+}
+
+TEST(OutSerialiserFailures, NothingIsWrittenAfterAFailure)
+{
+    auto const stream = MakeCounted<BytesOutStream>(u64{20});
+    {
+        OutSerialiserFile out(*stream, IDTag("Test"), 1);
+        std::string const block(20000, 'b');
+        EXPECT_EQ(SaveCode([&] { out.SaveRawData("Tag1", block.data(), block.size()); }), 0);
+        stream->m_limit = 1000000;
+        EXPECT_EQ(SaveCode([&] { out.SaveType("Tag2", 1); }), 0);
+        EXPECT_EQ(SaveCode([&] { out.Close(); }), 0);
+    }
+    EXPECT_EQ(stream->m_bytes.size(), 20u);
+}
+
+/// A store that notes what a save asks of it.
+class NotingStoreOut : public FileStoreOut
+{
+public:
+    explicit NotingStoreOut(Purpose purpose, bool const* abort = nullptr) : FileStoreOut(purpose, abort) {}
+    using FileStoreOut::CreateFile;
+    void CreateFile(Counted<DelayLoadHolder> holder, Counted<FileStoreCompressionHint> const&) override
+    {
+        m_files.push_back(holder);
+    }
+    void CreateFile(String8 const&, Counted<FileStoreItem const> const&,
+                    Counted<FileStoreCompressionHint> const&) override
+    {
+    }
+    void DeleteFile(String8 const&) override {}
+    void AddObjectToClean(Counted<FileStoreStateObject>) override {}
+    void AddPostSaveObject(Counted<FileStorePostSaveInterface>) override {}
+    bool GenerateIndexedPath(IndexedPathParts const&, NonCounted<FileStoreItem const>,
+                             NonCounted<DelayLoadHolder const>, String8&) override
+    {
+        return false;
+    }
+    void AssignDelayLoadHolderPath(Counted<DelayLoadHolder> holder, String8 const& path) override
+    {
+        m_assigned.emplace_back(holder, path);
+    }
+    FileStore& GetFileStore() const override { return VoidFileStore::GetInstance(); }
+
+    std::vector<Counted<DelayLoadHolder>> m_files;
+    std::vector<std::pair<Counted<DelayLoadHolder>, String8>> m_assigned;
+};
+
+class Generator : public FileStoreOutPathGenerator
+{
+public:
+    explicit Generator(char const* path) : m_path(path) {}
+    bool GeneratePath(NonCounted<FileStoreItem const> item, NonCounted<DelayLoadHolder const>, String8& path) override
+    {
+        m_sawItem = static_cast<bool>(item);
+        if (m_path) path = m_path;
+        return m_path != nullptr;
+    }
+    char const* m_path;
+    bool m_sawItem = false;
+};
+
+class Picture : public FileStoreItem
+{
+public:
+    static FileStoreItemType const s_type;
+    void Save(OutStream&, FileStoreOut&) const override {}
+    bool Load(InStream&, FileStore&) override { return true; }
+    FileStoreItemType const* GetObjectFileStoreItemType() const override { return &s_type; }
+
+protected:
+    ~Picture() override = default;
+};
+FileStoreItemType const Picture::s_type("Pict", nullptr, FileStoreItemType::NotNestable,
+                                        FileStoreItemType::NotRecoverable);
+
+TEST(OutSerialiserFailures, AbortEndsTheSaveAtTheNextProperty)
+{
+    bool abort = false;
+    NotingStoreOut store(FileStoreOut::PurposeSave, &abort);
+    auto const stream = MakeCounted<BytesOutStream>();
+    OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
+    OutSerialiserPropertyDataStream values(out, "Strm", 1);
+    abort = true;
+    values.SaveValue(1);
+    values.Close();
+    // A size that can't be is told before the abort.
+    EXPECT_EQ(SaveCode([&] { out.SaveRawStructI("Tag1", nullptr, 65); }), 2);
+    EXPECT_FALSE(store.WasAborted());
+    EXPECT_THROW(out.SaveType("Tag1", 1), AbortException);
+    EXPECT_TRUE(store.WasAborted());
+    EXPECT_FALSE(out.HasProperty("Tag1"));
+}
+
+TEST(OutSerialiserFailures, DelayLoadReferenceNamesTheItemAndQueuesIt)
+{
+    NotingStoreOut store(FileStoreOut::PurposeSave);
+    auto const stream = MakeCounted<BytesOutStream>();
+    auto const picture = MakeCounted<Picture>();
+    auto const holder = DelayLoadHolder::Create(&Picture::s_type, picture);
+    Generator generator("pic/1");
+    OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
+    out.SaveDelayLoadObject("Pic1", holder, generator, nullptr);
+    EXPECT_TRUE(generator.m_sawItem);
+    out.SaveDelayLoadObject("Pic2", nullptr, generator, nullptr);
+    out.Close();
+    EXPECT_EQ(Show(stream->m_bytes.substr(16)),
+              Show(Bytes("33 [Pic1] [Pict] 05 00 00 00 'pic/1' | 33 [Pic2] 00 00 00 00 00 00 00 00 | 00")));
+    EXPECT_EQ(store.m_files, (std::vector<Counted<DelayLoadHolder>>{holder}));
+    ASSERT_EQ(store.m_assigned.size(), 1u);
+    EXPECT_EQ(store.m_assigned[0].second, "pic/1");
+
+    Generator refusing(nullptr);
+    EXPECT_EQ(ListCode([&](OutSerialiser& o) { o.SaveDelayLoadObject("Pic1", holder, refusing, nullptr); }), 6);
+}
+
+class Album : public Serialisable
+{
+public:
+    static ClassProperties const ms_ClassProperties;
+    void Save(OutSerialiser& out) const override
+    {
+        ++m_saves;
+        out.SaveType("Tag1", 1);
+        out.SaveType("Tag1", 1); // Values do nothing on a pass that enumerates, so this is not seen.
+        out.SaveObject("Self", this, false);
+        OutSerialiserPropertyDataStream values(out, "Strm", 1);
+        values.SaveValue(1);
+        values.Close();
+    }
+    bool Load(InSerialiser const&, FileStore&, unsigned short) override { return false; }
+    ClassProperties const* GetObjectClassProperties() const override { return &ms_ClassProperties; }
+    mutable int m_saves = 0;
+
+protected:
+    ~Album() override = default;
+};
+ClassProperties const Album::ms_ClassProperties("Albm", static_cast<ClassProperties::CreateFunc>(nullptr), 1, nullptr,
+                                                nullptr);
+
+struct Page
+{
+    static ClassUID GetClassUID() { return "Page"; }
+    static unsigned short GetSchemaVersion() { return 1; }
+    void Save(OutSerialiser& out) const
+    {
+        Generator generator("pic/1");
+        out.SaveDelayLoadObject("Pict", holder, generator, nullptr);
+        out.SaveDelayLoadObject("None", nullptr, generator, nullptr);
+    }
+    Counted<DelayLoadHolder> holder;
+};
+
+TEST(OutSerialiserFailures, EnumeratingPassWalksTheStructureAndWritesNothing)
+{
+    auto const picture = MakeCounted<Picture>();
+    auto const holder = DelayLoadHolder::Create(&Picture::s_type, picture);
+    for (auto const purpose : {FileStoreOut::PurposeEnumeratePaths, FileStoreOut::PurposeEnumerateHolders}) {
+        SCOPED_TRACE(static_cast<u32>(purpose));
+        NotingStoreOut store(purpose);
+        auto const stream = MakeCounted<BytesOutStream>(u64{0});
+        auto const album = MakeCounted<Album>();
+        OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
+        EXPECT_FALSE(out.IsFullSave());
+        out.SaveObjects("Albm", std::vector<Counted<Album>>{album, album, nullptr});
+        out.SaveClasses("Page", std::vector<Page>{{holder}});
+        out.Close();
+        EXPECT_EQ(stream->m_writes, 0);
+        EXPECT_EQ(album->m_saves, 1);
+        EXPECT_EQ(store.m_files, (std::vector<Counted<DelayLoadHolder>>{holder}));
+        bool const wantsPaths = purpose == FileStoreOut::PurposeEnumeratePaths;
+        EXPECT_EQ(store.m_assigned.size(), wantsPaths ? 1u : 0u);
+    }
+}
+
+} // namespace
+} // namespace KernelTest

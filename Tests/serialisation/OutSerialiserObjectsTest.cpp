@@ -1,0 +1,335 @@
+#include "libkernel/core/Hash.h"
+#include "libkernel/serialisation/CompareContext.h"
+#include "serialisation/WriterTestSupport.h"
+
+namespace KernelTest {
+namespace {
+
+/// An object whose properties and description the test gives.
+class Thing : public Serialisable
+{
+public:
+    explicit Thing(ClassProperties const* description, SaveFunction save = {})
+        : m_description(description), m_save(std::move(save))
+    {
+    }
+    void Save(OutSerialiser& out) const override
+    {
+        if (m_save) m_save(out);
+    }
+    bool Load(InSerialiser const&, FileStore&, unsigned short) override { return false; }
+    ClassProperties const* GetObjectClassProperties() const override { return m_description; }
+
+    ClassProperties const* m_description;
+    SaveFunction m_save;
+
+protected:
+    ~Thing() override = default;
+};
+
+class SharedThing : public SharedSerialisable
+{
+public:
+    SharedThing(SharedClassProperties const* description, u8 value, SaveFunction save = {})
+        : m_description(description), m_value(value), m_save(std::move(save))
+    {
+    }
+    void Save(OutSerialiser& out) const override
+    {
+        out.SaveType("Valu", m_value);
+        if (m_save) m_save(out);
+    }
+    bool Load(InSerialiser const&, FileStore&, unsigned short) override { return false; }
+    void AccumulateHash(HashAccumulator& hash) const override { hash.AddToHash(&m_value, 1); }
+    SharedClassProperties const* GetObjectClassProperties() const override { return m_description; }
+    bool CompareMembers(SharedSerialisable const& other, CompareContext const&) const override
+    {
+        return m_value == static_cast<SharedThing const&>(other).m_value;
+    }
+
+    SharedClassProperties const* m_description;
+    u8 m_value;
+    SaveFunction m_save;
+
+protected:
+    ~SharedThing() override = default;
+};
+
+Consolidated<SharedSerialisable> MakeShared(SharedClassProperties const& description, u8 value, SaveFunction save = {})
+{
+    return description.ConsolidateObjectSacrifice(MakeCounted<SharedThing>(&description, value, std::move(save)));
+}
+
+ClassProperties MakeClass(ClassUID uid, std::vector<Defaults::Item> const& defaults = {Defaults::Item()},
+                          ClassPropertiesBase const* parent = nullptr)
+{
+    return ClassProperties(uid, static_cast<ClassProperties::CreateFunc>(nullptr), 2, defaults.data(), parent);
+}
+
+SharedClassProperties const& SharedClass()
+{
+    static SharedClassProperties const description("Shar", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1,
+                                                   nullptr, nullptr);
+    return description;
+}
+
+TEST(OutSerialiserObjects, FirstAppearanceDescribesTheClassAndItsParents)
+{
+    auto const rootDefaults = Defaults::Make(Defaults::Value("Size", u16{7}));
+    ClassProperties const root = MakeClass("Root", rootDefaults);
+    ClassProperties const middle = MakeClass("Midd", {Defaults::Item()}, &root);
+    auto const leafDefaults = Defaults::Make(Defaults::Bool("Bold", true));
+    ClassProperties const leaf = MakeClass("Leaf", leafDefaults, &middle);
+    auto const object = MakeCounted<Thing>(&leaf, [](OutSerialiser& out) { out.SaveType("Kind", u8{1}); });
+    auto const sibling = MakeCounted<Thing>(&middle);
+    std::string const list = SaveList([&](OutSerialiser& out) {
+        out.SaveObject("Obj1", object);
+        out.SaveObject("Obj2", sibling, false);
+        out.SaveObject("Obj3", object);
+    });
+    EXPECT_EQ(Show(list),
+              Show(Bytes("31 [Obj1] 01 00 00 00 00 | 00 [Leaf] 02 00 | 29 [Bold] 01 | 00"
+                         "| 00 [Midd] 02 00 00 | 00 [Root] 02 00 | 02 [Size] 07 00 | 00 | 02 | 01 [Kind] 01 | 00"
+                         "| 31 [Obj2] 01 01 00 00 00 | 01 [Midd] | 00"
+                         "| 31 [Obj3] 02 00 00 00 00 | 00")));
+}
+
+TEST(OutSerialiserObjects, ArraysHoldRecordsAndShareTheIndices)
+{
+    ClassProperties const description = MakeClass("Thng");
+    auto const plain = MakeCounted<Thing>(&description);
+    auto const shared = MakeShared(SharedClass(), 5);
+    std::string const list = SaveList([&](OutSerialiser& out) {
+        out.SaveObjects("Plai", std::vector<Counted<Thing>>{plain, nullptr, plain});
+        out.SaveSharedObjects("Shar", std::vector<Consolidated<SharedSerialisable>>{shared, {}});
+        out.SaveSharedObject("Agai", shared);
+        out.SaveObjects("None", std::vector<Thing*>());
+    });
+    EXPECT_EQ(Show(list),
+              Show(Bytes("B1 [Plai] 03 00 00 00 | 01 00 00 00 00 00 [Thng] 02 00 00 02 00 | 00 | 02 00 00 00 00"
+                         "| B1 [Shar] 02 00 00 00 | 01 01 00 00 00 00 [Shar] 01 00 00 02 01 [Valu] 05 00 | 00"
+                         "| 31 [Agai] 02 01 00 00 00 | B1 [None] 00 00 00 00 | 00")));
+}
+
+TEST(OutSerialiserObjects, PlainObjectMayHoldItself)
+{
+    ClassProperties const description = MakeClass("Thng");
+    auto const object = MakeCounted<Thing>(&description);
+    object->m_save = [&](OutSerialiser& out) { out.SaveObject("Self", object.Get(), false); };
+    std::string const list = SaveList([&](OutSerialiser& out) { out.SaveObject("Item", object); });
+    EXPECT_EQ(Show(list), Show(Bytes("31 [Item] 01 00 00 00 00 | 00 [Thng] 02 00 00 02 | 31 [Self] 02 00 00 00 00 | 00"
+                                     "| 00")));
+}
+
+EnumSerialiser MakeEnums()
+{
+    EnumSerialiser enums;
+    enums.RegisterEnumSet({{4}, {9}});
+    return enums;
+}
+
+FlagSerialiser MakeFlags()
+{
+    FlagSerialiser flags;
+    flags.RegisterFlagIndices({{8}, {0}});
+    return flags;
+}
+
+// Every kind of default, its item in a description, and a save of an equal value.
+TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
+{
+    EnumSerialiser const enums = MakeEnums();
+    FlagSerialiser const flags = MakeFlags();
+    auto const shared = MakeShared(SharedClass(), 5);
+    u32 const custom = 0x01020304;
+    auto const defaults = Defaults::Make(
+        Defaults::Value("A000", 3), Defaults::Values("A001", std::vector<u16>{1, 2}), Defaults::Text("A002", "ab"),
+        Defaults::Custom("A004", custom), Defaults::Customs("A005", std::vector<u32>{custom}),
+        Defaults::EnumValue("A006", 9, enums), Defaults::EnumValues("A007", std::vector<int>{9, 4}, enums),
+        Defaults::Flags("A008", u16{0x100}, flags), Defaults::Object("A009", shared),
+        Defaults::Objects("A010", {shared, {}}), Defaults::Bools("A011", {true, false, true}),
+        Defaults::Value("A012", ClassUID("Font")));
+    ClassProperties const description = MakeClass("Thng", defaults);
+    auto const equal = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
+        out.SaveType("A000", 3);
+        out.SaveTypes("A001", std::vector<u16>{1, 2});
+        out.SaveType("A002", String16(u"ab"));
+        out.SavePropertyStruct("A004", custom);
+        out.SavePropertyStructs("A005", std::vector<u32>{custom});
+        out.SaveEnum("A006", enums, 9);
+        out.SaveEnums("A007", enums, std::vector<int>{9, 4});
+        out.SaveFlagSet("A008", flags, u16{0x100});
+        out.SaveSharedObject("A009", shared);
+        out.SaveSharedObjects("A010", std::vector<Consolidated<SharedSerialisable>>{shared, {}});
+        out.SaveTypes("A011", std::deque<bool>{true, false, true});
+        out.SaveType("A012", ClassUID("Font"));
+        EXPECT_TRUE(out.HasProperty("A000"));
+    });
+    auto const other = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
+        out.SaveType("A000", 4);
+        out.SaveType("A001", 3);             // Another kind.
+        out.SaveType("A012", IDTag("Font")); // Another type of the same size.
+        out.SaveTypes("A011", std::vector<bool>{true, false});
+        out.SaveSharedObject("A009", nullptr);
+    });
+    std::string const list = SaveList([&](OutSerialiser& out) {
+        out.SaveObject("Equa", equal);
+        out.SaveObject("Othe", other);
+    });
+    EXPECT_EQ(
+        Show(list),
+        Show(Bytes(
+            "31 [Equa] 01 00 00 00 00 | 00 [Thng] 02 00 | 07 [A000] 03 00 00 00"
+            "| 82 [A001] 02 00 00 00 01 00 02 00 | 2B [A002] 02 00 00 00 'ab' | 2C [A004] 04 00 04 03 02 01"
+            "| AC [A005] 01 00 00 00 04 00 04 03 02 01 | 2A [A006] 01 00 00 00"
+            "| AA [A007] 02 00 00 00 00 00 01 00 00 00 | 75 [A008] 00 00 01 01"
+            "| 31 [A009] 01 01 00 00 00 00 [Shar] 01 00 00 02 01 [Valu] 05 00"
+            "| B1 [A010] 02 00 00 00 02 01 00 00 00 00 | A9 [A011] 03 00 00 00 05 | 34 [A012] 'tnoF' | 00 | 02 | 00"
+            "| 31 [Othe] 01 02 00 00 00 | 01 [Thng] | 07 [A000] 04 00 00 00 | 07 [A001] 03 00 00 00"
+            "| 2F [A012] 'tnoF' | A9 [A011] 02 00 00 00 01 | 31 [A009] 00 | 00 | 00")));
+}
+
+TEST(OutSerialiserObjects, DefaultsOfParentsAreAskedToo)
+{
+    auto const rootDefaults = Defaults::Make(Defaults::Value("Size", u8{7}), Defaults::Value("Only", u8{1}));
+    ClassProperties const root = MakeClass("Root", rootDefaults);
+    std::vector<Defaults::Item> leafDefaults = {Defaults::Value("Size", u8{8})};
+    for (u32 i = 0; i < 20; ++i) leafDefaults.push_back(Defaults::Value(IDTag(i * 0x1000000 + 1), u8{1}));
+    leafDefaults.push_back(nullptr);
+    ClassProperties const leaf = MakeClass("Leaf", leafDefaults, &root);
+    auto const save = [](u8 size, u8 only) {
+        return [=](OutSerialiser& out) {
+            out.SaveType("Size", size);
+            out.SaveType("Only", only);
+            for (u32 i = 0; i < 20; ++i) out.SaveType(IDTag(i * 0x1000000 + 1), u8{1});
+        };
+    };
+    auto const first = MakeCounted<Thing>(&leaf);
+    auto const list = [&](SaveFunction const& function) {
+        auto const object = MakeCounted<Thing>(&leaf, function);
+        std::string const saved = SaveList([&](OutSerialiser& out) {
+            out.SaveObject("Frst", first);
+            out.SaveObject("Item", object);
+        });
+        return Show(saved.substr(saved.find(Bytes("31 [Item]")) + 15));
+    };
+    EXPECT_EQ(list(save(8, 1)), Show(Bytes("00 00")));
+    EXPECT_EQ(list(save(7, 1)), Show(Bytes("00 00")));
+    EXPECT_EQ(list(save(9, 2)), Show(Bytes("01 [Size] 09 | 01 [Only] 02 | 00 00")));
+}
+
+TEST(OutSerialiserObjects, RawAndPlainValuesAreNeverLeftOut)
+{
+    u32 const value = 1;
+    auto const defaults = Defaults::Make(Defaults::Value("Valu", value), Defaults::Custom("Cust", value));
+    ClassProperties const description = MakeClass("Thng", defaults);
+    auto const object = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
+        out.SaveRawStruct("Valu", value);
+        out.SaveRawData("Cust", &value, 4);
+    });
+    std::string const list = SaveList([&](OutSerialiser& out) { out.SaveObject("Item", object); });
+    EXPECT_NE(list.find(Bytes("38 [Valu] 01 00 00 00 | 2D [Cust] 04 00 00 00 01 00 00 00 | 00 00")), std::string::npos);
+}
+
+TEST(OutSerialiserObjects, SharedObjectThatReachesItselfIsRefused)
+{
+    SharedClassProperties const description("Cycl", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1, nullptr,
+                                            nullptr);
+    Consolidated<SharedSerialisable> object;
+    object = MakeShared(description, 1, [&](OutSerialiser& out) { out.SaveSharedObject("Self", object); });
+    EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveSharedObject("Item", object); }), 5);
+    object = {};
+    description.Sweep(true);
+}
+
+TEST(OutSerialiserObjects, DefaultObjectOfTheClassBeingDescribedIsRefused)
+{
+    auto const value = MakeShared(SharedClass(), 9);
+    ClassProperties const outer = MakeClass("Outr", Defaults::Make(Defaults::Object("Defa", value)));
+    // The default's class has the same object among its own defaults.
+    auto const defaults = Defaults::Make(Defaults::Object("Self", value));
+    SharedClassProperties const cyclic("Cycl", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1,
+                                       defaults.data(), nullptr);
+    auto const user = cyclic.ConsolidateObjectSacrifice(MakeCounted<SharedThing>(&cyclic, u8{1}));
+    static_cast<SharedThing*>(value.Get())->m_description = &cyclic;
+    EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveSharedObject("Item", user); }), 5);
+    EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveObject("Item", MakeCounted<Thing>(&outer)); }), 5);
+    static_cast<SharedThing*>(value.Get())->m_description = &SharedClass();
+}
+
+TEST(OutSerialiserObjects, ClassThatCannotBeDescribedIsRefused)
+{
+    class UnknownDefault : public Defaults::DefaultBase
+    {
+    public:
+        UnknownDefault() : DefaultBase("Unkn") {}
+        Defaults::DefaultItemType GetDefaultType() const override { return static_cast<Defaults::DefaultItemType>(11); }
+
+    protected:
+        ~UnknownDefault() override = default;
+    };
+    ClassProperties const texts = MakeClass("Text", Defaults::Make(Defaults::Texts("Txts", {"a"})));
+    std::vector<Defaults::Item> const unknownDefaults = {MakeCounted<UnknownDefault>(), nullptr};
+    ClassProperties const unknown = MakeClass("Unkn", unknownDefaults);
+    for (ClassProperties const* const description : {static_cast<ClassProperties const*>(nullptr), &texts, &unknown})
+        EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveObject("Item", MakeCounted<Thing>(description)); }), 5);
+}
+
+struct Nest
+{
+    static ClassUID GetClassUID() { return "Nest"; }
+    static unsigned short GetSchemaVersion() { return 1; }
+    void Save(OutSerialiser& out) const
+    {
+        if (levels > 1) out.SaveClass("Nest", Nest{levels - 1});
+    }
+    int levels;
+};
+
+TEST(OutSerialiserObjects, NestingIsLimited)
+{
+    EXPECT_EQ(ListCode([](OutSerialiser& out) { out.SaveClass("Nest", Nest{1024}); }), -1);
+    EXPECT_EQ(ListCode([](OutSerialiser& out) { out.SaveClass("Nest", Nest{1025}); }), 5);
+
+    ClassProperties const description = MakeClass("Thng");
+    Counted<Thing> chain;
+    for (int i = 0; i < 1100; ++i)
+        chain = MakeCounted<Thing>(&description, [next = chain](OutSerialiser& out) { out.SaveObject("Next", next); });
+    EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveObject("Item", chain); }), 5);
+    // The levels of the failed save are given back.
+    EXPECT_EQ(ListCode([](OutSerialiser& out) { out.SaveClass("Nest", Nest{1024}); }), -1);
+}
+
+TEST(OutSerialiserObjects, ManyObjectsKeepTheirIndices)
+{
+    ClassProperties const description = MakeClass("Thng");
+    std::vector<Counted<Thing>> objects;
+    for (int i = 0; i < 5000; ++i) objects.push_back(MakeCounted<Thing>(&description));
+    std::string const list = SaveList([&](OutSerialiser& out) {
+        out.SaveObjects("Frst", objects);
+        out.SaveObjects("Scnd", objects);
+    });
+    std::string expected = Bytes("B1 [Scnd] 88 13 00 00");
+    for (u32 i = 0; i < 5000; ++i) expected += '\x02' + std::string(reinterpret_cast<char const*>(&i), 4);
+    EXPECT_TRUE(list.ends_with(expected + '\0'));
+}
+
+TEST(OutSerialiserObjects, ProlongedObjectOutlivesItsOwner)
+{
+    ClassProperties const description = MakeClass("Thng");
+    auto const stream = MakeCounted<BytesOutStream>();
+    Thing* kept = nullptr;
+    {
+        OutSerialiserFile out(*stream, IDTag("Test"), 1);
+        {
+            auto const object = MakeCounted<Thing>(&description);
+            kept = object.Get();
+            out.AddProlongedObject(object);
+        }
+        EXPECT_EQ(kept->GetReferenceCount(), 1);
+        out.Close();
+    }
+}
+
+} // namespace
+} // namespace KernelTest

@@ -1,0 +1,102 @@
+#pragma once
+
+#include "libkernel/serialisation/ClassProperties.h"
+#include "libkernel/serialisation/OutSerialiserFile.h"
+#include "libkernel/streams/OutStream.h"
+
+#include <functional>
+#include <gtest/gtest.h>
+#include <limits>
+#include <string>
+#include <string_view>
+
+namespace KernelTest {
+
+using namespace Kernel;
+
+/// Keeps what it is given, up to a limit of bytes; then its writes come up short.
+class BytesOutStream : public OutStream
+{
+public:
+    explicit BytesOutStream(u64 limit = std::numeric_limits<u64>::max()) : m_limit(limit) {}
+    ~BytesOutStream() override = default;
+    u64 WriteBlock(void const* from, u64 count) override
+    {
+        ++m_writes;
+        u64 const taken = std::min<u64>(count, m_limit - m_bytes.size());
+        m_bytes.append(static_cast<char const*>(from), taken);
+        return taken;
+    }
+    u64 GetSizeOutStream() const override { return m_bytes.size(); }
+    u64 TellOutStream() const override { return m_bytes.size(); }
+
+    std::string m_bytes;
+    u64 m_limit;
+    int m_writes = 0;
+};
+
+/// Bytes from a text: pairs of hexadecimal digits; 'text' as it stands; [Abcd] a tag, which is stored reversed. Spaces
+/// and bars separate.
+inline std::string Bytes(std::string_view text)
+{
+    auto const digit = [](char c) { return c <= '9' ? c - '0' : (c | 0x20) - 'a' + 10; };
+    std::string result;
+    for (size_t i = 0; i < text.size(); ++i) {
+        char const c = text[i];
+        if (c == ' ' || c == '|' || c == '\n') continue;
+        if (c == '[') {
+            for (size_t k = 4; k > 0; --k) result += text[i + k];
+            i += 5;
+        } else if (c == '\'') {
+            for (++i; text[i] != '\''; ++i) result += text[i];
+        } else {
+            result += static_cast<char>(digit(c) << 4 | digit(text[i + 1]));
+            ++i;
+        }
+    }
+    return result;
+}
+
+/// Bytes in the same notation, so that a failure can be read.
+inline std::string Show(std::string_view bytes)
+{
+    static char const digits[] = "0123456789ABCDEF";
+    std::string result;
+    for (char const c : bytes) {
+        u8 const byte = static_cast<u8>(c);
+        result += digits[byte >> 4];
+        result += digits[byte & 15];
+        result += ' ';
+    }
+    return result;
+}
+
+using SaveFunction = std::function<void(OutSerialiser&)>;
+
+/// The root list that @p save makes, with its closing 0 and without the file header.
+inline std::string SaveList(SaveFunction const& save)
+{
+    auto const stream = MakeCounted<BytesOutStream>();
+    OutSerialiserFile out(*stream, IDTag("Test"), 1);
+    save(out);
+    out.Close();
+    return stream->m_bytes.substr(16);
+}
+
+/// The code of the SaveException that @p save throws; -1 if there was none.
+inline int SaveCode(std::function<void()> const& save)
+{
+    try {
+        save();
+    } catch (OutSerialiser::SaveException const& failure) {
+        return failure.GetCode();
+    }
+    return -1;
+}
+
+inline int ListCode(SaveFunction const& save)
+{
+    return SaveCode([&] { SaveList(save); });
+}
+
+} // namespace KernelTest
