@@ -7,9 +7,11 @@
 #include "support/FakeClock.h"
 
 #include <atomic>
+#include <cstdlib>
 #include <gtest/gtest.h>
 #include <mutex>
 #include <set>
+#include <string>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -68,11 +70,28 @@ private:
     int m_value = 0;
 };
 
-// Scopes stay for the rest of the process, so the tests that want one share it.
-void RegisterScope()
+thread_local std::string t_marks;
+
+// Leaves marks on the thread that it begins and ends on.
+class MarkingScope : public Dispatch::Scope
+{
+public:
+    explicit MarkingScope(char mark) : m_mark(mark) {}
+    Counted<Scope> Clone() override { return MakeCounted<MarkingScope>(m_mark); }
+    void Begin() override { t_marks += m_mark; }
+    void End() override { t_marks += static_cast<char>(m_mark - 'a' + 'A'); }
+
+private:
+    char const m_mark;
+};
+
+// Scopes stay for the rest of the process, so the tests that want some share them.
+void RegisterScopes()
 {
     static bool const once = [] {
         Dispatch::AddScope(MakeCounted<CarryingScope>());
+        Dispatch::AddScope(MakeCounted<MarkingScope>('a'));
+        Dispatch::AddScope(MakeCounted<MarkingScope>('b'));
         return true;
     }();
     (void)once;
@@ -231,7 +250,7 @@ TEST(Dispatch, ListRunsEachElement)
 
 TEST(DispatchScope, JobSeesWhatWasCapturedWhenItWasGiven)
 {
-    RegisterScope();
+    RegisterScopes();
     Countdown countdown(1);
     int seen = 0;
     int inScope = 0;
@@ -254,7 +273,7 @@ TEST(DispatchScope, JobSeesWhatWasCapturedWhenItWasGiven)
 
 TEST(DispatchScope, LoopBeginsAndEndsAroundEveryIndex)
 {
-    RegisterScope();
+    RegisterScopes();
     for (u64 const count : {u64{0}, u64{1}, u64{500}}) {
         s_counts.Reset();
         std::atomic<int> outside{0};
@@ -267,6 +286,14 @@ TEST(DispatchScope, LoopBeginsAndEndsAroundEveryIndex)
         EXPECT_EQ(1, s_counts.alive) << "the clone is released with the loop";
     }
     EXPECT_EQ(0, t_inScope);
+}
+
+TEST(DispatchScope, ScopesBeginAndEndInTheOrderOfRegistration)
+{
+    RegisterScopes();
+    t_marks.clear();
+    Dispatch::DispatchParallelFor([&](u64) { t_marks += '-'; }, 1); // A single index runs on this thread here.
+    EXPECT_EQ("ab-AB", t_marks);
 }
 
 void (*s_sunkFunction)(void*) = nullptr;
@@ -331,6 +358,19 @@ TEST(Dispatch, ChildProcessHasWorkersOfItsOwn)
     int status = 1;
     ASSERT_EQ(child, ::waitpid(child, &status, 0));
     EXPECT_EQ(0, status);
+}
+
+TEST(DispatchDeathTest, ProcessEndsWhileJobsRunAndWait)
+{
+    EXPECT_EXIT(
+        {
+            ::alarm(30);
+            auto const gate = MakeCounted<MultiSemaphore>();
+            Counted<MultiSemaphore>& never = *new Counted<MultiSemaphore>(gate);
+            for (int i = 0; i < 1000; ++i) Dispatch::DispatchAndForget([&] { never->Wait(0); });
+            std::exit(0);
+        },
+        testing::ExitedWithCode(0), "");
 }
 
 TEST(DispatchDeathTest, ThrowingJobEndsTheProcess)

@@ -1,19 +1,8 @@
 #include "libkernel/concurrency/Notification.h"
 
-#include "libkernel/core/DemangleTypeName.h"
-
 #include <gtest/gtest.h>
-#include <typeinfo>
 
 namespace TestNames {
-
-template <class T>
-struct Holder
-{
-    struct Inner
-    {
-    };
-};
 
 class DiskFull : public Kernel::Notification
 {
@@ -75,29 +64,6 @@ TEST(Broadcaster, NotificationsGoToTheSink)
     EXPECT_EQ(full, full->Merge(Counted<Notification>(new TestNames::DiskFull)));
     EXPECT_EQ("DiskFull", full->GetDescription());
     s_last.Reset();
-}
-
-TEST(DemangleTypeName, NamesAreForDisplay)
-{
-    using Nested = TestNames::Holder<TestNames::DiskFull>;
-    struct Case
-    {
-        char const* name;
-        char const* shown;
-        char const* full;
-    };
-    for (Case const& c :
-         {Case{typeid(int).name(), "int", "int"},
-          {typeid(TestNames::DiskFull).name(), "DiskFull", "TestNames::DiskFull"},
-          {typeid(Nested).name(), "Holder<TestNames::DiskFull>", "TestNames::Holder<TestNames::DiskFull>"},
-          {typeid(Nested::Inner).name(), "Inner", "TestNames::Holder<TestNames::DiskFull>::Inner"},
-          {"not mangled!", "not mangled!", "not mangled!"},
-          {"", "", ""}})
-    {
-        EXPECT_EQ(c.shown, DemangleTypeName(c.name, false)) << c.name;
-        EXPECT_EQ(c.full, DemangleTypeName(c.name, true)) << c.name;
-    }
-    EXPECT_EQ("", DemangleTypeName(nullptr, true));
 }
 
 } // namespace

@@ -148,8 +148,8 @@ struct FileCalls
     int (*readLink)(char const* path, std::string& target);
     /// The entries of a folder, in the file system's order, without "." and "..".
     int (*listFolder)(char const* path, std::vector<FolderEntry>& entries);
-    /// Brings the names in a folder to the device: what was made, renamed or removed there lasts. A file system that
-    /// can't flush a folder answers 0.
+    /// Brings the names in a folder to the device: what was made, renamed or removed there lasts. Where that can't be
+    /// done, because the file system can't or because the process may not read the folder, the answer is 0 as well.
     int (*flushFolder)(char const* path);
 
     /// Nanoseconds since 1970-01-01 UTC; c_keepTime leaves one as it is.
