@@ -223,7 +223,7 @@ TEST(ZStandardDecompressExactTest, GivesWhatTheStreamGives)
             packed.push_back(0xFF); // What lies behind the data does not matter.
             EXPECT_EQ(unpack(plain.size()), plain);
             EXPECT_EQ(unpack(65536), Bytes(plain.begin(), plain.begin() + 65536));
-            packed.resize(packed.size() - 10);
+            packed.erase(packed.end() - 10, packed.end());
             EXPECT_TRUE(unpack(plain.size()).empty());
         }
     u8 byte;
