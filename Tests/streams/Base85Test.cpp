@@ -41,10 +41,10 @@ TEST(Base85Test, LinesEndBehindTheGroupThatReachesColumn75)
     EXPECT_EQ(Encode(plain, Base85LineModeLF), line + "\n" + line + "\n9jqo^");
     EXPECT_EQ(Encode(plain, Base85LineModeNone), line + line + "9jqo^");
 
-    // Four groups of zeros bring the column to 74, so the group behind them ends at 79.
+    // Four groups of zeros let 14 more bring the column to 74, so the next group ends at 79; then 0 again.
     std::string longLine = "zzzz";
     for (int i = 0; i < 15; ++i) longLine += "9jqo^";
-    EXPECT_EQ(Encode(std::string(16, '\0') + plain.substr(0, 64), Base85LineModeLF), longLine + "\n9jqo^");
+    EXPECT_EQ(Encode(std::string(16, '\0') + plain, Base85LineModeLF), longLine + "\n" + line + "\n9jqo^");
     // A tail can end a line too.
     EXPECT_EQ(Encode(std::string(16, '\0') + plain.substr(0, 56) + "s", Base85LineModeLF),
               longLine.substr(0, 74) + "Er\n");
