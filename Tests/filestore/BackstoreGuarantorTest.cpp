@@ -1,0 +1,103 @@
+#include "libkernel/filestore/BackstoreGuarantor.h"
+
+#include "libkernel/filestore/BackstoreException.h"
+#include "support/MemoryFileStore.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace KernelTest;
+
+class BackstoreGuarantorTest : public testing::Test
+{
+protected:
+    /// An item in memory that names the holders.
+    static Counted<MemoryItem> Root(std::vector<Counted<DelayLoadHolder>> parts)
+    {
+        Counted<MemoryItem> const root(new MemoryItem("root"));
+        root->parts = std::move(parts);
+        return root;
+    }
+    Counted<DelayLoadHolder> Stored(char const* path, char const* bytes)
+    {
+        a->Put(path, bytes);
+        return a->Hold(path);
+    }
+
+    Counted<MemoryFileStore> a = MemoryFileStore::Create();
+};
+
+TEST_F(BackstoreGuarantorTest, NamedItemsSurviveTheStore)
+{
+    Counted<DelayLoadHolder> const x = Stored("x", "X");
+    Counted<MemoryItem> const root = Root({x, x, nullptr, Stored("y", "Y")});
+    EXPECT_TRUE(BackstoreGuarantor::Process(root));
+    EXPECT_EQ(2, a->copies) << "each holder once";
+    EXPECT_EQ(0, a->loads) << "copied, not loaded";
+    a->diesSuddenly = true;
+    a.Reset();
+    EXPECT_EQ("X", TextOf(root->parts[0]));
+    EXPECT_EQ("Y", TextOf(root->parts[3]));
+    EXPECT_TRUE(BackstoreGuarantor::Process(Counted<FileStoreItem const>()));
+}
+
+TEST_F(BackstoreGuarantorTest, NestedItemsAreLoadedAndTheirPartsBacked)
+{
+    a->Put("x", "X");
+    a->Put("nest/inner", "I\nx\nnest/outer");
+    Counted<DelayLoadHolder> const outer = Stored("nest/outer", "O\nnest/inner");
+    Counted<MemoryItem> const root = Root({outer});
+    EXPECT_TRUE(BackstoreGuarantor::Process(root)) << "items that contain each other end";
+    a->diesSuddenly = true;
+    a.Reset();
+    auto const partOf = [](Counted<DelayLoadHolder> const& holder) {
+        return CountedCast<MemoryItem>(holder->GetItemBaseIfLoaded().GetCounted())->parts[0];
+    };
+    EXPECT_EQ("O", TextOf(outer));
+    EXPECT_EQ("I", TextOf(partOf(outer)));
+    EXPECT_EQ("X", TextOf(partOf(partOf(outer))));
+    CountedCast<MemoryItem>(outer->GetItemBaseIfLoaded().GetCounted())->parts.clear();
+}
+
+TEST_F(BackstoreGuarantorTest, WhatCannotBeHadFailsTheRun)
+{
+    EXPECT_FALSE(BackstoreGuarantor::Process(Root({a->Hold("opt/missing")})));
+    Counted<DelayLoadHolder> const x = Stored("x", "X");
+    EXPECT_FALSE(BackstoreGuarantor::Process(Root({x, Stored("nest/n", "refuse")})));
+    EXPECT_FALSE(x->GetBackData()) << "nothing is copied when the walk has failed";
+    a->onCreateBackData = [] { throw BackstoreException(true); };
+    EXPECT_FALSE(BackstoreGuarantor::Process(Root({x})));
+}
+
+TEST_F(BackstoreGuarantorTest, WhatAStayingStoreHoldsIsNotCopied)
+{
+    struct
+    {
+        char const* what;
+        bool load, dirty, forget;
+    } const cases[] = {
+        {"never loaded", false, false, false},
+        {"clean", true, false, false},
+        {"dirty, so in memory", true, true, false},
+        {"unknown, but in memory", true, false, true},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        Counted<DelayLoadHolder> const x = Stored("x", "X");
+        if (c.load) TextOf(x);
+        if (c.dirty) x->GetItemBaseIfLoaded()->MarkAsDirty();
+        if (c.forget) a->RemoveDirtyStates({"x"});
+        EXPECT_TRUE(BackstoreGuarantor::Process(Root({x}), a));
+        EXPECT_EQ(0, a->copies);
+    }
+    // Another store is no reason to leave out the copy of what it does not know.
+    Counted<MemoryFileStore> const b = MemoryFileStore::Create();
+    Counted<DelayLoadHolder> const y = Stored("y", "Y");
+    TextOf(y);
+    EXPECT_TRUE(y->ReleaseItem());
+    EXPECT_TRUE(BackstoreGuarantor::Process(Root({y})));
+    EXPECT_EQ(1, a->copies);
+}
+
+} // namespace
