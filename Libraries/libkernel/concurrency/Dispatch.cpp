@@ -5,6 +5,7 @@
 #include "libkernel/platform/Time.h"
 
 #include <atomic>
+#include <memory>
 #include <utility>
 
 namespace Kernel {
@@ -120,6 +121,11 @@ void FreeJob(Job* job)
     if (++own.count >= c_batch) own.Share();
 }
 
+struct JobFreer
+{
+    void operator()(Job* job) const { FreeJob(job); }
+};
+
 void RunJob(void* context)
 {
     Job* const job = static_cast<Job*>(context);
@@ -181,10 +187,11 @@ void Dispatch::DispatchAndForget(void (*function)(void*), void* context, Dispatc
 
 void Dispatch::DispatchAndForget(std::function<void()> function, DispatchPriority priority, ThreadPurpose)
 {
-    Job* const job = NewJob();
+    std::unique_ptr<Job, JobFreer> job(NewJob());
     job->function = std::move(function);
     if (!GetScopes().empty()) job->scopes = CaptureScopes();
-    GlobalQueue::Async(QueueOf(priority), job, RunJob);
+    GlobalQueue::Async(QueueOf(priority), job.get(), RunJob);
+    (void)job.release();
 }
 
 void Dispatch::DispatchParallelFor(void (*function)(void*, u64), u64 count, void* context, DispatchPriority priority,

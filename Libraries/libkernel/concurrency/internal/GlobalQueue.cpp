@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <atomic>
 #include <memory>
+#include <mutex>
 #include <pthread.h>
 #include <vector>
 
@@ -41,14 +42,14 @@ struct Pending
 class BriefLock
 {
 public:
-    void Acquire()
+    void lock()
     {
         for (u32 tries = 0; m_taken.exchange(true, std::memory_order_acquire); ++tries) {
             for (u32 i = 0; i < 64 && m_taken.load(std::memory_order_relaxed); ++i) Platform::PauseProcessor();
             if (tries > 8) Platform::YieldThread();
         }
     }
-    void Release() { m_taken.store(false, std::memory_order_release); }
+    void unlock() { m_taken.store(false, std::memory_order_release); }
 
 private:
     std::atomic<bool> m_taken{false};
@@ -60,11 +61,14 @@ class Ring
 public:
     bool IsEmpty() const { return m_count == 0; }
 
-    void Push(Pending const& job)
+    // Makes room for so many more, or throws and leaves all as it was.
+    void Reserve(u64 more)
     {
-        if (m_count == m_capacity) Grow();
-        m_jobs[(m_head + m_count++) & (m_capacity - 1)] = job;
+        while (m_capacity - m_count < more) Grow();
     }
+
+    // There must be room.
+    void Push(Pending const& job) { m_jobs[(m_head + m_count++) & (m_capacity - 1)] = job; }
 
     Pending Pop()
     {
@@ -99,9 +103,13 @@ private:
 class Pool
 {
 public:
-    explicit Pool(Pool* before) : m_processors(Platform::CountUsableCpus()), m_before(before) {}
+    explicit Pool(Pool* before) : m_processors(Platform::CountUsableCpus()), m_before(before)
+    {
+        m_threadIds.reserve(static_cast<u64>(std::max(c_mostThreads, m_processors)));
+    }
 
     int GetProcessors() const { return m_processors; }
+    // Adds all copies, or throws std::bad_alloc and adds none.
     void Add(Queue queue, Pending const& job, int copies);
 
 private:
@@ -127,8 +135,8 @@ private:
     void Do(Calls const& calls);
     void StartWorker();
     i64 MeasureCS(std::vector<u64>& threads);
-    void Lock() { m_lock.Acquire(); }
-    void Unlock() { m_lock.Release(); }
+    void Lock() { m_lock.lock(); }
+    void Unlock() { m_lock.unlock(); }
 
     int const m_processors;
     [[maybe_unused]] Pool* const m_before; // The parent process's, kept reachable in a child.
@@ -151,12 +159,14 @@ private:
 void Pool::Add(Queue queue, Pending const& job, int copies)
 {
     Calls calls;
-    Lock();
-    for (int i = 0; i < copies; ++i) m_rings[queue].Push(job);
-    m_pending += static_cast<u64>(copies);
-    m_hint.store(m_pending, std::memory_order_relaxed);
-    CallForHelpCS(calls);
-    Unlock();
+    {
+        std::lock_guard const lock(m_lock);
+        m_rings[queue].Reserve(static_cast<u64>(copies));
+        for (int i = 0; i < copies; ++i) m_rings[queue].Push(job);
+        m_pending += static_cast<u64>(copies);
+        m_hint.store(m_pending, std::memory_order_relaxed);
+        CallForHelpCS(calls);
+    }
     Do(calls);
 }
 
@@ -289,6 +299,7 @@ bool Pool::SleepUntilWoken()
 void Pool::RunManager() noexcept
 {
     std::vector<u64> threads;
+    threads.reserve(c_mostThreads);
     i64 pause = c_firstLookNs;
     Lock();
     for (;;) {
@@ -453,11 +464,12 @@ void Apply(u64 count, Queue queue, void* context, RangeFunction work)
     if (count == 0) return;
     Pool& pool = GetPool();
     u64 const threads = std::min<u64>(count, static_cast<u64>(pool.GetProcessors()));
-    Loop* const loop = new Loop(count, context, work, threads);
-    if (threads > 1) pool.Add(queue, {Loop::Help, loop}, static_cast<int>(threads - 1));
-    loop->Work();
-    loop->WaitForLast();
-    loop->Release();
+    auto loop = std::make_unique<Loop>(count, context, work, threads);
+    if (threads > 1) pool.Add(queue, {Loop::Help, loop.get()}, static_cast<int>(threads - 1));
+    Loop* const shared = loop.release(); // The helpers have their references now.
+    shared->Work();
+    shared->WaitForLast();
+    shared->Release();
 }
 
 } // namespace Kernel::GlobalQueue
