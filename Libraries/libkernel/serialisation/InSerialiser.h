@@ -28,14 +28,6 @@ class Serialisable;
 class SharedSerialisable;
 struct InSerialiserProperty;
 
-/// A JSON value of any string type.
-template <class J>
-concept JsonValue = requires
-{
-    typename J::json_pointer;
-    typename J::value_t;
-};
-
 /// One parsed property list: what an object's Load reads from, by tag and in any order.
 ///
 /// Every Load operation takes the tag first, and answers false with its output untouched if the tag is absent or stands
@@ -246,6 +238,11 @@ private:
     InSerialiserProperty* FindPropertyI(IDTag tag) const;
     InSerialiserProperty const* FindPropertyOrDefaultI(IDTag tag) const;
     InSerialiserProperty const* FindValueI(IDTag tag, u8 typeByte) const;
+    InSerialiserProperty const* FindKindI(IDTag tag, PropertyType kind) const;
+    template <class Bools>
+    bool LoadBoolsI(IDTag tag, Bools& values) const;
+    template <class P>
+    bool LoadArrayI(IDTag tag, PropertyType kind, P const*& objects, u64& count) const;
     template <class Enc>
     bool LoadTextI(IDTag tag, StringT<Enc>& text) const;
     template <class Enc>

@@ -54,6 +54,8 @@ public:
     bool FoundMissingFiles() const { return m_foundMissingFiles; }
 
 private:
+    friend class InSerialiserLoader;
+
     InSerialiserFile(IDTag fileIDTag, unsigned short fileVersion);
     ~InSerialiserFile() override;
     static Counted<InSerialiserFile> ParseI(InStream& in, FileStore& store, DelayLoadsBehaviour behaviour, bool checks,

@@ -101,6 +101,8 @@ private:
     bool LoadTextI(StringT<Enc>& text);
     template <class Enc>
     bool LoadTextsI(std::vector<StringT<Enc>>& texts);
+    template <class Bools>
+    bool LoadBoolsI(Bools& values);
 
     u8 const* m_next = nullptr; // The item behind the current one.
     u8 const* m_end = nullptr;
