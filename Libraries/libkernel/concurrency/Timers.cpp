@@ -1,4 +1,5 @@
 #include "libkernel/concurrency/Timer.h"
+#include "libkernel/core/Trace.h"
 #include "libkernel/platform/Debug.h"
 
 #include <charconv>
@@ -132,7 +133,7 @@ void Timers::Report()
 {
     String8 const text = GetReportString();
     if (Platform::IsDebuggerAttached())
-        Platform::WriteDebugOutput(text.GetData());
+        Trace(text);
     else
         Platform::ShowMessage("Timers::Report", text.GetData());
     m_hasData = false;
