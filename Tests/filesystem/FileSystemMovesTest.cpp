@@ -1,0 +1,370 @@
+#include "libkernel/core/LogSink.h"
+#include "libkernel/filesystem/FileSystem.h"
+#include "libkernel/platform/Errors.h"
+#include "support/CrashRecorder.h"
+#include "support/FakeClock.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <optional>
+#include <string>
+#include <sys/stat.h>
+#include <vector>
+
+namespace Kernel {
+namespace {
+
+using TestSupport::CrashRecorder;
+using TestSupport::FakeClock;
+using TestSupport::Fault;
+using TestSupport::FaultyFiles;
+using TestSupport::FileCall;
+using TestSupport::ReadWholeFile;
+using TestSupport::TempFolder;
+using TestSupport::WriteWholeFile;
+using MoveResult = FileSystem::SafeMoveFileResult;
+
+String8 S(std::string const& text)
+{
+    return String8{std::string_view(text)};
+}
+
+/// Puts two volumes in place: what is called "old" lies on another one than the rest and can't be renamed.
+class TwoVolumes
+{
+public:
+    TwoVolumes()
+    {
+        static Platform::FileCalls s_calls;
+        s_calls = Platform::GetSystemFileCalls();
+        s_calls.rename = [](char const* from, char const* to) {
+            return std::string(from).ends_with("/old") ? EXDEV : Platform::GetSystemFileCalls().rename(from, to);
+        };
+        Platform::SetFileCalls(&s_calls);
+    }
+    ~TwoVolumes() { Platform::SetFileCalls(nullptr); }
+};
+
+/// A folder with "old" and "target", a clock that stands still, a log that is kept, and files that can fail.
+class FileSystemMovesTest : public testing::Test, LogSink
+{
+protected:
+    FileSystemMovesTest()
+    {
+        m_before = SetLogSink(this);
+        WriteWholeFile(m_folder / "old", "new content");
+        WriteWholeFile(m_folder / "target", "target content");
+    }
+    ~FileSystemMovesTest() override { SetLogSink(m_before); }
+
+    void WriteMessage(int level, String8 const& text) override
+    {
+        EXPECT_EQ(level, 1);
+        m_log.push_back(text.GetData());
+    }
+
+    String8 At(std::string const& name) const { return S(m_folder / name); }
+    std::string Read(std::string const& name) const { return ReadWholeFile(m_folder / name); }
+    std::vector<std::string> List() const
+    {
+        std::vector<std::string> names;
+        for (auto const& e : std::filesystem::directory_iterator(m_folder.GetPath()))
+            names.push_back(e.path().filename());
+        std::sort(names.begin(), names.end());
+        return names;
+    }
+
+    TempFolder m_folder;
+    FakeClock m_clock;
+    std::vector<std::string> m_log;
+    LogSink* m_before;
+};
+
+using Names = std::vector<std::string>;
+using Pauses = std::vector<i64>;
+
+TEST_F(FileSystemMovesTest, MoveReplacesTheTargetAndFlushesContentsAndName)
+{
+    FaultyFiles faults;
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 3), MoveResult::Moved);
+    EXPECT_EQ(Read("target"), "new content");
+    EXPECT_EQ(List(), Names{"target"});
+    EXPECT_GE(faults.GetCount(FileCall::Flush), 1);
+    EXPECT_GE(faults.GetCount(FileCall::FlushFolder), 1);
+    EXPECT_EQ(faults.GetOpenHandles(), 0);
+    EXPECT_TRUE(m_log.empty());
+}
+
+TEST_F(FileSystemMovesTest, RenameIsTriedAgainOnlyWhereTheFailureMayPass)
+{
+    struct Case
+    {
+        char const* what;
+        int error;
+        bool isRetriedByMove;
+        bool isRetriedByRename;
+        bool isRetriedByDelete;
+    };
+    static constexpr Case c_cases[] = {
+        {"too many open files", EMFILE, true, true, true},
+        {"too many in the system", ENFILE, true, true, true},
+        {"access denied", EACCES, true, true, true},
+        {"not permitted", EPERM, true, true, true},
+        {"in use", EBUSY, false, true, false},
+        {"running", ETXTBSY, false, true, false},
+        {"disk full", ENOSPC, false, false, false},
+        {"damaged", EIO, false, false, false},
+        {"read only", EROFS, false, false, false},
+    };
+    for (Case const& c : c_cases) {
+        SCOPED_TRACE(c.what);
+        FaultyFiles faults;
+        auto const run = [&](FileCall call, bool isRetried, auto const& operation) {
+            FakeClock clock;
+            faults.Clear();
+            faults.ResetCounts();
+            faults.Plan({.call = call, .forEver = true, .error = c.error});
+            operation();
+            EXPECT_EQ(clock.GetSleeps(), isRetried ? Pauses({1000, 1000}) : Pauses());
+            return faults.GetCount(call);
+        };
+        int const tries = c.isRetriedByMove ? 3 : 1;
+        // One more rename than the tries: that of the copy beside the target.
+        EXPECT_EQ(run(FileCall::Rename, c.isRetriedByMove,
+                      [&] { EXPECT_NE(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 2), MoveResult::Moved); }),
+                  tries + 1);
+        EXPECT_EQ(run(FileCall::Rename, c.isRetriedByRename,
+                      [&] { EXPECT_FALSE(FileSystem::RenameFile(At("old"), At("target"), 2)); }),
+                  c.isRetriedByRename ? 3 : 1);
+        EXPECT_EQ(run(FileCall::Unlink, c.isRetriedByDelete, [&] { EXPECT_FALSE(FileSystem::Delete(At("old"), 2)); }),
+                  c.isRetriedByDelete ? 3 : 1);
+        EXPECT_EQ(List(), (Names{"old", "target"}));
+        EXPECT_EQ(Read("target"), "target content");
+    }
+}
+
+TEST_F(FileSystemMovesTest, FailureThatPassesCostsOnePauseForEachTry)
+{
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::Rename, .n = 1, .error = EACCES});
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 5), MoveResult::Moved);
+    EXPECT_EQ(m_clock.GetSleeps(), Pauses{1000});
+    EXPECT_TRUE(m_log.empty());
+}
+
+TEST_F(FileSystemMovesTest, MissingSourceFailsWithoutPauseCopyOrMessage)
+{
+    FaultyFiles faults;
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("missing"), At("target"), 5), MoveResult::Failed);
+    EXPECT_TRUE(FileSystem::Delete(At("missing"), 5));
+    EXPECT_FALSE(FileSystem::RenameFile(At("missing"), At("target"), 5));
+    EXPECT_EQ(m_clock.GetSleeps(), Pauses());
+    EXPECT_EQ(faults.GetCount(FileCall::Write), 0);
+    EXPECT_TRUE(m_log.empty());
+    EXPECT_EQ(Read("target"), "target content");
+}
+
+TEST_F(FileSystemMovesTest, HeldTargetIsTriedOnceAndThenCopiedOver)
+{
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::Rename, .n = 1, .error = EACCES});
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::Moved);
+    EXPECT_EQ(Read("target"), "new content");
+    EXPECT_EQ(List(), Names{"target"});
+    std::string const old = m_folder / "old", target = m_folder / "target";
+    EXPECT_EQ(m_log, std::vector<std::string>({"SafeMoveFile error: MoveFileExW failed with code " +
+                                               std::to_string(EACCES) + "!\n\tOld: " + old + "\n\tNew: " + target}));
+
+    WriteWholeFile(old, "again");
+    faults.Clear();
+    faults.Plan({.call = FileCall::Rename, .forEver = true, .error = EACCES});
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::AccessDenied);
+    EXPECT_EQ(List(), (Names{"old", "target"}));
+    EXPECT_EQ(m_log.back(), "SafeMoveFile error: CopyFileExW failed with code " + std::to_string(EACCES) +
+                                "!\n\tOld: " + old + "\n\tNew: " + target);
+}
+
+TEST_F(FileSystemMovesTest, MoveBetweenVolumesKeepsTheFileWhole)
+{
+    std::string big(2'500'000, 'b');
+    WriteWholeFile(m_folder / "old", big);
+    std::filesystem::permissions(m_folder / "old", std::filesystem::perms(0640));
+    TwoVolumes const volumes;
+    FaultyFiles faults;
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::Moved);
+    EXPECT_EQ(Read("target"), big);
+    EXPECT_EQ(List(), Names{"target"});
+    struct ::stat info;
+    ASSERT_EQ(::stat((m_folder / "target").c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 0777, 0640u);
+    EXPECT_TRUE(m_log.empty());
+    EXPECT_EQ(faults.GetOpenHandles(), 0);
+}
+
+TEST_F(FileSystemMovesTest, SourceThatStaysAfterTheCopyIsAWarning)
+{
+    TwoVolumes const volumes;
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::Unlink, .forEver = true, .error = EBUSY});
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 4), MoveResult::Moved);
+    EXPECT_EQ(Read("target"), "new content");
+    EXPECT_EQ(List(), (Names{"old", "target"}));
+    ASSERT_EQ(m_log.size(), 1u);
+    EXPECT_EQ(m_log[0], "SafeMoveFile warning: DeleteFileW failed with code " + std::to_string(EBUSY) +
+                            "!\n\tPath: " + (m_folder / "old"));
+}
+
+TEST_F(FileSystemMovesTest, EveryFaultOfACopyingMoveLeavesSourceOrTargetWhole)
+{
+    struct Case
+    {
+        FileCall call;
+        int error;
+        Fault::Part part;
+        MoveResult result;
+    };
+    static constexpr Case c_cases[] = {
+        {FileCall::Read, EIO, Fault::Part::Nothing, MoveResult::Failed},
+        {FileCall::Write, ENOSPC, Fault::Part::Half, MoveResult::DiskFull},
+        {FileCall::Write, EDQUOT, Fault::Part::AllButOne, MoveResult::DiskFull},
+        {FileCall::Write, 0, Fault::Part::Half, MoveResult::Failed},
+        {FileCall::Flush, EIO, Fault::Part::Nothing, MoveResult::Failed},
+        {FileCall::Flush, ENOSPC, Fault::Part::Nothing, MoveResult::DiskFull},
+        {FileCall::FlushFolder, EIO, Fault::Part::Nothing, MoveResult::Failed},
+        {FileCall::Open, EMFILE, Fault::Part::Nothing, MoveResult::Failed},
+        {FileCall::Open, EACCES, Fault::Part::Nothing, MoveResult::AccessDenied},
+        {FileCall::Close, EIO, Fault::Part::Nothing, MoveResult::Failed},
+        {FileCall::SetAttributes, EPERM, Fault::Part::Nothing, MoveResult::Moved},
+        {FileCall::Rename, EROFS, Fault::Part::Nothing, MoveResult::Failed},
+    };
+    for (Case const& c : c_cases) {
+        TwoVolumes const volumes;
+        MoveResult result = MoveResult::Moved;
+        auto const operation = [&](FaultyFiles& faults) {
+            WriteWholeFile(m_folder / "old", "new content");
+            WriteWholeFile(m_folder / "target", "target content");
+            result = FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0);
+            EXPECT_EQ(faults.GetOpenHandles(), 0);
+        };
+        auto const check = [&](int n) {
+            SCOPED_TRACE(testing::Message() << "call " << int(c.call) << " error " << c.error << " n " << n);
+            // A fault in opening the source for its flush, or in closing it, is passed over.
+            EXPECT_TRUE(result == c.result || result == MoveResult::Moved) << int(result);
+            std::string const target = Read("target");
+            EXPECT_TRUE(target == "target content" || target == "new content");
+            if (result == MoveResult::Moved) {
+                EXPECT_EQ(target, "new content");
+            }
+            if (target != "new content") {
+                EXPECT_EQ(Read("old"), "new content");
+            }
+            if (result == MoveResult::Moved)
+                EXPECT_EQ(List(), Names{"target"});
+            else
+                EXPECT_EQ(List(), (Names{"old", "target"}));
+        };
+        Fault fault{.call = c.call, .error = c.error, .part = c.part};
+        int const fired = TestSupport::ForEachFault(fault, operation, check, 100);
+        EXPECT_TRUE(fired > 0 && fired < 100);
+    }
+}
+
+TEST_F(FileSystemMovesTest, PowerCutDuringAMoveLeavesOldOrNewContent)
+{
+    for (bool between : {false, true}) {
+        TempFolder image;
+        WriteWholeFile(m_folder / "old", std::string(3000, 'n'));
+        WriteWholeFile(m_folder / "target", std::string(2000, 't'));
+        std::optional<TwoVolumes> volumes;
+        if (between) volumes.emplace();
+        CrashRecorder recorder(m_folder.GetPath());
+        // Written and closed, but not flushed, as a writer without guarantees leaves it.
+        Platform::FileHandle handle = Platform::c_noHandle;
+        auto const& calls = Platform::GetFileCalls();
+        ASSERT_EQ(calls.open((m_folder / "old").c_str(), {.write = true, .truncate = true}, handle), 0);
+        calls.write(handle, std::string(3000, 'N').data(), 3000);
+        calls.close(handle);
+        u64 const begin = recorder.GetStepCount();
+        ASSERT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::Moved);
+        for (u64 step = begin; step <= recorder.GetStepCount(); ++step)
+            for (u64 seed = 0; seed < 12; ++seed) {
+                for (auto const& e : std::filesystem::directory_iterator(image.GetPath()))
+                    std::filesystem::remove_all(e.path());
+                recorder.MakeImage(step, seed, image.GetPath());
+                SCOPED_TRACE(testing::Message() << "between " << between << " step " << step << " seed " << seed);
+                std::string const target = ReadWholeFile(image / "target");
+                bool const isNew = target == std::string(3000, 'N');
+                EXPECT_TRUE(isNew || target == std::string(2000, 't'));
+                if (step == recorder.GetStepCount()) {
+                    EXPECT_TRUE(isNew);
+                }
+            }
+    }
+}
+
+TEST_F(FileSystemMovesTest, BackupTakesTheFirstFreeNumber)
+{
+    String8 out;
+    WriteWholeFile(m_folder / "old_backup1", "taken");
+    std::filesystem::create_symlink("nowhere", m_folder / "old_backup2");
+    EXPECT_EQ(FileSystem::RenameFileForBackup(At("old"), out), FileSystem::RenameFileForBackupResult::Renamed);
+    EXPECT_EQ(out, At("old_backup3"));
+    EXPECT_EQ(Read("old_backup3"), "new content");
+    EXPECT_EQ(Read("old_backup1"), "taken");
+
+    struct Case
+    {
+        int error;
+        FileSystem::RenameFileForBackupResult result;
+    };
+    FaultyFiles faults;
+    for (Case const& c : {Case{EACCES, FileSystem::RenameFileForBackupResult::AccessDenied},
+                          Case{ENOSPC, FileSystem::RenameFileForBackupResult::DiskFull},
+                          Case{EIO, FileSystem::RenameFileForBackupResult::Failed}})
+    {
+        faults.Clear();
+        faults.Plan({.call = FileCall::Rename, .forEver = true, .error = c.error});
+        out = "untouched";
+        EXPECT_EQ(FileSystem::RenameFileForBackup(At("target"), out), c.result);
+        EXPECT_EQ(out, "untouched");
+    }
+}
+
+TEST_F(FileSystemMovesTest, CopyOverwritesFollowsLinksAndSparesDevicesAndItself)
+{
+    std::filesystem::create_symlink("target", m_folder / "link");
+    EXPECT_TRUE(FileSystem::CopyFile(At("old"), At("link")));
+    EXPECT_EQ(Read("target"), "new content");
+    EXPECT_TRUE(std::filesystem::is_symlink(m_folder / "link"));
+    EXPECT_TRUE(FileSystem::CopyFile(At("old"), At("fresh")));
+    EXPECT_EQ(Read("fresh"), "new content");
+
+    std::filesystem::create_hard_link(m_folder / "old", m_folder / "hard");
+    EXPECT_FALSE(FileSystem::CopyFile(At("old"), At("old")));
+    EXPECT_FALSE(FileSystem::CopyFile(At("old"), At("hard")));
+    EXPECT_FALSE(FileSystem::CopyFile(At("missing"), At("fresh")));
+    EXPECT_FALSE(FileSystem::CopyFile(At("old"), At("no/such/folder")));
+    EXPECT_FALSE(FileSystem::CopyFile(At("old"), S(m_folder.GetPath())));
+    EXPECT_EQ(FileSystem::CopyFileAdv(At("old"), "/dev/null"), FileSystem::CopyFileResult::Failed);
+    EXPECT_EQ(Read("old"), "new content");
+    EXPECT_EQ(Read("fresh"), "new content");
+    EXPECT_EQ(List(), (Names{"fresh", "hard", "link", "old", "target"}));
+}
+
+TEST_F(FileSystemMovesTest, TemporaryBesideTheTargetFollowsNoPlantedLink)
+{
+    // The names that are tried next are all taken by links to a precious file.
+    WriteWholeFile(m_folder / "precious", "precious");
+    for (int i = 0; i < 200; ++i) std::filesystem::create_symlink("precious", m_folder / ("~move" + std::to_string(i)));
+    TwoVolumes const volumes;
+    FaultyFiles faults;
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::Moved);
+    EXPECT_EQ(Read("precious"), "precious");
+    EXPECT_EQ(Read("target"), "new content");
+    EXPECT_FALSE(std::filesystem::is_symlink(m_folder / "target"));
+}
+
+} // namespace
+} // namespace Kernel

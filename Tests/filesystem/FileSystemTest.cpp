@@ -1,0 +1,376 @@
+#include "libkernel/filesystem/FileSystem.h"
+
+#include "libkernel/concurrency/TimeStamp.h"
+#include "libkernel/platform/Errors.h"
+#include "libkernel/platform/FileMarks.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+
+#include <fcntl.h>
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <string>
+#include <sys/stat.h>
+#include <thread>
+#include <unistd.h>
+
+namespace Kernel {
+namespace {
+
+using TestSupport::FaultyFiles;
+using TestSupport::FileCall;
+using TestSupport::TempFolder;
+using TestSupport::WriteWholeFile;
+
+String8 S(std::string const& text)
+{
+    return String8{std::string_view(text)};
+}
+
+class FileSystemTest : public testing::Test
+{
+protected:
+    String8 Make(std::string const& name, std::string const& content = "content")
+    {
+        WriteWholeFile(m_folder / name, content);
+        return S(m_folder / name);
+    }
+    String8 MakeFolder(std::string const& name)
+    {
+        std::filesystem::create_directories(m_folder / name);
+        return S(m_folder / name);
+    }
+    String8 MakeLink(std::string const& name, std::string const& target)
+    {
+        std::filesystem::create_symlink(target, m_folder / name);
+        return S(m_folder / name);
+    }
+    String8 At(std::string const& name) const { return S(m_folder / name); }
+
+    TempFolder m_folder;
+};
+
+TEST_F(FileSystemTest, KindsOfEntriesAreToldApart)
+{
+    struct Case
+    {
+        String8 path;
+        FileSystem::PathResult kind;
+        i64 size;
+    };
+    std::string const zero = (m_folder / "file") + std::string(1, '\0') + "x";
+    Case const cases[] = {
+        {Make("file", "12345"), FileSystem::PathResult::File, 5},
+        {MakeFolder("folder"), FileSystem::PathResult::Directory, -1},
+        {MakeLink("toFile", "file"), FileSystem::PathResult::File, 5},
+        {MakeLink("toFolder", "folder"), FileSystem::PathResult::Directory, -1},
+        {MakeLink("toNothing", "nothing"), FileSystem::PathResult::Nothing, -1},
+        {At("missing"), FileSystem::PathResult::Nothing, -1},
+        {"", FileSystem::PathResult::Nothing, -1},
+        {S(zero), FileSystem::PathResult::Nothing, -1},
+    };
+    for (Case const& c : cases) {
+        SCOPED_TRACE(c.path.GetData());
+        EXPECT_EQ(FileSystem::TestPath(c.path), c.kind);
+        EXPECT_EQ(FileSystem::Exists(c.path), c.kind != FileSystem::PathResult::Nothing);
+        EXPECT_EQ(FileSystem::IsFile(c.path), c.kind == FileSystem::PathResult::File);
+        EXPECT_EQ(FileSystem::IsDirectory(c.path), c.kind == FileSystem::PathResult::Directory);
+        EXPECT_EQ(FileSystem::GetFileSize(c.path), c.size);
+        EXPECT_EQ(FileSystem::HasReadAccess(c.path), c.kind == FileSystem::PathResult::File);
+    }
+    EXPECT_TRUE(FileSystem::IsDirectoryEmpty(At("folder")));
+    EXPECT_FALSE(FileSystem::IsDirectoryEmpty(S(m_folder.GetPath())));
+    EXPECT_FALSE(FileSystem::IsDirectoryEmpty(At("file")));
+}
+
+TEST_F(FileSystemTest, PipeIsNeverWaitedFor)
+{
+    ASSERT_EQ(::mkfifo((m_folder / "pipe").c_str(), 0600), 0);
+    EXPECT_FALSE(FileSystem::HasReadAccess(At("pipe")));
+    EXPECT_FALSE(FileSystem::CompareFileWithMemory(At("pipe"), "", 0));
+    EXPECT_FALSE(FileSystem::CopyFile(At("pipe"), At("copy")));
+    EXPECT_EQ(FileSystem::GetFileSize(At("pipe")), -1);
+}
+
+TEST_F(FileSystemTest, FilenameIsTheLastPartAsTheFileSystemSpellsIt)
+{
+    Make("Name.TXT");
+    EXPECT_EQ(FileSystem::GetFilename(At("Name.TXT")), "Name.TXT");
+    EXPECT_EQ(FileSystem::GetFilename(At("missing.doc")), "missing.doc");
+    EXPECT_EQ(FileSystem::GetFilename("a/b/"), "b");
+    EXPECT_EQ(FileSystem::GetFilename("plain"), "plain");
+    EXPECT_EQ(FileSystem::GetFilename(""), "");
+
+    // A folder that ignores case: what is asked for is found, and listed in another spelling.
+    static Platform::FileCalls s_calls;
+    s_calls = Platform::GetSystemFileCalls();
+    s_calls.stat = [](char const* path, bool follow, Platform::FileInfo& info) {
+        std::string const asked = path;
+        auto const at = asked.find("name.txt");
+        return Platform::GetSystemFileCalls().stat(
+            (at == asked.npos ? asked : asked.substr(0, at) + "Name.TXT").c_str(), follow, info);
+    };
+    Platform::SetFileCalls(&s_calls);
+    EXPECT_EQ(FileSystem::GetFilename(At("name.txt")), "Name.TXT");
+    Platform::SetFileCalls(nullptr);
+}
+
+TEST_F(FileSystemTest, RefusedFileIsAPermissionErrorOnlyWhereItStands)
+{
+    FaultyFiles faults;
+    struct Case
+    {
+        char const* name;
+        int error;
+        bool isPermission;
+    };
+    Make("file");
+    for (Case const& c : {Case{"file", EACCES, true}, Case{"file", EPERM, true}, Case{"missing", EACCES, false},
+                          Case{"file", ENOENT, false}, Case{"file", 0, false}})
+    {
+        faults.Clear();
+        faults.Plan({.call = FileCall::Open, .n = 1, .forEver = c.error != 0, .error = c.error});
+        if (c.error == 0) faults.Clear();
+        EXPECT_EQ(FileSystem::HasPermissionError(At(c.name)), c.isPermission) << c.name << c.error;
+    }
+    EXPECT_EQ(faults.GetOpenHandles(), 0);
+}
+
+TEST_F(FileSystemTest, SameFileIsToldByIdentityAndMissingOnesThrow)
+{
+    String8 const a = Make("a"), b = Make("b");
+    std::filesystem::create_hard_link(m_folder / "a", m_folder / "hard");
+    EXPECT_TRUE(FileSystem::IsSameFile(a, At("hard")));
+    EXPECT_TRUE(FileSystem::IsSameFile(a, MakeLink("soft", "a")));
+    EXPECT_TRUE(FileSystem::IsSameFile(At("none"), At("none")));
+    EXPECT_FALSE(FileSystem::IsSameFile(a, b));
+    for (bool missingFirst : {true, false}) {
+        try {
+            missingFirst ? FileSystem::IsSameFile(At("none"), a) : FileSystem::IsSameFile(a, At("none"));
+            FAIL();
+        } catch (std::filesystem::filesystem_error const& e) {
+            EXPECT_NE(std::string(e.what()).find("equivalent"), std::string::npos);
+        }
+    }
+}
+
+TEST_F(FileSystemTest, MarksStayWithTheFileWhereTheFileSystemHasThem)
+{
+    String8 const path = Make("file");
+    if (!FileSystem::SetFileHidden(path, true)) GTEST_SKIP() << "no user attributes on " << m_folder.GetPath();
+    EXPECT_EQ(FileSystem::GetFileHidden(path), std::make_pair(true, true));
+    EXPECT_TRUE(FileSystem::SetFileHidden(path, false));
+    EXPECT_TRUE(FileSystem::SetFileHidden(path, false));
+    EXPECT_EQ(FileSystem::GetFileHidden(path), std::make_pair(true, false));
+
+    EXPECT_EQ(FileSystem::GetDropBoxIgnore(path), std::make_pair(false, false));
+    EXPECT_TRUE(FileSystem::SetDropBoxIgnore(path, true));
+    EXPECT_EQ(FileSystem::GetDropBoxIgnore(path), std::make_pair(true, true));
+    struct Case
+    {
+        std::string value;
+        bool ignores;
+    };
+    for (Case const& c : {Case{std::string(4, '\0'), false}, Case{std::string("\0\1\0\0", 4), true}, Case{"1", true},
+                          Case{std::string(3, '\0'), true}, Case{"", true}})
+    {
+        auto const& calls = Platform::GetFileCalls();
+        calls.setAttribute(path.GetData(), Platform::c_syncIgnoreAttribute, c.value.data(), c.value.size());
+        EXPECT_EQ(FileSystem::GetDropBoxIgnore(path), std::make_pair(true, c.ignores));
+    }
+    EXPECT_TRUE(FileSystem::SetDropBoxIgnore(path, false));
+    EXPECT_TRUE(FileSystem::SetDropBoxIgnore(path, false));
+    EXPECT_EQ(FileSystem::GetDropBoxIgnore(path), std::make_pair(false, false));
+}
+
+TEST_F(FileSystemTest, FileSystemWithoutMarksCouldNotSay)
+{
+    FaultyFiles faults;
+    String8 const path = Make("file"), other = Make("other");
+    faults.Plan({.call = FileCall::GetAttribute, .forEver = true, .error = EOPNOTSUPP});
+    EXPECT_EQ(FileSystem::GetFileHidden(path), std::make_pair(false, false));
+    EXPECT_EQ(FileSystem::GetDropBoxIgnore(path), std::make_pair(false, false));
+    EXPECT_TRUE(FileSystem::CopyFileAttributes(path, other));
+    faults.Clear();
+    faults.Plan({.call = FileCall::SetAttributes, .forEver = true, .error = EOPNOTSUPP});
+    EXPECT_FALSE(FileSystem::SetFileHidden(path, true));
+    EXPECT_FALSE(FileSystem::SetDropBoxIgnore(path, true));
+}
+
+TEST_F(FileSystemTest, AttributesAreCopiedByPathAndByDescriptor)
+{
+    String8 const from = Make("from"), to = Make("to");
+    ::chmod(from.GetData(), 0440);
+    bool const hasMarks = FileSystem::SetFileHidden(from, true);
+    EXPECT_TRUE(FileSystem::FileIsReadOnly(from));
+    EXPECT_FALSE(FileSystem::FileIsReadOnly(to));
+    EXPECT_FALSE(FileSystem::FileIsReadOnly(At("missing")));
+
+    EXPECT_TRUE(FileSystem::CopyFileAttributes(from, to));
+    EXPECT_TRUE(FileSystem::FileIsReadOnly(to));
+    if (hasMarks) {
+        EXPECT_TRUE(FileSystem::GetFileHidden(to).second);
+    }
+
+    String8 const plain = Make("plain");
+    ::chmod(plain.GetData(), 0600);
+    int const in = ::open(plain.GetData(), O_RDONLY), out = ::open(to.GetData(), O_RDONLY);
+    EXPECT_TRUE(FileSystem::CopyFileAttributes(in, out));
+    EXPECT_FALSE(FileSystem::CopyFileAttributes(in, -1));
+    ::close(in);
+    ::close(out);
+    EXPECT_FALSE(FileSystem::FileIsReadOnly(to));
+    EXPECT_FALSE(FileSystem::GetFileHidden(to).second);
+    EXPECT_FALSE(FileSystem::CopyFileAttributes(At("missing"), to));
+}
+
+TEST_F(FileSystemTest, EachTimeIsSetWithoutTheOther)
+{
+    String8 const path = Make("file");
+    EXPECT_TRUE(FileSystem::SetModifiedTime(path, TimeStamp(1'000'000'000)));
+    EXPECT_TRUE(FileSystem::SetAccessTime(path, TimeStamp(-5)));
+    TimeStamp modified, access;
+    EXPECT_TRUE(FileSystem::GetModifiedTime(path, modified));
+    EXPECT_TRUE(FileSystem::GetAccessTime(path, access));
+    EXPECT_EQ(modified, TimeStamp(1'000'000'000));
+    EXPECT_EQ(access, TimeStamp(-5));
+    std::tm fields = {};
+    EXPECT_TRUE(FileSystem::GetModifiedTime(path, fields, true));
+    EXPECT_EQ(fields.tm_year, 101);
+    EXPECT_EQ(fields.tm_hour, 1);
+    EXPECT_FALSE(FileSystem::SetModifiedTime(path, TimeStamp(INT64_MAX)));
+    EXPECT_FALSE(FileSystem::GetModifiedTime(At("missing"), modified));
+
+    ::timespec const half[2] = {{-2, 500'000'000}, {-2, 500'000'000}};
+    ASSERT_EQ(::utimensat(AT_FDCWD, path.GetData(), half, 0), 0);
+    EXPECT_TRUE(FileSystem::GetModifiedTime(path, modified));
+    EXPECT_EQ(modified, TimeStamp(-2));
+}
+
+TEST_F(FileSystemTest, ComparisonNeedsEqualLengthAndBytes)
+{
+    std::string big(3'000'000, 'x');
+    String8 const a = Make("a", big), b = Make("b", big);
+    std::string other = big;
+    other.back() = 'y';
+    String8 const differs = Make("differs", other), longer = Make("longer", big + "x"), empty = Make("empty", "");
+    EXPECT_TRUE(FileSystem::CompareFileWithFile(a, b));
+    EXPECT_FALSE(FileSystem::CompareFileWithFile(a, differs));
+    EXPECT_FALSE(FileSystem::CompareFileWithFile(a, longer));
+    EXPECT_FALSE(FileSystem::CompareFileWithFile(a, At("missing")));
+    EXPECT_TRUE(FileSystem::CompareFileWithMemory(a, big.data(), big.size()));
+    EXPECT_FALSE(FileSystem::CompareFileWithMemory(a, other.data(), other.size()));
+    EXPECT_TRUE(FileSystem::CompareFileWithMemory(empty, nullptr, 0));
+    EXPECT_FALSE(FileSystem::CompareFileWithMemory(At("missing"), "", 0));
+
+    FaultyFiles faults;
+    EXPECT_FALSE(FileSystem::CompareFileWithMemory(longer, big.data(), big.size()));
+    EXPECT_EQ(faults.GetCount(FileCall::Read), 0);
+    faults.Plan({.call = FileCall::Read, .n = 2, .error = EIO});
+    EXPECT_FALSE(FileSystem::CompareFileWithFile(a, b));
+    EXPECT_EQ(faults.GetOpenHandles(), 0);
+}
+
+TEST_F(FileSystemTest, DirectoriesAreMadeUpToTheFileName)
+{
+    struct Case
+    {
+        char const* path;
+        bool made;
+        char const* directory; // Must stand afterwards.
+        char const* absent;
+    };
+    Make("file");
+    static constexpr Case c_cases[] = {
+        {"a/b/c", true, "a/b/c", nullptr},
+        {"a/b/c", true, "a/b/c", nullptr},
+        {"d//e/doc.txt", true, "d/e", "d/e/doc.txt"},
+        {"f.g/", true, "f.g", nullptr},
+        {"file/x", false, nullptr, "file/x"},
+        {"h/.i", true, "h", "h/.i"},
+    };
+    for (Case const& c : c_cases) {
+        SCOPED_TRACE(c.path);
+        EXPECT_EQ(FileSystem::CreateDirectoryRecursive(At(c.path)), c.made);
+        if (c.directory) {
+            EXPECT_TRUE(FileSystem::IsDirectory(At(c.directory)));
+        }
+        if (c.absent) {
+            EXPECT_FALSE(FileSystem::Exists(At(c.absent)));
+        }
+    }
+    EXPECT_FALSE(FileSystem::CreateDirectoryRecursive(""));
+    EXPECT_TRUE(FileSystem::CreateDirectoryRecursive("/"));
+
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::MakeFolder, .n = 2, .error = ENOSPC});
+    EXPECT_FALSE(FileSystem::CreateDirectoryRecursive(At("p/q/r")));
+    EXPECT_TRUE(FileSystem::IsDirectory(At("p")));
+    EXPECT_FALSE(FileSystem::Exists(At("p/q")));
+}
+
+TEST_F(FileSystemTest, PathOfAHundredThousandElementsIsRefusedWhole)
+{
+    std::string path = m_folder.GetPath();
+    for (int i = 0; i < 100'000; ++i) path += "/a";
+    EXPECT_FALSE(FileSystem::CreateDirectoryRecursive(S(path)));
+    EXPECT_TRUE(FileSystem::IsDirectoryEmpty(S(m_folder.GetPath())));
+    EXPECT_FALSE(FileSystem::Exists(S(path)));
+    EXPECT_FALSE(FileSystem::Delete(S(path), 0));
+}
+
+TEST_F(FileSystemTest, UniqueNamesMeetNothingAndEnd)
+{
+    String8 const folder = S(m_folder.GetPath());
+    String8 const first = FileSystem::GetUniqueFilename(folder, "n%1.x"),
+                  second = FileSystem::GetUniqueFilename(folder, "n%1.x");
+    EXPECT_NE(first, second);
+    EXPECT_TRUE(first.BeginsWith(folder + "/n"));
+    EXPECT_FALSE(FileSystem::Exists(first));
+
+    EXPECT_EQ(FileSystem::GetUniqueFilename(folder, "same"), At("same"));
+    MakeLink("same", "nowhere");
+    EXPECT_EQ(FileSystem::GetUniqueFilename(folder, "same"), "");
+}
+
+TEST_F(FileSystemTest, LinkGivesItsTargetAndAnythingElseItself)
+{
+    String8 const file = Make("file");
+    EXPECT_EQ(FileSystem::ResolveLink(MakeLink("relative", "file")), file);
+    EXPECT_EQ(FileSystem::ResolveLink(MakeLink("absolute", "/etc")), "/etc");
+    EXPECT_EQ(FileSystem::ResolveLink(MakeLink("chain", "relative")), At("relative"));
+    EXPECT_EQ(FileSystem::ResolveLink(file), file);
+    EXPECT_EQ(FileSystem::ResolveLink(At("missing")), At("missing"));
+}
+
+TEST_F(FileSystemTest, PlacesAreKeptAndTheTemporaryOneIsMade)
+{
+    FileSystem::SetTemporaryDirectory(At("t/u"));
+    EXPECT_EQ(FileSystem::GetTemporaryDirectory(), At("t/u/"));
+    EXPECT_TRUE(FileSystem::IsDirectory(At("t/u")));
+    EXPECT_EQ(FileSystem::GetUniqueTemporaryFilename("f"), At("t/u/f"));
+    FileSystem::SetTemporaryDirectory("");
+    EXPECT_EQ(FileSystem::GetTemporaryDirectory(), "");
+
+    EXPECT_EQ(FileSystem::GetFilename(FileSystem::GetExecutablePath()), "test_filesystem");
+    EXPECT_TRUE(FileSystem::IsDirectory(FileSystem::GetExecutableDirectory()));
+    EXPECT_TRUE(FileSystem::IsDirectory(FileSystem::GetCurrentDirectory()));
+    EXPECT_FALSE(FileSystem::GetHomeDirectory().IsEmpty());
+}
+
+TEST_F(FileSystemTest, FolderLosesItsFilesAndKeepsItsDirectories)
+{
+    MakeFolder("x/keep");
+    Make("x/a");
+    Make("outside");
+    MakeLink("x/link", "../outside");
+    EXPECT_TRUE(FileSystem::DeleteFilesFromFolder(At("x")));
+    EXPECT_FALSE(FileSystem::Exists(At("x/a")));
+    EXPECT_FALSE(FileSystem::Exists(At("x/link")));
+    EXPECT_TRUE(FileSystem::Exists(At("outside")));
+    EXPECT_TRUE(FileSystem::IsDirectory(At("x/keep")));
+    EXPECT_FALSE(FileSystem::DeleteFilesFromFolder(At("missing")));
+}
+
+} // namespace
+} // namespace Kernel
