@@ -64,6 +64,7 @@
 #include "libkernel/filesystem/TempFile.h"
 #include "libkernel/platform/Debug.h"
 #include "libkernel/platform/Errors.h"
+#include "libkernel/platform/FileMarks.h"
 #include "libkernel/platform/Lock.h"
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/platform/Random.h"

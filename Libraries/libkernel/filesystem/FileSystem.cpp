@@ -9,6 +9,7 @@
 #include "libkernel/filesystem/internal/SystemFiles.h"
 #include "libkernel/platform/Errors.h"
 #include "libkernel/platform/FileMarks.h"
+#include "libkernel/streams/File.h"
 
 #include <algorithm>
 #include <cstring>
@@ -152,7 +153,7 @@ bool FileSystem::HasPermissionError(String8 const& path)
 {
     FileDetail::OpenFile file;
     int const error = file.Open(path, {.read = true});
-    return error == EPERM || (error == EACCES && Exists(path));
+    return error != 0 && File::TranslateOpenError(error, path.GetData()) == File::OpenUnmanagedResult::NotPermitted;
 }
 
 bool FileSystem::IsSameFile(String8 const& a, String8 const& b)

@@ -1,6 +1,7 @@
 #include "libkernel/streams/File.h"
 
 #include "libkernel/platform/Errors.h"
+#include "libkernel/platform/FileMarks.h"
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/platform/StdioFile.h"
 #include "libkernel/platform/Time.h"
@@ -105,7 +106,8 @@ Result OpenPlatformFile(char const* path, Platform::OpenFlags flags, File::Share
 void HidePlatformFile(char const* path, File::VisibilityMode visibility)
 {
     // Where the file system has no attributes the file stays visible.
-    if (visibility == File::VisibilityMode::Hidden) Platform::GetFileCalls().setAttribute(path, "hidden", "1", 1);
+    if (visibility == File::VisibilityMode::Hidden)
+        Platform::GetFileCalls().setAttribute(path, Platform::c_hiddenAttribute, "1", 1);
 }
 
 File::~File()

@@ -1,0 +1,247 @@
+#include "libkernel/filesystem/TempFile.h"
+
+#include "libkernel/filesystem/FileSystem.h"
+#include "libkernel/platform/Errors.h"
+#include "libkernel/streams/FileInOutStream.h"
+#include "libkernel/streams/FileOutStream.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace Kernel {
+namespace {
+
+using TestSupport::FaultyFiles;
+using TestSupport::FileCall;
+using TestSupport::ReadWholeFile;
+using TestSupport::TempFolder;
+using TestSupport::WriteWholeFile;
+
+String8 S(std::string const& text)
+{
+    return String8{std::string_view(text)};
+}
+
+/// The first bytes of an archive with the given version and flags.
+std::string Header(int version, int flags)
+{
+    return {'\0', '\xFF', 'K', 'A', char(version), '\0', char(flags), '\0', 'd', 'n', 'i', 'k'};
+}
+
+class TempFileTest : public testing::Test
+{
+protected:
+    TempFileTest()
+    {
+        std::vector<String8> rescued;
+        TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
+    }
+    ~TempFileTest() override
+    {
+        std::vector<String8> rescued;
+        TempFile::SetTempPath("", "", rescued);
+    }
+
+    /// The counter of a generated path.
+    static u64 CounterOf(String8 const& path)
+    {
+        return std::stoull(FileSystem::GetFilename(path).GetData(), nullptr, 16);
+    }
+    TempFolder m_first, m_second;
+};
+
+TEST_F(TempFileTest, NamesCountUpInHexadecimalAndEndInTheExtension)
+{
+    String8 a, b, c, d;
+    ASSERT_TRUE(TempFile::GenerateTempFilePath(a, ""));
+    ASSERT_TRUE(TempFile::GenerateTempFilePath(b, "tmp"));
+    ASSERT_TRUE(TempFile::GenerateTempFilePath(c, ".tmp"));
+    ASSERT_TRUE(TempFile::GenerateTempFilePath(d, "", TempFile::c_second));
+    EXPECT_TRUE(a.BeginsWith(S(m_first.GetPath() + "/")));
+    EXPECT_TRUE(d.BeginsWith(S(m_second.GetPath() + "/")));
+    EXPECT_EQ(CounterOf(b), CounterOf(a) + 1);
+    EXPECT_EQ(CounterOf(d), CounterOf(a) + 3);
+    for (String8 const& path : {b, c}) {
+        std::string const name = FileSystem::GetFilename(path).GetData();
+        EXPECT_EQ(name.find(".tmp"), name.size() - 4);
+        EXPECT_EQ(name.find_first_not_of("0123456789abcdef"), name.size() - 4);
+    }
+    EXPECT_FALSE(FileSystem::Exists(a));
+}
+
+TEST_F(TempFileTest, NothingIsMadeWithoutTheFolderAskedFor)
+{
+    String8 out = "untouched";
+    std::vector<String8> rescued;
+    EXPECT_TRUE(TempFile::HaveTempPath());
+    TempFile::SetTempPath(S(m_first.GetPath()), "", rescued);
+    EXPECT_TRUE(TempFile::GenerateTempInOutFile(out, "x"));
+    out = "untouched";
+    EXPECT_FALSE(TempFile::GenerateTempFilePath(out, "", TempFile::c_second));
+    EXPECT_FALSE(TempFile::GenerateTempInOutFile(out, "", TempFile::c_second));
+    TempFile::SetTempPath("", S(m_second.GetPath()), rescued);
+    EXPECT_FALSE(TempFile::HaveTempPath());
+    EXPECT_FALSE(TempFile::GenerateTempOutFile(out, ""));
+    EXPECT_FALSE(TempFile::GenerateTempOutFile(out, "", TempFile::c_second));
+    EXPECT_EQ(out, "untouched");
+}
+
+TEST_F(TempFileTest, MadeFilesAreNewEmptyAndOpen)
+{
+    String8 both, out;
+    Counted<FileInOutStream> const stream = TempFile::GenerateTempInOutFile(both, "t");
+    ASSERT_TRUE(stream);
+    EXPECT_EQ(FileSystem::GetFileSize(both), 0);
+    char text[3] = {};
+    EXPECT_EQ(stream->WriteBlock("abc", 3), 3u);
+    EXPECT_TRUE(stream->SeekInStream(SeekMethod::Beginning, 0));
+    EXPECT_EQ(stream->ReadBlock(text, 3), 3u);
+    EXPECT_EQ(std::string(text, 3), "abc");
+
+    Counted<FileOutStream> const writer = TempFile::GenerateTempOutFile(out, "t");
+    ASSERT_TRUE(writer);
+    EXPECT_EQ(writer->WriteBlock("abc", 3), 3u);
+    EXPECT_TRUE(writer->Close());
+    EXPECT_EQ(ReadWholeFile(out.GetData()), "abc");
+}
+
+TEST_F(TempFileTest, TakenNamesArePassedOverAndLeftAlone)
+{
+    // Of the next names one is a file, one a link to a document, one a link that leads nowhere, one a folder.
+    TempFolder elsewhere;
+    WriteWholeFile(elsewhere / "document", "precious");
+    enum Maker
+    {
+        Path,
+        InOut,
+        Out
+    };
+    for (Maker maker : {Path, InOut, Out}) {
+        SCOPED_TRACE(int(maker));
+        String8 last;
+        ASSERT_TRUE(TempFile::GenerateTempFilePath(last, ""));
+        u64 const next = CounterOf(last) + 1;
+        auto const at = [&](u64 i) {
+            char text[17];
+            std::snprintf(text, sizeof text, "%llx", static_cast<unsigned long long>(next + i));
+            return m_first / text;
+        };
+        WriteWholeFile(at(0), "file");
+        std::filesystem::create_symlink(elsewhere / "document", at(1));
+        std::filesystem::create_symlink(elsewhere / "nothing", at(2));
+        std::filesystem::create_directory(at(3));
+        if (maker == Path) {
+            ASSERT_TRUE(TempFile::GenerateTempFilePath(last, ""));
+        }
+        if (maker == InOut) {
+            auto const stream = TempFile::GenerateTempInOutFile(last, "");
+            ASSERT_TRUE(stream);
+            stream->WriteBlock("x", 1);
+        }
+        if (maker == Out) {
+            auto const stream = TempFile::GenerateTempOutFile(last, "");
+            ASSERT_TRUE(stream);
+            stream->WriteBlock("x", 1);
+        }
+        EXPECT_EQ(last, S(at(4)));
+        EXPECT_EQ(ReadWholeFile(at(0)), "file");
+        EXPECT_EQ(ReadWholeFile(elsewhere / "document"), "precious");
+        EXPECT_FALSE(FileSystem::Exists(S(elsewhere / "nothing")));
+    }
+}
+
+TEST_F(TempFileTest, FullDiskAndTooManyFilesEndTheSearchAtOnce)
+{
+    FaultyFiles faults;
+    String8 out;
+    for (int error : {EMFILE, ENFILE, ENOSPC}) {
+        faults.Clear();
+        faults.ResetCounts();
+        faults.Plan({.call = FileCall::Open, .forEver = true, .error = error});
+        EXPECT_FALSE(TempFile::GenerateTempInOutFile(out, ""));
+        EXPECT_FALSE(TempFile::GenerateTempOutFile(out, ""));
+        EXPECT_EQ(faults.GetCount(FileCall::Open), 2);
+    }
+    faults.Clear();
+    faults.Plan({.call = FileCall::Open, .n = 1, .error = EACCES});
+    EXPECT_TRUE(TempFile::GenerateTempInOutFile(out, ""));
+    faults.Clear();
+    faults.Plan({.call = FileCall::Open, .forEver = true, .error = EROFS});
+    EXPECT_FALSE(TempFile::GenerateTempInOutFile(out, ""));
+    EXPECT_FALSE(TempFile::GenerateTempOutFile(out, ""));
+    EXPECT_EQ(faults.GetOpenHandles(), 0);
+}
+
+TEST_F(TempFileTest, ThreadsNeverGetOneName)
+{
+    constexpr int c_threads = 4, c_names = 200;
+    std::vector<std::vector<String8>> names(c_threads);
+    std::vector<std::thread> threads;
+    for (auto& mine : names)
+        threads.emplace_back([&mine] {
+            for (int i = 0; i < c_names; ++i) {
+                String8 path;
+                if (i % 2 == 0)
+                    TempFile::GenerateTempFilePath(path, "n");
+                else
+                    TempFile::GenerateTempOutFile(path, "n");
+                mine.push_back(path);
+            }
+        });
+    for (auto& thread : threads) thread.join();
+    std::set<String8> all;
+    for (auto const& mine : names) all.insert(mine.begin(), mine.end());
+    EXPECT_EQ(all.size(), size_t(c_threads * c_names));
+}
+
+TEST_F(TempFileTest, StartEmptiesTheFoldersButKeepsMidStreamlineFiles)
+{
+    WriteWholeFile(m_first / "left", Header(11, 4));
+    std::filesystem::create_directory(m_first / "folder");
+    WriteWholeFile(m_second / "junk", "junk");
+    std::filesystem::create_directory(m_second / "folder");
+    WriteWholeFile(m_second / "rescue", Header(11, 5) + "more");
+    std::vector<String8> rescued = {"before"};
+    TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
+    EXPECT_EQ(rescued, (std::vector<String8>{"before", S(m_second / "rescue")}));
+    EXPECT_TRUE(FileSystem::Exists(S(m_second / "rescue")));
+    EXPECT_FALSE(FileSystem::Exists(S(m_second / "junk")));
+    EXPECT_FALSE(FileSystem::Exists(S(m_first / "left")));
+    EXPECT_TRUE(FileSystem::IsDirectory(S(m_first / "folder")));
+    EXPECT_TRUE(FileSystem::IsDirectory(S(m_second / "folder")));
+}
+
+TEST_F(TempFileTest, MidStreamlineMarkIsReadFromAWholeHeaderOnly)
+{
+    struct Case
+    {
+        char const* what;
+        std::string content;
+        bool isMarked;
+    };
+    Case const cases[] = {
+        {"marked", Header(11, 4), true},
+        {"oldest version", Header(7, 4 | 1), true},
+        {"other flags", Header(11, 1 | 2 | 8), false},
+        {"version too low", Header(6, 4), false},
+        {"version too high", Header(12, 4), false},
+        {"wrong magic", "x" + Header(11, 4).substr(1), false},
+        {"cut short", Header(11, 4).substr(0, 11), false},
+        {"empty", "", false},
+    };
+    for (Case const& c : cases) {
+        WriteWholeFile(m_first / "file", c.content);
+        EXPECT_EQ(TempFile::IsMidStreamlineFile(S(m_first / "file")), c.isMarked) << c.what;
+    }
+    EXPECT_FALSE(TempFile::IsMidStreamlineFile(S(m_first / "missing")));
+    EXPECT_FALSE(TempFile::IsMidStreamlineFile(S(m_first.GetPath())));
+}
+
+} // namespace
+} // namespace Kernel
