@@ -2,6 +2,7 @@
 
 #include "libkernel/filestore/VoidFileStore.h"
 #include "libkernel/serialisation/FutureVersionException.h"
+#include "libkernel/serialisation/PropertyStreamDump.h"
 #include "libkernel/streams/MemoryStreams.h"
 #include "serialisation/ReaderClasses.h"
 #include "support/ScriptedInStream.h"
@@ -111,6 +112,25 @@ TEST(InSerialiserFileTest, StreamIsLeftJustBehindTheList)
         char behind[16] = {};
         EXPECT_EQ(in->ReadBlock(behind, 15), 15u);
         EXPECT_STREQ(behind, "behind the list");
+    }
+}
+
+TEST(InSerialiserFileTest, SkippingAndLookingLeaveTheStreamJustBehindTheListToo)
+{
+    PropertyBytes b;
+    b.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").Append(EveryValueForm()).Item(0x2D, "Last").U32(1).U8(5);
+    b.End().End();
+    size_t const size = b.bytes.size();
+    b.Text("behind");
+    for (Delivery delivery : c_deliveries) {
+        Counted<InStream> const skipped = Deliver(b.bytes, delivery);
+        ASSERT_TRUE(InSerialiserFile::ParseSkipUnknownClasses(*skipped));
+        EXPECT_EQ(GetTaken(*skipped), size);
+        Counted<InStream> const looked = Deliver(b.bytes, delivery);
+        PropertyStreamReport const report = CheckPropertyStream(*looked);
+        ASSERT_TRUE(report.IsGood()) << report.reason.GetData();
+        EXPECT_EQ(report.offset, size);
+        EXPECT_EQ(GetTaken(*looked), size);
     }
 }
 

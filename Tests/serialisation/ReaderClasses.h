@@ -5,6 +5,7 @@
 #include "libkernel/serialisation/OutSerialiser.h"
 #include "libkernel/serialisation/Serialisable.h"
 #include "libkernel/serialisation/SharedSerialisable.h"
+#include "libkernel/streams/InStream.h"
 #include "support/PropertyBytes.h"
 
 #include <vector>

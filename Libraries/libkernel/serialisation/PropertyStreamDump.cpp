@@ -206,7 +206,7 @@ private:
             u64 const at = m_source.GetTaken();
             u8 typeByte = 0;
             IDTag tag;
-            if (!Number(typeByte, "a property list")) return false;
+            if (!m_source.ReadItemByte(typeByte)) return EndsIn("a property list");
             if (typeByte == 0) break;
             if (!IsKnownWireType(typeByte))
                 return Fail(Result::Newer, at, FormatT<String8>("unknown property type %1", GetWireType(typeByte)));
@@ -244,7 +244,7 @@ private:
         if (!m_source.Fill(headerSize)) return EndsIn("the header of a value");
         WireHeader const header = DecodeWireHeader(typeByte, m_source.GetAt());
         m_source.Take(headerSize);
-        if (!Fits(header.payload, at, "a value")) return false;
+        if (headerSize > 0 && !Fits(header.payload, at, "a value")) return false;
         bool const isTexts = c_wireTypes[GetWireType(typeByte)].form == WireForm::String && IsWireArray(typeByte);
         if (!item) return isTexts ? SkipTexts(at, header) : m_source.Skip(header.payload) || EndsIn("a value");
         m_pool.GiveBack({});
@@ -282,7 +282,7 @@ private:
         for (;;) {
             u64 const at = m_source.GetTaken();
             u8 typeByte = 0;
-            if (!Number(typeByte, "a data stream")) return false;
+            if (!m_source.ReadItemByte(typeByte)) return EndsIn("a data stream");
             if (typeByte == 0) break;
             if (!IsLegalInDataStream(typeByte))
                 return Damage(at, FormatT<String8>("type byte %1 can't stand in a data stream", typeByte));

@@ -64,7 +64,8 @@ u8* InSerialiserDataPool::Tail::Extend(u64 count)
     u64 const used = bucket ? static_cast<u64>(bucket->m_free - m_start) : 0;
     u64 const needed = padded & ~u64(7);
     if (!bucket || needed - used > bucket->m_left) {
-        u64 const capacity = std::max(needed, std::min(2 * needed, needed + c_unsizedReadAhead));
+        // Ahead of the bytes there are, not of those that were only promised.
+        u64 const capacity = std::max(needed, used + std::min(used, c_unsizedReadAhead));
         if (bucket && m_start == bucket->m_block) {
             u8* const moved = static_cast<u8*>(std::realloc(bucket->m_block, capacity));
             if (!moved) return nullptr;

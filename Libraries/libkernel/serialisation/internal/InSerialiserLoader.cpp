@@ -104,7 +104,7 @@ bool InSerialiserLoader::ParseProperties()
     for (;;) {
         OwnedProperty owned;
         u8 typeByte = 0;
-        if (!m_source.ReadNumber(typeByte)) return false;
+        if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) return true;
         owned.property.typeByte = typeByte;
         if (!ParseProperty(owned.property)) return false;
@@ -249,7 +249,7 @@ bool InSerialiserLoader::ParseDataStream(InSerialiserProperty& property)
     m_source.OpenList();
     for (;;) {
         u8 typeByte = 0;
-        if (!m_source.ReadNumber(typeByte)) return false;
+        if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) break;
         if (!IsLegalInDataStream(typeByte)) return false;
         u32 const headerSize = GetWireHeaderSize(typeByte);

@@ -343,7 +343,7 @@ bool InSerialiserLoader::ParseDefaults(InSerialiserClassInfoBase& info)
     m_source.OpenList();
     for (;;) {
         OwnedProperty item;
-        if (!m_source.ReadNumber(item.property.typeByte)) return false;
+        if (!m_source.ReadItemByte(item.property.typeByte)) return false;
         if (item.property.typeByte == 0) break;
         if (!ParseProperty(item.property)) return false;
         info.AddDefault(item.property);

@@ -13,7 +13,7 @@ bool InSerialiserLoader::SkipProperties()
     for (;;) {
         u8 typeByte = 0;
         u32 tag = 0;
-        if (!m_source.ReadNumber(typeByte)) return false;
+        if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) return true;
         if (!IsKnownWireType(typeByte)) {
             Trace(FormatT<String8>(">>> Use of unknown prop type: %1\n", GetWireType(typeByte)));
@@ -63,7 +63,7 @@ bool InSerialiserLoader::SkipDataStream()
     m_source.OpenList();
     for (;;) {
         u8 typeByte = 0;
-        if (!m_source.ReadNumber(typeByte)) return false;
+        if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) break;
         if (!IsLegalInDataStream(typeByte) || !SkipPayload(typeByte)) return false;
     }

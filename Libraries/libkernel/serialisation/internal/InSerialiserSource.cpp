@@ -40,14 +40,15 @@ u64 InSerialiserSource::Fetch(u8* to, u64 count)
     return got;
 }
 
-bool InSerialiserSource::FillSlow(u64 count)
+// Behind the @p count bytes that are wanted, @p sure more must follow in any sound stream.
+bool InSerialiserSource::FillSlow(u64 count, u64 sure)
 {
     if (m_inPlace) return false;
     if (!m_buffer) m_buffer = std::make_unique_for_overwrite<u8[]>(c_blockSize);
     u64 have = static_cast<u64>(m_end - m_at);
     std::memmove(m_buffer.get(), m_at, have);
     m_at = m_buffer.get();
-    u64 const wanted = m_seekable ? c_blockSize : std::min<u64>(count + m_openLists, c_blockSize);
+    u64 const wanted = m_seekable ? c_blockSize : std::min<u64>(count + sure, c_blockSize);
     while (have < count) {
         u64 const got = Fetch(m_buffer.get() + have, wanted - have);
         if (got == 0) break;
@@ -65,7 +66,7 @@ bool InSerialiserSource::ReadSlow(u8* to, u64 count)
     to += have;
     count -= have;
     if (count <= c_blockSize / 2) {
-        if (!FillSlow(count)) return false;
+        if (!FillSlow(count, m_openLists)) return false;
         std::memcpy(to, m_at, count);
         m_at += count;
         return true;
@@ -88,7 +89,7 @@ bool InSerialiserSource::Skip(u64 count)
     if (count == 0) return true;
     // Small gaps are cheaper to read over than to seek over.
     if (count <= c_blockSize / 2) {
-        if (!FillSlow(count)) return false;
+        if (!FillSlow(count, m_openLists)) return false;
         m_at += count;
         return true;
     }

@@ -41,10 +41,17 @@ public:
         m_at += sizeof(T);
         return true;
     }
+    /// The first byte of the next item of the innermost open list, or the 0 that closes it.
+    bool ReadItemByte(u8& value)
+    {
+        if (m_at == m_end && !FillSlow(1, m_openLists - 1)) return false;
+        value = *m_at++;
+        return true;
+    }
     bool Skip(u64 count);
 
     /// Makes @p count bytes, at most c_blockSize, readable at GetAt.
-    bool Fill(u64 count) { return count <= static_cast<u64>(m_end - m_at) || FillSlow(count); }
+    bool Fill(u64 count) { return count <= static_cast<u64>(m_end - m_at) || FillSlow(count, m_openLists); }
     u8 const* GetAt() const { return m_at; }
     /// Takes @p count bytes that Fill has made readable.
     void Take(u64 count) { m_at += count; }
@@ -73,7 +80,7 @@ public:
 
 private:
     bool ReadSlow(u8* to, u64 count);
-    bool FillSlow(u64 count);
+    bool FillSlow(u64 count, u64 sure);
     u64 Fetch(u8* to, u64 count);
 
     InStream& m_in;
