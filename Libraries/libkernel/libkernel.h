@@ -1,6 +1,14 @@
 #pragma once
 
 // Every public header of the library. Scripts/check keeps this list whole.
+#include "libkernel/archive/Archive.h"
+#include "libkernel/archive/ArchiveCreateResult.h"
+#include "libkernel/archive/ArchiveErrorCallback.h"
+#include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/archive/ArchiveReferenceInfo.h"
+#include "libkernel/archive/ArchiveRevision.h"
+#include "libkernel/archive/ArchiveSession.h"
+#include "libkernel/archive/ArchiveThumbnails.h"
 #include "libkernel/concurrency/CriticalSection.h"
 #include "libkernel/concurrency/Dispatch.h"
 #include "libkernel/concurrency/MultiSemaphore.h"

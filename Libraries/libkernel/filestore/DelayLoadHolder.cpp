@@ -224,6 +224,14 @@ void DelayLoadHolder::UpdateOwner(FileStoreLink& link, NonCounted<FileStoreRevis
     if (Owner* const owner = m_owners.Find(&link)) owner->revision = revision;
 }
 
+void DelayLoadHolder::MoveOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> from,
+                                NonCounted<FileStoreRevision const> to)
+{
+    CriticalSectionSpinScope const scope(m_ownersLock);
+    Owner* const owner = m_owners.Find(&link);
+    if (owner && owner->valid && owner->revision == from) owner->revision = to;
+}
+
 DelayLoadHolder::Owner DelayLoadHolder::FindOrCreateOwner(FileStoreLink& link, String8 const& path)
 {
     CriticalSectionSpinScope const scope(m_ownersLock);

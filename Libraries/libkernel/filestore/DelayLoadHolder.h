@@ -143,6 +143,8 @@ private:
     // not wait for a load that may be waiting for the store.
     void SetOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> revision, String8 const& path, bool valid);
     void UpdateOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> revision);
+    void MoveOwner(FileStoreLink& link, NonCounted<FileStoreRevision const> from,
+                   NonCounted<FileStoreRevision const> to);
     Owner FindOrCreateOwner(FileStoreLink& link, String8 const& path);
     bool IsOwnedAt(FileStoreLink const& link, std::set<NonCounted<FileStoreRevision const>> const& revisions) const;
     /// The store goes away.

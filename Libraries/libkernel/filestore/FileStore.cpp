@@ -95,6 +95,18 @@ void FileStore::UpdateDelayLoadOwners(NonCounted<FileStoreRevision const> revisi
     for (auto const& [holder, key] : m_pathOfHolder) holder->UpdateOwner(*m_link, revision);
 }
 
+void FileStore::MoveDelayLoadOwners(NonCounted<FileStoreRevision const> revision,
+                                    std::unordered_map<String8, NonCounted<FileStoreRevision const>> const& moved)
+{
+    if (moved.empty()) return;
+    CriticalSectionSpinScope const scope(m_storeLock);
+    ++m_ownerChanges;
+    for (auto const& [path, from] : moved) {
+        auto const found = m_holderOfPath.find(PathKey(path));
+        if (found != m_holderOfPath.end()) found->second->MoveOwner(*m_link, from, revision);
+    }
+}
+
 void FileStore::DelayLoadHolderDestroyed(DelayLoadHolder& holder)
 {
     CriticalSectionSpinScope const scope(m_storeLock);

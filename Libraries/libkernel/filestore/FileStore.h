@@ -74,6 +74,10 @@ protected:
                            String8 const& path);
     /// Moves every holder of this store to @p revision.
     void UpdateDelayLoadOwners(NonCounted<FileStoreRevision const> revision);
+    /// The bytes of each path now lie at @p revision: the holder that has the path at the revision given with it moves
+    /// there. For a store that copies bytes of a revision it is about to drop.
+    void MoveDelayLoadOwners(NonCounted<FileStoreRevision const> revision,
+                             std::unordered_map<String8, NonCounted<FileStoreRevision const>> const& moved);
     /// Removes a holder from the maps.
     void DelayLoadHolderDestroyed(DelayLoadHolder& holder);
     /// Erases the states for this store of those items at @p paths that holders have in memory.

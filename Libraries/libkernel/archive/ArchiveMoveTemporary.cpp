@@ -1,0 +1,78 @@
+#include "libkernel/archive/internal/ArchiveImpl.h"
+#include "libkernel/core/NumberText.h"
+#include "libkernel/filesystem/FileSystem.h"
+#include "libkernel/platform/PlatformFile.h"
+#include "libkernel/streams/FileIOException.h"
+
+namespace Kernel {
+
+namespace {
+
+constexpr int c_renameRetries = 2;
+
+/// A name beside @p path at which nothing stands; empty to go without a backup.
+String8 FindBackupName(String8 const& path)
+{
+    constexpr int c_notFound = 2;
+    constexpr int c_readOnlyVolume = 11;
+    constexpr int c_maxDoubtful = 10;
+    int doubtful = 0;
+    for (u32 n = 1;; ++n) {
+        String8 candidate = path + "~backup";
+        if (n > 1) candidate += ToString(n);
+        File::OpenUnmanagedResult result{};
+        if (FileInOutStream::OpenReadOnly(candidate.GetData(), File::ShareMode::DenyNone, result, nullptr)) continue;
+        int const value = static_cast<int>(result);
+        if (value == c_notFound) return candidate;
+        if (value == c_readOnlyVolume || ++doubtful == c_maxDoubtful) return String8();
+    }
+}
+
+ArchiveFileException::Reason ReasonOf(FileSystem::SafeMoveFileResult result)
+{
+    switch (static_cast<int>(result)) {
+    case 1: return ArchiveFileException::Reason::AccessDenied;
+    case 2: return ArchiveFileException::Reason::PermissionDenied;
+    case 3: return ArchiveFileException::Reason::OutOfSpace;
+    default: return ArchiveFileException::Reason::FileError;
+    }
+}
+
+} // namespace
+
+void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
+{
+    CriticalSectionScope const lock(file.m_lock);
+    String8 const final = file.m_finalPath;
+    file.m_targetStream = nullptr;
+    file.m_stream = nullptr;
+
+    String8 backup;
+    if (!file.m_backupPath.IsEmpty())
+        backup = file.m_backupPath;
+    else if (file.m_keepBackup && FileSystem::Exists(final))
+        backup = FindBackupName(final);
+    if (!backup.IsEmpty() && !FileSystem::RenameFile(final, backup, c_renameRetries)) backup = String8();
+
+    FileSystem::SafeMoveFileResult const moved = FileSystem::SafeMoveFileAdv(file.m_path, final, 0);
+    if (static_cast<int>(moved) != 0) {
+        if (!backup.IsEmpty()) FileSystem::RenameFile(backup, final, c_renameRetries);
+        // The temporary holds the save and stays usable where it is.
+        File::OpenUnmanagedResult result{};
+        file.m_stream = FileInOutStream::Open(file.m_path.GetData(), File::ShareMode::DenyWrite, result, nullptr);
+        ThrowFileException(file, ReasonOf(moved));
+    }
+    {
+        CriticalSectionScope const state(m_stateLock);
+        file.m_path = final;
+        file.m_finalPath = String8();
+    }
+    if (!backup.IsEmpty()) FileSystem::Delete(backup, 0);
+    FileSystem::SetFileHidden(final, false);
+
+    File::OpenUnmanagedResult result{};
+    file.m_stream = FileInOutStream::Open(final.GetData(), File::ShareMode::DenyWrite, result, nullptr);
+    if (!file.m_stream) ThrowFileException(file, ArchiveFileException::Reason::FileError);
+}
+
+} // namespace Kernel

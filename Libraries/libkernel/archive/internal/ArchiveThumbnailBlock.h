@@ -1,0 +1,13 @@
+#pragma once
+
+#include "libkernel/archive/internal/ArchiveFile.h"
+
+namespace Kernel {
+
+class OutStream;
+
+/// Copies the thumbnail block of @p file to @p out through @p buffer of @p size bytes. A fault ends the copy without a
+/// word.
+void CopyThumbnails(OutStream& out, Archive::ArchiveFile& file, void* buffer, u64 size);
+
+} // namespace Kernel

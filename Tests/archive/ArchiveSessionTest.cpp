@@ -1,0 +1,397 @@
+#include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/streams/FileInOutStream.h"
+#include "libkernel/streams/OutStream.h"
+#include "support/ArchiveFixture.h"
+#include "support/TempFolder.h"
+
+#include <gtest/gtest.h>
+#include <thread>
+
+namespace KernelTest {
+namespace {
+
+using namespace Kernel;
+
+class ArchiveSessionTest : public testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        m_archive = CreateDocument(m_path);
+        ASSERT_TRUE(m_archive);
+    }
+    void AddScratch()
+    {
+        Archive::CreateResult result;
+        ASSERT_TRUE(m_archive->AddScratchFile(Str(m_scratchPath), result));
+    }
+    void Reopen(std::string const& path)
+    {
+        m_archive = nullptr;
+        m_archive = OpenDocument(path);
+        ASSERT_TRUE(m_archive);
+    }
+
+    TestSupport::TempFolder m_folder;
+    std::string const m_path = m_folder / "doc";
+    std::string const m_scratchPath = m_folder / "doc.scratch";
+    Counted<Archive> m_archive;
+};
+
+TEST_F(ArchiveSessionTest, ClosingWithoutChangesWritesNothing)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    std::string before = ReadWhole(m_path);
+    Archive::FileState const state = StateOf(*m_archive);
+    ASSERT_TRUE(Save(*m_archive, {}));
+    ASSERT_TRUE(Save(*m_archive, {{"never there", std::nullopt}}));
+    EXPECT_EQ(StateOf(*m_archive).saveCount, state.saveCount);
+    EXPECT_EQ(StateOf(*m_archive).fileEnd, state.fileEnd);
+    std::string after = ReadWhole(m_path);
+    before.replace(68, 4, "????");
+    after.replace(68, 4, "????");
+    EXPECT_EQ(before, after);
+}
+
+TEST_F(ArchiveSessionTest, WhatWasSavedReadsBackAfterReopening)
+{
+    std::string const large(3'000'000, 'x');
+    std::string noise(2'500'000, 0);
+    u32 seed = 1;
+    for (char& c : noise) c = static_cast<char>((seed = seed * 1664525 + 1013904223) >> 24);
+    Changes const items = {{"small", "1"}, {"deep/er", "2"}, {"large", large}, {"noise", noise}, {"empty", ""}};
+    ASSERT_TRUE(Save(*m_archive, items));
+    ASSERT_TRUE(Save(*m_archive, {{"packed", large}, {"packed noise", noise}}, false, Archive::SessionTypeFull, true));
+    Reopen(m_path);
+    for (auto const& [path, bytes] : items) EXPECT_EQ(Get(*m_archive, path), bytes) << path;
+    EXPECT_EQ(Get(*m_archive, "packed"), large);
+    EXPECT_EQ(Get(*m_archive, "packed noise"), noise);
+    EXPECT_LT(StateOf(*m_archive).totalBytes, 2 * noise.size() + large.size() + 10000);
+}
+
+TEST_F(ArchiveSessionTest, WrittenDeletedAndWrittenAgainLeavesTheLastAndCountsTheFirstAsDead)
+{
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("first"));
+    handle->DeleteFile(Str("a"));
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("second!"));
+    m_archive->CloseSession(handle, false);
+    EXPECT_EQ(Get(*m_archive, "a"), "second!");
+    EXPECT_EQ(StateOf(*m_archive).totalBytes, 12u);
+    EXPECT_EQ(StateOf(*m_archive).deadBytes, 5u);
+}
+
+TEST_F(ArchiveSessionTest, FileThatWasDeletedComesBackUnderItsOldIdentifier)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}, {"b", "1"}}));
+    u32 const uid = m_archive->GetFileInfo(Str("a"))->GetUID();
+    ASSERT_TRUE(Save(*m_archive, {{"a", std::nullopt}}));
+    ASSERT_TRUE(Save(*m_archive, {{"a", "2"}}));
+    Reopen(m_path);
+    EXPECT_EQ(Get(*m_archive, "a"), "2");
+    EXPECT_EQ(m_archive->GetFileInfo(Str("a"))->GetUID(), uid);
+    EXPECT_EQ(StateOf(*m_archive).nextFreeUID, 3u);
+}
+
+TEST_F(ArchiveSessionTest, AbortedSessionCommitsNothing)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    bool abort = false;
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, &abort));
+    auto item = MakeCounted<BytesItem>("2");
+    item->onSave = [&](FileStoreOut&) { abort = true; };
+    EXPECT_THROW(handle->CreateFile(Str("a"), item), AbortException);
+    EXPECT_THROW(handle->CreateFile(Str("b"), MakeCounted<BytesItem>("3")), AbortException);
+    m_archive->CloseSession(handle, false);
+    EXPECT_FALSE(handle.IsValid());
+    EXPECT_EQ(Get(*m_archive, "a"), "1");
+    EXPECT_EQ(StateOf(*m_archive).saveCount, 2u);
+    Reopen(m_path);
+    EXPECT_EQ(GetAll(*m_archive), (std::map<std::string, std::string>{{"a", "1"}}));
+}
+
+TEST_F(ArchiveSessionTest, DroppedSessionIsOverwrittenByTheNext)
+{
+    {
+        ArchiveSessionHandle handle;
+        ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        handle->CreateFile(Str("lost"), MakeCounted<BytesItem>(std::string(5000, 'l')));
+    }
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    Reopen(m_path);
+    EXPECT_EQ(GetAll(*m_archive), (std::map<std::string, std::string>{{"a", "1"}}));
+    EXPECT_EQ(StateOf(*m_archive).firstFAT, 72u + 9);
+}
+
+TEST_F(ArchiveSessionTest, MasterSaveTakesTheNewestScratchVersionsAndEmptiesTheScratchFile)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"kept", "k"}, {"changed", "0"}, {"deleted", "d"}}));
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"changed", "1"}, {"passing", "p"}}, true));
+    ASSERT_TRUE(Save(*m_archive,
+                     {{"changed", "22"}, {"new", "n"}, {"deleted", std::nullopt}, {"passing", std::nullopt}}, true));
+    std::string const masterBefore = ReadWhole(m_path);
+    EXPECT_TRUE(m_archive->HaveScratchRevisions());
+
+    ASSERT_TRUE(Save(*m_archive, {{"extra", "e"}}));
+    std::map<std::string, std::string> const expected = {
+        {"kept", "k"}, {"changed", "22"}, {"new", "n"}, {"extra", "e"}};
+    EXPECT_EQ(GetAll(*m_archive), expected);
+    EXPECT_FALSE(m_archive->HaveScratchRevisions());
+    EXPECT_EQ(StateOf(*m_archive, Archive::ChoiceScratch).fileEnd, 86 + m_path.size());
+    EXPECT_EQ(StateOf(*m_archive, Archive::ChoiceScratch).firstFAT, 0u);
+
+    std::vector<Counted<Archive::Revision const>> revisions;
+    m_archive->GetRevisions(revisions);
+    ASSERT_EQ(revisions.size(), 2u);
+    auto const info = m_archive->GetFileInfo(Str("deleted"));
+    ASSERT_TRUE(info && revisions[1]->Find(*info));
+    EXPECT_TRUE(revisions[1]->Find(*info)->IsDeletion());
+    EXPECT_FALSE(m_archive->GetFileInfo(Str("passing")));
+    // "changed" was replaced once and "deleted" went: their old bytes are dead.
+    EXPECT_EQ(StateOf(*m_archive).deadBytes, 2u);
+
+    Reopen(m_scratchPath);
+    EXPECT_EQ(GetAll(*m_archive), expected);
+    Reopen(m_path);
+    EXPECT_EQ(GetAll(*m_archive), expected);
+}
+
+TEST_F(ArchiveSessionTest, EmptyMasterSaveStillMakesScratchRevisionsFinal)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"a", std::nullopt}}, true));
+    ASSERT_TRUE(Save(*m_archive, {}));
+    Reopen(m_path);
+    EXPECT_TRUE(GetAll(*m_archive).empty());
+}
+
+TEST_F(ArchiveSessionTest, ScratchFileOfAMasterThatMovedOnIsRefused)
+{
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}, true));
+    m_archive = nullptr;
+    EXPECT_TRUE(Archive::VerifyLinks(Str(m_scratchPath)));
+    ASSERT_TRUE(Save(*OpenDocument(m_path), {{"b", "1"}}));
+    EXPECT_EQ(ResultOfOpening(m_scratchPath), Archive::OpenLinkMismatch);
+    EXPECT_FALSE(Archive::VerifyLinks(Str(m_scratchPath)));
+    std::rename(m_path.c_str(), (m_path + "away").c_str());
+    EXPECT_EQ(ResultOfOpening(m_scratchPath), Archive::OpenLinkedNotFound);
+}
+
+TEST_F(ArchiveSessionTest, SecondWriterIsSeenBeforeAnythingIsWritten)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("2"));
+    std::string bytes = ReadWhole(m_path);
+    ++bytes[68];
+    std::fstream(m_path, std::ios::in | std::ios::out | std::ios::binary).seekp(68).put(bytes[68]);
+    try {
+        m_archive->CloseSession(handle, false);
+        FAIL() << "the foreign writer went unseen";
+    } catch (ArchiveFileException const& e) {
+        EXPECT_EQ(e.GetReason(), ArchiveFileException::Reason::OtherWriter);
+        EXPECT_EQ(e.GetWhatFile(), ArchiveFileException::WhatFile::Master);
+    }
+    EXPECT_EQ(ReadWhole(m_path), bytes);
+    ArchiveSessionHandle next;
+    EXPECT_EQ(m_archive->CreateSessionAdv(next, Archive::SessionTypeFull, nullptr, false),
+              Archive::SessionFileUnusable);
+    EXPECT_EQ(m_archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
+}
+
+TEST_F(ArchiveSessionTest, SecondOpenerForWritingIsRefusedAndReadsInMode2)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    EXPECT_EQ(ResultOfOpening(m_path), Archive::OpenReadOnlyArchive);
+    Counted<Archive> const reader = OpenDocument(m_path, Archive::OpenModeReadWriteOrReadOnly);
+    ASSERT_TRUE(reader);
+    EXPECT_TRUE(reader->IsReadOnly());
+    ArchiveSessionHandle handle;
+    EXPECT_EQ(reader->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false), Archive::SessionReadOnly);
+    EXPECT_EQ(Get(*reader, "a"), "1");
+}
+
+TEST_F(ArchiveSessionTest, RefusalsComeInTheirOrder)
+{
+    ArchiveSessionHandle handle;
+    EXPECT_FALSE(m_archive->CreateScratchSession(handle, Archive::SessionTypeFull, nullptr));
+    EXPECT_EQ(m_archive->CreateSessionAdv(handle, static_cast<Archive::SessionType>(4), nullptr, false),
+              Archive::SessionNoMemory);
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    EXPECT_EQ(m_archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
+              Archive::SessionHandleInUse);
+    ArchiveSessionHandle other;
+    EXPECT_EQ(m_archive->CreateSessionAdv(other, Archive::SessionTypeFull, nullptr, false), Archive::SessionActive);
+    handle.Release();
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    m_archive->RewindWorkingRevision();
+    EXPECT_EQ(m_archive->CreateSessionAdv(other, Archive::SessionTypeFull, nullptr, false), Archive::SessionNotAtHead);
+    EXPECT_THROW(m_archive->CloseSession(other, false), OutStream::WriteException);
+}
+
+TEST_F(ArchiveSessionTest, GeneratedPathsCountInReversedHexadecimalAndSurviveReopening)
+{
+    FileStoreOut::IndexedPathParts const parts{Str("img/"), Str(".png")};
+    auto const generate = [&](ArchiveSession& session, FileStoreItem const& item) {
+        String8 path;
+        EXPECT_TRUE(session.GenerateIndexedPath(parts, &item, nullptr, path));
+        return std::string(path.GetData());
+    };
+    std::vector<Counted<BytesItem>> items;
+    for (int i = 0; i < 20; ++i) items.push_back(MakeCounted<BytesItem>("x"));
+    {
+        ArchiveSessionHandle handle;
+        ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        String8 path;
+        EXPECT_FALSE(handle->GenerateIndexedPath(parts, nullptr, nullptr, path));
+        EXPECT_EQ(generate(*handle, *items[0]), "img/1.png");
+        EXPECT_EQ(generate(*handle, *items[0]), "img/1.png");
+        for (int i = 1; i < 16; ++i) path = Str(generate(*handle, *items[i]));
+        EXPECT_EQ(path, "img/01.png");
+        handle->CreateFile(path, items[15]);
+        m_archive->CloseSession(handle, false);
+    }
+    Reopen(m_path);
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    EXPECT_EQ(generate(*handle, *items[17]), "img/11.png");
+}
+
+TEST_F(ArchiveSessionTest, PathOf65535BytesIsSavedAndOneMoreIsRefused)
+{
+    std::string const longest(65535, 'p');
+    ASSERT_TRUE(Save(*m_archive, {{longest, "1"}}));
+    EXPECT_THROW(Save(*m_archive, {{longest + "p", "1"}}), OutStream::WriteException);
+    Reopen(m_path);
+    EXPECT_EQ(Get(*m_archive, longest), "1");
+}
+
+TEST_F(ArchiveSessionTest, ItemThatIsNotNestableMayNotNameFiles)
+{
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    auto item = MakeCounted<BytesItem>("1");
+    item->onSave = [&](FileStoreOut& out) { out.CreateFile(Str("inner"), MakeCounted<BytesItem>("2")); };
+    EXPECT_THROW(handle->CreateFile(Str("a"), item), NestedException);
+    EXPECT_THROW(m_archive->CloseSession(handle, false), OutStream::WriteException);
+    EXPECT_FALSE(handle.IsValid());
+    EXPECT_EQ(StateOf(*m_archive).saveCount, 1u);
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+}
+
+TEST_F(ArchiveSessionTest, ItemsAreWrittenByTheirStateForThisArchive)
+{
+    auto const item = MakeCounted<BytesItem>("1");
+    auto const save = [&](Archive::SessionType type) {
+        ArchiveSessionHandle handle;
+        m_archive->CreateSession(handle, type, nullptr);
+        handle->CreateFile(Str("a"), item);
+        m_archive->CloseSession(handle, false);
+        FileStoreStateObject::DirtyState state = FileStoreStateObject::DirtyStateFull;
+        item->GetDirtyStateForFileStore(*m_archive, state);
+        return std::make_pair(StateOf(*m_archive).saveCount, static_cast<int>(state));
+    };
+    using P = std::pair<u32, int>;
+    EXPECT_EQ(save(Archive::SessionTypeExport), P(2, 1));
+    EXPECT_EQ(save(Archive::SessionTypeIncremental), P(3, 2));
+    EXPECT_EQ(m_archive->GetLastSaveType(), Archive::RevisionTagIncremental);
+    EXPECT_EQ(save(Archive::SessionTypeIncremental), P(3, 2));
+    EXPECT_EQ(save(Archive::SessionTypeFull), P(4, 0));
+    EXPECT_EQ(save(Archive::SessionTypeFull), P(4, 0));
+    EXPECT_EQ(save(Archive::SessionTypeRewrite), P(5, 0));
+    item->MarkAsDirty();
+    EXPECT_EQ(save(Archive::SessionTypeFull), P(6, 0));
+}
+
+TEST_F(ArchiveSessionTest, StoredFilesMoveBetweenArchivesWithoutBeingUnpacked)
+{
+    std::string const bytes(200'000, 'q');
+    ASSERT_TRUE(Save(*m_archive, {{"img", bytes}}, false, Archive::SessionTypeFull, true));
+    Counted<DelayLoadHolder> const holder =
+        m_archive->CreateDelayLoadHolderDirect(Str("img"), &BytesItem::c_type, nullptr);
+    ASSERT_TRUE(holder);
+    std::string const otherPath = m_folder / "other";
+    Counted<Archive> other = CreateDocument(otherPath);
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(other->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->AddSourceArchive(m_archive);
+    handle->AssignDelayLoadHolderPath(holder, Str("moved"));
+    handle->CreateFile(holder);
+    other->CloseSession(handle, false);
+    EXPECT_FALSE(holder->IsLoaded());
+    EXPECT_TRUE(holder->IsBackedBy(*other));
+    EXPECT_EQ(Get(*other, "moved"), bytes);
+    EXPECT_EQ(StateOf(*other).totalBytes, StateOf(*m_archive).totalBytes);
+    // And nothing has to be written once it is there.
+    ASSERT_TRUE(other->CreateSession(handle, Archive::SessionTypeIncremental, nullptr));
+    handle->CreateFile(holder);
+    EXPECT_FALSE(handle->HasChanges());
+}
+
+TEST_F(ArchiveSessionTest, HolderRestingOnAScratchRevisionMovesWithItsBytes)
+{
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"img", "old bytes"}}, true));
+    Counted<DelayLoadHolder> const old =
+        m_archive->CreateDelayLoadHolderDirect(Str("img"), &BytesItem::c_type, nullptr);
+    ASSERT_TRUE(Save(*m_archive, {{"other", "1"}}));
+    EXPECT_FALSE(old->GetBackData());
+    JailCounted<FileStoreItem> item;
+    ASSERT_TRUE(old->GetItemBase(item) && item);
+    EXPECT_EQ(dynamic_cast<BytesItem&>(*item).bytes, "old bytes");
+}
+
+TEST_F(ArchiveSessionTest, ManyThreadsMayOfferFiles)
+{
+    constexpr int threads = 4;
+    constexpr int each = 50;
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    std::vector<std::thread> workers;
+    for (int t = 0; t < threads; ++t)
+        workers.emplace_back([&, t] {
+            for (int i = 0; i < each; ++i) {
+                std::string const name = std::to_string(t) + "/" + std::to_string(i);
+                handle->CreateFile(Str(name), MakeCounted<BytesItem>(name + std::string(1000, 'b')));
+            }
+        });
+    for (std::thread& worker : workers) worker.join();
+    m_archive->CloseSession(handle, false);
+    std::map<std::string, std::string> const all = GetAll(*m_archive);
+    ASSERT_EQ(all.size(), static_cast<size_t>(threads * each));
+    for (auto const& [name, bytes] : all) EXPECT_EQ(bytes, name + std::string(1000, 'b'));
+}
+
+TEST_F(ArchiveSessionTest, ReadersGoOnDuringSavesAndSeeWholeStates)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", std::string(100'000, '0')}, {"b", std::string(100'000, '0')}}));
+    std::atomic<bool> stop{false};
+    std::atomic<int> wrong{0};
+    std::vector<std::thread> readers;
+    for (int r = 0; r < 2; ++r)
+        readers.emplace_back([&] {
+            while (!stop.load()) {
+                std::optional<std::string> const bytes = Get(*m_archive, "a");
+                if (!bytes || bytes->find_first_not_of((*bytes)[0]) != std::string::npos) ++wrong;
+                Counted<InStream> const in = m_archive->OpenFileInStream(Str("b"));
+                std::string text(100'000, 0);
+                if (!in || in->ReadBlock(text.data(), text.size()) != text.size()) ++wrong;
+            }
+        });
+    for (int i = 0; i < 30; ++i) {
+        std::string const bytes(100'000, static_cast<char>('a' + i % 26));
+        ASSERT_TRUE(Save(*m_archive, {{"a", bytes}, {"b", bytes}}, false, Archive::SessionTypeFull, i % 2 == 0));
+    }
+    stop = true;
+    for (std::thread& reader : readers) reader.join();
+    EXPECT_EQ(wrong.load(), 0);
+}
+
+} // namespace
+} // namespace KernelTest
