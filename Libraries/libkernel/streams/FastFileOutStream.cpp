@@ -1,133 +1,53 @@
 #include "libkernel/streams/FastFileOutStream.h"
 
-#include "libkernel/streams/InStream.h"
 #include "libkernel/streams/internal/FileOpening.h"
-#include "libkernel/streams/internal/FileStreamCore.h"
+#include "libkernel/streams/internal/GenericCopy.h"
+#include "libkernel/streams/internal/MakeBuffer.h"
 
 #include <algorithm>
-#include <cstring>
-#include <new>
 
 namespace Kernel {
 
-FastFileOutStream::FastFileOutStream(int handle, std::unique_ptr<u8[]> buffer, u64 bufferSize)
-    : m_core(std::make_unique<FileStreamCore>(handle)), m_buffer(std::move(buffer)), m_bufferSize(bufferSize)
+FastFileOutStream::FastFileOutStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, u64 bufferSize,
+                                     Placement placement, u64 size)
+    : FileWriterBase(handle, std::move(buffer), bufferSize, placement, size)
 {
-    m_position = m_core->GetSize();
-    Platform::GetFileCalls().advise(handle, 0, 0, Platform::ReadAdvice::Sequential);
 }
 
-FastFileOutStream::~FastFileOutStream()
-{
-    m_core->SetErrorHandler(nullptr);
-    try {
-        Close();
-    } catch (FileIOException const&) {
-    }
-}
+FastFileOutStream::~FastFileOutStream() = default;
 
-Counted<FastFileOutStream> FastFileOutStream::OpenI(char const* path, u64 bufferSize, bool append)
+Counted<FastFileOutStream> FastFileOutStream::OpenI(char const* path, char const* mode, u64 bufferSize,
+                                                    Placement placement)
 {
-    if (!path) return nullptr;
+    // The buffer first: without memory for it the file must not be emptied.
     bufferSize = std::max(bufferSize, c_minBufferSize);
-    std::unique_ptr<u8[]> buffer(new (std::nothrow) u8[bufferSize]);
+    std::unique_ptr<u8[]> buffer = MakeBuffer(bufferSize);
     if (!buffer) return nullptr;
-    Platform::OpenFlags flags;
-    flags.write = flags.create = true;
-    flags.read = flags.append = append;
-    flags.truncate = !append;
-    Platform::FileHandle handle = Platform::c_noHandle;
-    OpenPlatformFile(path, flags, File::ShareMode::DenyNone, handle, nullptr);
-    if (handle == Platform::c_noHandle) return nullptr;
-    return Counted<FastFileOutStream>(new FastFileOutStream(handle, std::move(buffer), bufferSize));
+    Platform::FileHandle handle;
+    if (!File::IsOpened(OpenPlatformFile(path, mode, File::ShareMode::DenyNone, handle, nullptr))) return nullptr;
+    u64 size = 0;
+    if (placement == Placement::Append) Platform::GetFileCalls().getSize(handle, size);
+    return new FastFileOutStream(handle, std::move(buffer), bufferSize, placement, size);
 }
 
 Counted<FastFileOutStream> FastFileOutStream::Create(char const* path, u64 bufferSize)
 {
-    return OpenI(path, bufferSize, false);
+    return OpenI(path, "wbS", bufferSize, Placement::AtPosition);
 }
 
 Counted<FastFileOutStream> FastFileOutStream::Append(char const* path, u64 bufferSize)
 {
-    return OpenI(path, bufferSize, true);
+    return OpenI(path, "a+bS", bufferSize, Placement::Append);
 }
 
 u64 FastFileOutStream::WriteBlock(void const* from, u64 count)
 {
-    if (!m_core->IsUsable() || !from || count == 0) return 0;
-    u8 const* in = static_cast<u8 const*>(from);
-    u64 const fits = std::min(count, m_bufferSize - m_held);
-    std::memcpy(m_buffer.get() + m_held, in, fits);
-    m_held += fits;
-    m_position += fits;
-    u64 const rest = count - fits;
-    if (rest == 0) return count;
-    if (!DumpStream()) return 0;
-    if (rest >= m_bufferSize) {
-        u64 const put = m_core->Write(in + fits, rest);
-        m_position += put;
-        return fits + put;
-    }
-    std::memcpy(m_buffer.get(), in + fits, rest);
-    m_held = rest;
-    m_position += rest;
-    return count;
-}
-
-bool FastFileOutStream::DumpStream()
-{
-    if (m_held == 0) return true;
-    u64 const held = m_held;
-    if (m_core->Write(m_buffer.get(), held) != held) return false;
-    m_held = 0;
-    return true;
-}
-
-bool FastFileOutStream::Flush()
-{
-    return !m_core->IsUsable() || DumpStream();
-}
-
-bool FastFileOutStream::ForceFlush()
-{
-    return Flush() && m_core->FlushToDevice();
+    return WriteI(from, count);
 }
 
 bool FastFileOutStream::CopyFromStream(InStream& in, StreamCopyProgress* progress)
 {
-    return in.WillDelegateCopyToStream() ? OutStream::CopyFromStream(in, progress) : in.CopyToStream(*this, progress);
-}
-
-u64 FastFileOutStream::GetSizeOutStream() const
-{
-    return m_core->GetSize() + m_held;
-}
-
-void FastFileOutStream::SetErrorHandler(Counted<FileStreamErrorHandler> const& handler)
-{
-    m_core->SetErrorHandler(handler);
-}
-
-bool FastFileOutStream::Close()
-{
-    bool const flushed = Flush();
-    m_held = 0;
-    return m_core->Close() && flushed;
-}
-
-bool FastFileOutStream::IsClosed() const
-{
-    return m_core->IsClosed();
-}
-
-bool FastFileOutStream::IsBroken() const
-{
-    return m_core->IsBroken();
-}
-
-FileIOException::Reason FastFileOutStream::GetReason() const
-{
-    return m_core->GetReason();
+    return CopyToFile(in, *this, progress);
 }
 
 } // namespace Kernel

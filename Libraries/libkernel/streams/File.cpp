@@ -2,12 +2,15 @@
 
 #include "libkernel/platform/Errors.h"
 #include "libkernel/platform/FileMarks.h"
-#include "libkernel/platform/PlatformFile.h"
+#include "libkernel/platform/OpenFileLimit.h"
 #include "libkernel/platform/StdioFile.h"
 #include "libkernel/platform/Time.h"
+#include "libkernel/streams/FileIOException.h"
 #include "libkernel/streams/internal/FileOpening.h"
 
+#include <algorithm>
 #include <cstring>
+#include <iterator>
 #include <utility>
 
 namespace Kernel {
@@ -16,13 +19,16 @@ namespace {
 
 using Result = File::OpenUnmanagedResult;
 
-struct ErrorRow
+// By the access mode's number.
+constexpr char const* c_accessModes[] = {"r", "r+", "a+", "w+", "a", "w"};
+
+struct ErrorResult
 {
     int error;
     Result result;
 };
 
-constexpr ErrorRow c_openErrors[] = {
+constexpr ErrorResult c_errorResults[] = {
     {0, Result::Opened},
     {ENOENT, Result::NotFound},
     {EEXIST, Result::Exists},
@@ -42,72 +48,76 @@ constexpr ErrorRow c_openErrors[] = {
     {ENOSYS, Result::NotSupported},
 };
 
-constexpr char const* c_modes[] = {"r", "r+", "a+", "w+", "a", "w"};
+constexpr u64 c_openFiles = 8192;
 
-char const* ModeText(File::AccessMode mode)
-{
-    size_t const index = static_cast<size_t>(mode);
-    return index < std::size(c_modes) ? c_modes[index] : nullptr;
-}
-
-bool ReadMode(char const* mode, Platform::OpenFlags& flags)
-{
-    if (!mode) return false;
-    bool const plus = std::strchr(mode, '+') != nullptr;
-    switch (mode[0]) {
-    case 'r':
-        flags.read = true;
-        flags.write = plus;
-        break;
-    case 'w':
-        flags.write = flags.create = flags.truncate = true;
-        flags.read = plus;
-        flags.exclusive = std::strchr(mode, 'x') != nullptr;
-        break;
-    case 'a':
-        flags.write = flags.create = flags.append = true;
-        flags.read = plus;
-        break;
-    default: return false;
-    }
-    return true;
-}
+constexpr i64 c_nanosecondsASecond = 1000000000;
 
 } // namespace
 
-// An access error tells apart what stands there and may not be opened, and what is not there.
-Result File::TranslateOpenError(int error, char const* path)
+bool ParseOpenMode(char const* text, OpenMode& mode)
 {
-    if (error != EACCES) return TranslateError(error);
-    Platform::FileInfo info;
-    bool const exists = Platform::GetFileCalls().stat(path, true, info) == 0;
-    return exists ? Result::NotPermitted : Result::NotFound;
+    if (!text) return false;
+    mode = OpenMode();
+    Platform::OpenFlags& flags = mode.flags;
+    switch (*text) {
+    case 'r': flags.read = true; break;
+    case 'w': flags.write = flags.create = flags.truncate = true; break;
+    case 'a': flags.write = flags.create = flags.append = true; break;
+    default: return false;
+    }
+    for (char const* p = text + 1; *p; ++p) {
+        switch (*p) {
+        case '+': flags.read = flags.write = true; break;
+        case 'x': flags.exclusive = true; break;
+        case 'S': mode.sequential = true; break;
+        case 'b': break;
+        default: return false;
+        }
+    }
+    return !flags.exclusive || flags.create;
 }
 
-Result File::TranslateError(int error)
+File::OpenUnmanagedResult FailOpen(char const* path, int error, String8* errorText)
 {
-    for (ErrorRow const& row : c_openErrors)
-        if (row.error == error) return row.result;
-    return Result::Other;
+    Result result = File::TranslateError(error);
+    if (error == EACCES) {
+        bool const exists = Platform::GetFileCalls().access(path, Platform::Access::Exists) == 0;
+        result = exists ? Result::NotPermitted : Result::NotFound;
+    }
+    if (errorText) *errorText = String8(FileIOException::ErrorToString(error));
+    errno = error;
+    return result;
 }
 
-Result OpenPlatformFile(char const* path, Platform::OpenFlags flags, File::ShareMode share,
-                        Platform::FileHandle& handle, String8* text)
+File::OpenUnmanagedResult OpenPlatformFile(char const* path, OpenMode const& mode, File::ShareMode share,
+                                           File::VisibilityMode visibility, Platform::FileHandle& handle,
+                                           String8* errorText)
 {
-    flags.share = share == File::ShareMode::DenyWrite && flags.write ? Platform::FileShare::DenyWrite
-                                                                     : Platform::FileShare::DenyNone;
-    int const error = Platform::GetFileCalls().open(path, flags, handle);
-    if (error == 0) return Result::Opened;
+    // A document with many parts may hold thousands of files open, and the usual limit is 1,024.
+    static bool const s_limitRaised = (Platform::RaiseOpenFileLimit(c_openFiles), true);
+    static_cast<void>(s_limitRaised);
+
     handle = Platform::c_noHandle;
-    if (text) *text = String8(std::strerror(error));
-    return File::TranslateOpenError(error, path);
-}
-
-void HidePlatformFile(char const* path, File::VisibilityMode visibility)
-{
-    // Where the file system has no attributes the file stays visible.
+    Platform::OpenFlags flags = mode.flags;
+    flags.share = share == File::ShareMode::DenyWrite ? Platform::FileShare::DenyWrite : Platform::FileShare::DenyNone;
+    if (int const error = path ? Platform::GetFileCalls().open(path, flags, handle) : EINVAL) {
+        handle = Platform::c_noHandle;
+        return FailOpen(path, error, errorText);
+    }
+    if (mode.sequential) Platform::GetFileCalls().advise(handle, 0, 0, Platform::ReadAdvice::Sequential);
     if (visibility == File::VisibilityMode::Hidden)
         Platform::GetFileCalls().setAttribute(path, Platform::c_hiddenAttribute, "1", 1);
+    errno = 0;
+    return Result::Opened;
+}
+
+File::OpenUnmanagedResult OpenPlatformFile(char const* path, char const* mode, File::ShareMode share,
+                                           Platform::FileHandle& handle, String8* errorText)
+{
+    OpenMode parsed;
+    handle = Platform::c_noHandle;
+    if (!ParseOpenMode(mode, parsed)) return FailOpen(path, EINVAL, errorText);
+    return OpenPlatformFile(path, parsed, share, File::VisibilityMode::Normal, handle, errorText);
 }
 
 File::~File()
@@ -115,57 +125,58 @@ File::~File()
     Close();
 }
 
-Result File::OpenUnmanaged(char const* path, AccessMode mode, ShareMode share, VisibilityMode visibility,
-                           std::FILE*& file, String8* text)
+File::OpenUnmanagedResult File::OpenUnmanaged(char const* path, AccessMode access, ShareMode share,
+                                              VisibilityMode visibility, std::FILE*& out, String8* errorText)
 {
-    return OpenUnmanaged(path, ModeText(mode), share, visibility, file, text);
+    int const index = static_cast<int>(access);
+    bool const known = index >= 0 && index < static_cast<int>(std::size(c_accessModes));
+    return OpenUnmanaged(path, known ? c_accessModes[index] : nullptr, share, visibility, out, errorText);
 }
 
-Result File::OpenUnmanaged(char const* path, char const* mode, ShareMode share, VisibilityMode visibility,
-                           std::FILE*& file, String8* text)
+File::OpenUnmanagedResult File::OpenUnmanaged(char const* path, char const* mode, ShareMode share,
+                                              VisibilityMode visibility, std::FILE*& out, String8* errorText)
 {
-    file = nullptr;
-    Platform::OpenFlags flags;
-    if (!path || !ReadMode(mode, flags)) {
-        errno = EINVAL;
-        return Result::Other;
-    }
-    Platform::FileHandle handle = Platform::c_noHandle;
-    Result const result = OpenPlatformFile(path, flags, share, handle, text);
-    if (result != Result::Opened) return result;
+    out = nullptr;
+    OpenMode parsed;
+    if (!ParseOpenMode(mode, parsed)) return FailOpen(path, EINVAL, errorText);
+    Platform::FileHandle handle;
+    Result const result = OpenPlatformFile(path, parsed, share, visibility, handle, errorText);
+    if (!IsOpened(result)) return result;
+
+    // The C library knows fewer letters than we do.
+    char const plain[] = {mode[0], parsed.flags.read && parsed.flags.write ? '+' : '\0', '\0'};
     int error = 0;
-    file = Platform::MakeStdioFile(handle, mode, error);
-    if (!file) {
-        Platform::GetFileCalls().close(handle);
-        return TranslateError(error);
-    }
-    HidePlatformFile(path, visibility);
-    return Result::Opened;
+    out = Platform::MakeStdioFile(handle, plain, error);
+    if (out) return result;
+    Platform::GetFileCalls().close(handle);
+    return FailOpen(path, error, errorText);
 }
 
-Result File::OpenEx(char const* path, AccessMode mode, ShareMode share, VisibilityMode visibility)
+bool File::Open(char const* path, AccessMode access, ShareMode share, VisibilityMode visibility)
 {
-    return OpenEx(path, ModeText(mode), share, visibility);
+    return IsOpened(OpenEx(path, access, share, visibility));
 }
 
-Result File::OpenEx(char const* path, char const* mode, ShareMode share, VisibilityMode visibility)
+bool File::Open(char const* path, char const* mode, ShareMode share, VisibilityMode visibility)
+{
+    return IsOpened(OpenEx(path, mode, share, visibility));
+}
+
+File::OpenUnmanagedResult File::OpenEx(char const* path, AccessMode access, ShareMode share, VisibilityMode visibility)
+{
+    Close();
+    return OpenUnmanaged(path, access, share, visibility, m_file);
+}
+
+File::OpenUnmanagedResult File::OpenEx(char const* path, char const* mode, ShareMode share, VisibilityMode visibility)
 {
     Close();
     return OpenUnmanaged(path, mode, share, visibility, m_file);
 }
 
-bool File::Open(char const* path, AccessMode mode, ShareMode share, VisibilityMode visibility)
-{
-    return OpenEx(path, mode, share, visibility) == Result::Opened;
-}
-
-bool File::Open(char const* path, char const* mode, ShareMode share, VisibilityMode visibility)
-{
-    return OpenEx(path, mode, share, visibility) == Result::Opened;
-}
-
 void File::Attach(std::FILE* file)
 {
+    if (file == m_file) return;
     Close();
     m_file = file;
 }
@@ -188,45 +199,69 @@ bool File::Flush()
 
 bool File::ForceFlush()
 {
-    return Flush() && Platform::GetFileCalls().flush(Platform::GetStdioHandle(m_file), Platform::FlushKind::Full) == 0;
+    if (!Flush()) return false;
+    Platform::FileHandle const handle = Platform::GetStdioHandle(m_file);
+    return handle != Platform::c_noHandle && Platform::GetFileCalls().flush(handle, Platform::FlushKind::Full) == 0;
 }
 
 i64 File::GetPosition() const
 {
-    return m_file ? static_cast<i64>(::ftello(m_file)) : -1;
+    return m_file ? ftello(m_file) : -1;
 }
 
 i64 File::GetSize() const
 {
-    if (!m_file || std::fflush(m_file) != 0) return -1;
-    u64 size = 0;
-    return Platform::GetFileCalls().getSize(Platform::GetStdioHandle(m_file), size) == 0 ? static_cast<i64>(size) : -1;
+    i64 const position = GetPosition();
+    if (position < 0 || fseeko(m_file, 0, SEEK_END) != 0) return -1;
+    i64 const size = ftello(m_file);
+    return fseeko(m_file, position, SEEK_SET) == 0 ? size : -1;
 }
 
 i64 File::GetSize(char const* path)
 {
     Platform::FileInfo info;
-    if (Platform::GetFileCalls().stat(path, true, info) != 0 || info.kind != Platform::FileKind::File) return -1;
+    if (!path || Platform::GetFileCalls().stat(path, true, info) != 0) return -1;
     return static_cast<i64>(info.size);
 }
 
 bool File::SetPosition(i64 position)
 {
-    return SetPosition(position, Offset::Start);
+    return m_file && fseeko(m_file, position, SEEK_SET) == 0;
 }
 
-bool File::SetPosition(i64 distance, Offset from)
+bool File::SetPosition(i64 offset, Offset from)
 {
     int const whence = from == Offset::Current ? SEEK_CUR : from == Offset::End ? SEEK_END : SEEK_SET;
-    return m_file && ::fseeko(m_file, distance, whence) == 0;
+    return m_file && fseeko(m_file, offset, whence) == 0;
 }
 
 i64 File::GetSecondSinceModified() const
 {
+    Platform::FileHandle const handle = m_file ? Platform::GetStdioHandle(m_file) : Platform::c_noHandle;
     Platform::FileInfo info;
-    if (!m_file || Platform::GetFileCalls().statHandle(Platform::GetStdioHandle(m_file), info) != 0) return -1;
-    constexpr i64 nanoseconds = 1'000'000'000;
-    return (Platform::GetSystemTime() - info.modifyTime) / nanoseconds;
+    if (handle == Platform::c_noHandle || Platform::GetFileCalls().statHandle(handle, info) != 0) return -1;
+    return std::max<i64>(0, (Platform::GetSystemTime() - info.modifyTime) / c_nanosecondsASecond);
 }
+
+bool File::UpdateModifiedTimestamp()
+{
+    return false;
+}
+
+File::OpenUnmanagedResult File::TranslateError(int error)
+{
+    auto const* row = std::find_if(std::begin(c_errorResults), std::end(c_errorResults),
+                                   [&](ErrorResult const& r) { return r.error == error; });
+    return row != std::end(c_errorResults) ? row->result : Result::Other;
+}
+
+File::OpenUnmanagedResult File::TranslateOpenError(int error, char const* path)
+{
+    if (error != EACCES) return TranslateError(error);
+    bool const exists = Platform::GetFileCalls().access(path, Platform::Access::Exists) == 0;
+    return exists ? Result::NotPermitted : Result::NotFound;
+}
+
+void File::Unlock(std::FILE*) {}
 
 } // namespace Kernel

@@ -2,19 +2,30 @@
 
 #include "libkernel/platform/Errors.h"
 
+#include <algorithm>
+#include <iterator>
+
 namespace Kernel {
 
 namespace {
 
 using Reason = FileIOException::Reason;
 
-struct ReasonRow
+// By the reason's number; the last one stands for everything beyond.
+constexpr char const* c_reasonTexts[] = {
+    "Exception No Error",          "Exception File Handle Lost", "Exception Access Denied",
+    "Exception Permission Denied", "Exception Out of Space",     "Exception Socket Not Connected",
+    "Operation Not Allowed",       "Exception Other Error",
+};
+static_assert(std::size(c_reasonTexts) == static_cast<size_t>(Reason::Other) + 1);
+
+struct ErrorReason
 {
     int error;
     Reason reason;
 };
 
-constexpr ReasonRow c_reasons[] = {
+constexpr ErrorReason c_errorReasons[] = {
     {0, Reason::NoError},
     {ENOENT, Reason::FileHandleLost},
     {EIO, Reason::FileHandleLost},
@@ -23,24 +34,17 @@ constexpr ReasonRow c_reasons[] = {
     {EPERM, Reason::PermissionDenied},
     {EROFS, Reason::PermissionDenied},
     {ENOSPC, Reason::OutOfSpace},
-    {EDQUOT, Reason::OutOfSpace},
     {ENOTCONN, Reason::SocketNotConnected},
     {EBADF, Reason::NotAllowed},
 };
 
-constexpr char const* c_reasonTexts[] = {
-    "Exception No Error",          "Exception File Handle Lost", "Exception Access Denied",
-    "Exception Permission Denied", "Exception Out of Space",     "Exception Socket Not Connected",
-    "Operation Not Allowed",       "Exception Other Error",
-};
-
-struct TextRow
+struct ErrorText
 {
     int error;
     char const* text;
 };
 
-constexpr TextRow c_errorTexts[] = {
+constexpr ErrorText c_errorTexts[] = {
     {EPERM, "EPERM : Operation not permitted"},
     {ENOENT, "ENOENT : No such file or directory"},
     {ESRCH, "ESRCH : No such process"},
@@ -83,23 +87,23 @@ FileIOException::~FileIOException() = default;
 
 char const* FileIOException::GetReasonString() const
 {
-    constexpr int last = static_cast<int>(Reason::Other);
+    int const last = static_cast<int>(Reason::Other);
     int const index = static_cast<int>(m_reason);
     return c_reasonTexts[index < 0 || index > last ? last : index];
 }
 
 FileIOException::Reason FileIOException::FromError(int error)
 {
-    for (ReasonRow const& row : c_reasons)
-        if (row.error == error) return row.reason;
-    return Reason::Other;
+    auto const* row = std::find_if(std::begin(c_errorReasons), std::end(c_errorReasons),
+                                   [&](ErrorReason const& r) { return r.error == error; });
+    return row != std::end(c_errorReasons) ? row->reason : Reason::Other;
 }
 
 char const* FileIOException::ErrorToString(int error)
 {
-    for (TextRow const& row : c_errorTexts)
-        if (row.error == error) return row.text;
-    return nullptr;
+    auto const* row = std::find_if(std::begin(c_errorTexts), std::end(c_errorTexts),
+                                   [&](ErrorText const& t) { return t.error == error; });
+    return row != std::end(c_errorTexts) ? row->text : nullptr;
 }
 
 } // namespace Kernel

@@ -1,225 +1,253 @@
 #include "libkernel/streams/FileInOutStream.h"
 
+#include "libkernel/filesystem/FileSystem.h"
+#include "libkernel/platform/Errors.h"
 #include "libkernel/platform/Time.h"
 #include "libkernel/streams/internal/FileOpening.h"
-#include "libkernel/streams/internal/FileStreamCore.h"
+#include "libkernel/streams/internal/GenericCopy.h"
 #include "libkernel/streams/internal/SeekTarget.h"
 
 #include <algorithm>
+#include <limits>
 
 namespace Kernel {
 
 namespace {
 
-/// Null path: no stream, and a result that says nothing in particular.
-Platform::FileHandle OpenHandle(char const* path, Platform::OpenFlags const& flags, File::ShareMode share,
-                                File::OpenUnmanagedResult& result, String8* text)
-{
-    Platform::FileHandle handle = Platform::c_noHandle;
-    result = path ? OpenPlatformFile(path, flags, share, handle, text) : File::OpenUnmanagedResult::Other;
-    return handle;
-}
-
-Platform::OpenFlags ReadWriteFlags()
-{
-    Platform::OpenFlags flags;
-    flags.read = true;
-    flags.write = true;
-    return flags;
-}
+constexpr u64 c_highestPosition = static_cast<u64>(std::numeric_limits<i64>::max());
 
 } // namespace
 
-FileInOutStream::FileInOutStream(int handle, bool readOnly)
-    : m_core(std::make_unique<FileStreamCore>(handle)), m_readOnly(readOnly)
+FileInOutStream::FileInOutStream(Platform::FileHandle handle, bool readOnly, u64 size, bool lengthChanged)
+    : FileStreamBase(handle), m_readOnly(readOnly), m_knownSize(size), m_lengthChanged(lengthChanged)
 {
 }
 
 FileInOutStream::~FileInOutStream() = default;
 
-Counted<FileInOutStream> FileInOutStream::Open(char const* path)
+Counted<FileInOutStream> FileInOutStream::AdoptI(Platform::FileHandle handle, bool readOnly, bool isNew)
 {
-    Result result{};
-    return Open(path, File::ShareMode::DenyNone, result, nullptr);
+    // A size that can't be had counts as 0: the flushes to the device are then the fuller ones.
+    u64 size = 0;
+    if (!readOnly && !isNew) Platform::GetFileCalls().getSize(handle, size);
+    return new FileInOutStream(handle, readOnly, size, isNew);
 }
 
-Counted<FileInOutStream> FileInOutStream::Open(char const* path, File::ShareMode share, Result& result, String8* text)
+Counted<FileInOutStream> FileInOutStream::OpenI(char const* path, char const* mode, File::ShareMode share,
+                                                File::OpenUnmanagedResult& result, String8* errorText)
 {
-    Platform::FileHandle const handle = OpenHandle(path, ReadWriteFlags(), share, result, text);
-    return handle == Platform::c_noHandle ? nullptr : Counted<FileInOutStream>(new FileInOutStream(handle, false));
+    Platform::FileHandle handle;
+    result = OpenPlatformFile(path, mode, share, handle, errorText);
+    if (!File::IsOpened(result)) return nullptr;
+    OpenMode parsed;
+    ParseOpenMode(mode, parsed);
+    return AdoptI(handle, !parsed.flags.write, parsed.flags.create);
+}
+
+Counted<FileInOutStream> FileInOutStream::Open(char const* path)
+{
+    File::OpenUnmanagedResult result;
+    return Open(path, File::ShareMode::DenyNone, result);
+}
+
+Counted<FileInOutStream> FileInOutStream::Open(char const* path, File::ShareMode share,
+                                               File::OpenUnmanagedResult& result, String8* errorText)
+{
+    return OpenI(path, "r+b", share, result, errorText);
 }
 
 Counted<FileInOutStream> FileInOutStream::OpenReadOnly(char const* path)
 {
-    Result result{};
-    return OpenReadOnly(path, File::ShareMode::DenyNone, result, nullptr);
+    File::OpenUnmanagedResult result;
+    return OpenReadOnly(path, File::ShareMode::DenyNone, result);
 }
 
-Counted<FileInOutStream> FileInOutStream::OpenReadOnly(char const* path, File::ShareMode share, Result& result,
-                                                       String8* text)
+Counted<FileInOutStream> FileInOutStream::OpenReadOnly(char const* path, File::ShareMode share,
+                                                       File::OpenUnmanagedResult& result, String8* errorText)
 {
-    Platform::OpenFlags flags;
-    flags.read = true;
-    Platform::FileHandle const handle = OpenHandle(path, flags, share, result, text);
-    return handle == Platform::c_noHandle ? nullptr : Counted<FileInOutStream>(new FileInOutStream(handle, true));
+    return OpenI(path, "rb", share, result, errorText);
 }
 
 Counted<FileInOutStream> FileInOutStream::OpenOrCreate(char const* path)
 {
-    Result result{};
-    return OpenOrCreate(path, File::ShareMode::DenyNone, result, nullptr);
+    File::OpenUnmanagedResult result;
+    return OpenOrCreate(path, File::ShareMode::DenyNone, result);
 }
 
-Counted<FileInOutStream> FileInOutStream::OpenOrCreate(char const* path, File::ShareMode share, Result& result,
-                                                       String8* text)
+Counted<FileInOutStream> FileInOutStream::OpenOrCreate(char const* path, File::ShareMode share,
+                                                       File::OpenUnmanagedResult& result, String8* errorText)
 {
-    Counted<FileInOutStream> stream = Open(path, share, result, text);
-    // Only where nothing stands: a file that may not be opened must not be emptied instead.
-    if (!stream && result == Result::NotFound) stream = Create(path, share, result, text, true);
-    return stream;
+    if (Counted<FileInOutStream> stream = OpenI(path, "r+b", share, result, errorText)) return stream;
+    // Not "w+b": if the first open failed for a passing reason, the second one would empty the file.
+    OpenMode mode;
+    mode.flags.read = mode.flags.write = mode.flags.create = true;
+    Platform::FileHandle handle;
+    result = OpenPlatformFile(path, mode, share, File::VisibilityMode::Normal, handle, errorText);
+    return File::IsOpened(result) ? AdoptI(handle, false, true) : nullptr;
 }
 
-Counted<FileInOutStream> FileInOutStream::Create(char const* path, bool exclusive)
+Counted<FileInOutStream> FileInOutStream::Create(char const* path, bool mustBeNew)
 {
-    Result result{};
-    return Create(path, File::ShareMode::DenyNone, result, nullptr, exclusive);
+    File::OpenUnmanagedResult result;
+    return Create(path, File::ShareMode::DenyNone, result, nullptr, mustBeNew);
 }
 
-Counted<FileInOutStream> FileInOutStream::Create(char const* path, File::ShareMode share, Result& result, String8* text,
-                                                 bool exclusive)
+Counted<FileInOutStream> FileInOutStream::Create(char const* path, File::ShareMode share,
+                                                 File::OpenUnmanagedResult& result, String8* errorText, bool mustBeNew)
 {
-    Platform::OpenFlags flags = ReadWriteFlags();
-    flags.create = true;
-    flags.exclusive = exclusive;
-    flags.truncate = !exclusive;
-    Platform::FileHandle const handle = OpenHandle(path, flags, share, result, text);
-    return handle == Platform::c_noHandle ? nullptr : Counted<FileInOutStream>(new FileInOutStream(handle, false));
+    return OpenI(path, mustBeNew ? "w+xb" : "w+b", share, result, errorText);
 }
 
-u64 FileInOutStream::ReadBlock(void* to, u64 count)
+bool FileInOutStream::SetSizeI(u64 size)
 {
-    if (!m_core->IsUsable() || !to || count == 0) return 0;
-    u64 const got = m_core->Read(to, count);
-    m_position += got;
-    m_hitEnd = got != count;
-    return got;
-}
-
-u64 FileInOutStream::WriteBlock(void const* from, u64 count)
-{
-    if (m_readOnly) return 0;
-    u64 const put = m_core->Write(from, count);
-    m_position += put;
-    return put;
-}
-
-u64 FileInOutStream::ReadAt(u64 position, void* to, u64 count) const
-{
-    return m_core->ReadAt(position, to, count);
-}
-
-u64 FileInOutStream::WriteAt(u64 position, void const* from, u64 count)
-{
-    return m_readOnly ? 0 : m_core->WriteAt(position, from, count);
-}
-
-void FileInOutStream::StartWriteBack(u64 position, u64 count)
-{
-    if (m_core->IsUsable()) Platform::GetFileCalls().startWriteBack(m_core->GetHandle(), position, count);
-}
-
-void FileInOutStream::DropCache(u64 position, u64 count)
-{
-    if (m_core->IsUsable())
-        Platform::GetFileCalls().advise(m_core->GetHandle(), position, count, Platform::ReadAdvice::DontNeed);
-}
-
-bool FileInOutStream::ForceFlush()
-{
-    return m_readOnly || m_core->FlushToDevice();
-}
-
-bool FileInOutStream::CopyToStream(OutStream& out, StreamCopyProgress* progress)
-{
-    return out.WillDelegateCopyFromStream() ? InStream::CopyToStream(out, progress)
-                                            : out.CopyFromStream(*this, progress);
-}
-
-bool FileInOutStream::CopyFromStream(InStream& in, StreamCopyProgress* progress)
-{
-    return in.WillDelegateCopyToStream() ? OutStream::CopyFromStream(in, progress) : in.CopyToStream(*this, progress);
-}
-
-u64 FileInOutStream::GetSizeInStream() const
-{
-    return m_core->GetSize();
-}
-
-bool FileInOutStream::SeekInStream(SeekMethod method, i64 offset)
-{
-    if (!m_core->IsUsable()) return false;
-    Platform::SeekFrom from{};
-    if (!ToSeekFrom(static_cast<int>(method), from)) return false;
-    u64 reached = 0;
-    if (!m_core->Seek(offset, from, reached)) return false;
-    m_position = reached;
-    m_hitEnd = false;
+    if (int const error = Platform::GetFileCalls().setSize(GetHandle(), size)) {
+        OnErrorI(error);
+        return false;
+    }
+    m_knownSize = size;
+    m_lengthChanged = true;
     return true;
-}
-
-bool FileInOutStream::Truncate(u64 size)
-{
-    if (m_readOnly || !m_core->IsUsable()) return false;
-    u64 const end = m_core->GetSize();
-    if (size < end && !m_core->SetSize(size)) return false;
-    return SeekInStream(SeekMethod::Beginning, static_cast<i64>(std::min(size, end)));
 }
 
 bool FileInOutStream::Recreate()
 {
-    if (m_readOnly || !m_core->IsUsable() || !m_core->SetSize(0)) return false;
-    return SeekInStream(SeekMethod::Beginning, 0);
+    if (!CanWrite() || !SetSizeI(0)) return false;
+    m_position = 0;
+    m_passedEnd = false;
+    return true;
 }
 
 bool FileInOutStream::CopyFileAttributes(FileInOutStream const& from)
 {
-    Platform::FileCalls const& calls = Platform::GetFileCalls();
-    Platform::FileInfo info;
-    return m_core->IsUsable() && from.m_core->IsUsable() && calls.statHandle(from.m_core->GetHandle(), info) == 0 &&
-           calls.setModeHandle(m_core->GetHandle(), info.mode) == 0;
+    return !IsClosed() && !from.IsClosed() && FileSystem::CopyFileAttributes(from.GetHandle(), GetHandle());
 }
 
 bool FileInOutStream::UpdateTimestamps()
 {
-    if (m_readOnly || IsClosed()) return false;
-    i64 const now = Platform::GetSystemTime();
-    Platform::GetFileCalls().setTimesHandle(m_core->GetHandle(), now, now);
+    if (!CanWrite()) return false;
+    // A time that can't be set is no loss: the next write sets it.
+    Platform::GetFileCalls().setTimesHandle(GetHandle(), Platform::c_keepTime, Platform::GetSystemTime());
     return true;
 }
 
-void FileInOutStream::SetErrorHandler(Counted<FileStreamErrorHandler> const& handler)
+Platform::IoResult FileInOutStream::ReadAtI(u64 position, void* to, u64 count) const
 {
-    m_core->SetErrorHandler(handler);
+    if (!IsUsable() || !to || count == 0 || position > c_highestPosition) return {};
+    return Platform::GetFileCalls().readAt(GetHandle(), to, std::min(count, c_highestPosition - position), position);
 }
 
-bool FileInOutStream::Close()
+u64 FileInOutStream::ReadAt(u64 position, void* to, u64 count) const
 {
-    return m_core->Close();
+    Platform::IoResult const result = ReadAtI(position, to, count);
+    if (result.count < count && result.error != 0) throw FileIOException(FileIOException::FromError(result.error));
+    return result.count;
 }
 
-bool FileInOutStream::IsClosed() const
+u64 FileInOutStream::WriteAt(u64 position, void const* from, u64 count)
 {
-    return m_core->IsClosed();
+    if (!CanWrite() || !from || count == 0) return 0;
+    Platform::IoResult result;
+    if (RangeFits(position, count, c_highestPosition))
+        result = Platform::GetFileCalls().writeAt(GetHandle(), from, count, position);
+    else
+        result.error = EFBIG;
+
+    u64 const end = position + result.count;
+    u64 known = m_knownSize.load(std::memory_order_relaxed);
+    while (result.count != 0 && end > known) {
+        if (!m_knownSize.compare_exchange_weak(known, end)) continue;
+        m_lengthChanged = true;
+        break;
+    }
+    if (result.error != 0) OnErrorI(result.error);
+    return result.count;
 }
 
-bool FileInOutStream::IsBroken() const
+void FileInOutStream::StartWriteBack(u64 offset, u64 size) const
 {
-    return m_core->IsBroken();
+    if (CanWrite()) Platform::GetFileCalls().startWriteBack(GetHandle(), offset, size);
 }
 
-FileIOException::Reason FileInOutStream::GetReason() const
+void FileInOutStream::DropCache(u64 offset, u64 size) const
 {
-    return m_core->GetReason();
+    if (IsUsable()) Platform::GetFileCalls().advise(GetHandle(), offset, size, Platform::ReadAdvice::DontNeed);
+}
+
+u64 FileInOutStream::ReadBlock(void* to, u64 count)
+{
+    if (!IsUsable() || !to || count == 0) return 0;
+    Platform::IoResult const result = ReadAtI(m_position, to, count);
+    m_position += result.count;
+    m_passedEnd = result.count < count && result.error == 0;
+    if (result.count < count && result.error != 0) OnErrorI(result.error);
+    return result.count;
+}
+
+bool FileInOutStream::CopyToStream(OutStream& out, StreamCopyProgress* progress)
+{
+    return CopyFromFile(*this, out, progress);
+}
+
+u64 FileInOutStream::GetSizeInStream() const
+{
+    bool ok;
+    return QuerySize(ok);
+}
+
+bool FileInOutStream::SeekInStream(SeekMethod method, i64 offset)
+{
+    if (!IsUsable()) return false;
+    bool ok = true;
+    u64 const size = method == SeekMethod::End ? QuerySize(ok) : 0;
+    u64 target;
+    if (!ok || !ResolveSeekStrictly(method, offset, m_position, size, target)) return false;
+    m_position = target;
+    m_passedEnd = false;
+    return true;
+}
+
+u64 FileInOutStream::WriteBlock(void const* from, u64 count)
+{
+    u64 const written = WriteAt(m_position, from, count);
+    m_position += written;
+    return written;
+}
+
+bool FileInOutStream::ForceFlush()
+{
+    if (!IsUsable()) return true;
+    // Taken first: a length that another thread changes meanwhile is for the next flush.
+    bool const full = m_lengthChanged.exchange(false);
+    int const error =
+        Platform::GetFileCalls().flush(GetHandle(), full ? Platform::FlushKind::Full : Platform::FlushKind::Data);
+    if (error != 0) OnErrorI(error);
+    return error == 0;
+}
+
+bool FileInOutStream::CopyFromStream(InStream& in, StreamCopyProgress* progress)
+{
+    return CopyToFile(in, *this, progress);
+}
+
+bool FileInOutStream::WriteBlockAtPos(u64 position, void const* from, u64 count)
+{
+    return CanWrite() && (count == 0 || WriteAt(position, from, count) == count);
+}
+
+bool FileInOutStream::Truncate(u64 size)
+{
+    if (!CanWrite()) return false;
+    bool ok;
+    u64 const end = QuerySize(ok);
+    if (!ok || (size < end && !SetSizeI(size))) return false;
+    m_position = std::min(size, end);
+    m_passedEnd = false;
+    return true;
+}
+
+bool FileInOutStream::SeekOutStream(SeekMethod method, i64 offset)
+{
+    return SeekInStream(method, offset);
 }
 
 } // namespace Kernel

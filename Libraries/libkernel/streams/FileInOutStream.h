@@ -2,91 +2,107 @@
 
 #include "libkernel/core/String.h"
 #include "libkernel/streams/File.h"
-#include "libkernel/streams/FileStreamErrorHandler.h"
+#include "libkernel/streams/FileStreamBase.h"
 #include "libkernel/streams/InOutStream.h"
 
-#include <memory>
+#include <atomic>
 
 namespace Kernel {
 
-class FileStreamCore;
-
-/// A file for reading and writing, with one position. Not buffered: each call reaches the system, in one piece.
+/// Reads and writes a file, with one position for both. Failures as FileStreamBase tells them.
 ///
-/// Failures are reported once, as FileInStream has it. One thread at a time, but for ReadAt: any number of threads may
-/// read by position, beside each other and beside the thread that works with the stream.
-class KERNEL_API FileInOutStream : public InOutStreamSeekable
+/// Nothing is held back: each read or write reaches the system in one piece, in the order of the calls. Who moves small
+/// pieces buffers above it.
+class KERNEL_API FileInOutStream final : public InOutStreamSeekable, public FileStreamBase
 {
 public:
     using Result = File::OpenUnmanagedResult;
 
-    /// An existing file. The forms with a result say why they give null, and @p text, if not null, gets the platform's
-    /// words for it.
+    // The long forms tell in @p result why there is no stream, and in @p errorText, if given, the error's name. All
+    // give null on failure, and for a null path.
+
+    /// Opens a file that exists.
     static Counted<FileInOutStream> Open(char const* path);
-    static Counted<FileInOutStream> Open(char const* path, File::ShareMode share, Result& result, String8* text);
+    static Counted<FileInOutStream> Open(char const* path, File::ShareMode share, File::OpenUnmanagedResult& result,
+                                         String8* errorText = nullptr);
+    /// Opens a file that exists: writes give 0, and truncations false.
     static Counted<FileInOutStream> OpenReadOnly(char const* path);
-    static Counted<FileInOutStream> OpenReadOnly(char const* path, File::ShareMode share, Result& result,
-                                                 String8* text);
+    static Counted<FileInOutStream> OpenReadOnly(char const* path, File::ShareMode share,
+                                                 File::OpenUnmanagedResult& result, String8* errorText = nullptr);
+    /// Opens a file, or makes it if it can't be opened. What is there is never emptied.
     static Counted<FileInOutStream> OpenOrCreate(char const* path);
-    static Counted<FileInOutStream> OpenOrCreate(char const* path, File::ShareMode share, Result& result,
-                                                 String8* text);
-    /// A new, empty file. With @p exclusive it fails where anything stands at the path, else it empties what stands
-    /// there.
-    static Counted<FileInOutStream> Create(char const* path, bool exclusive = false);
-    static Counted<FileInOutStream> Create(char const* path, File::ShareMode share, Result& result, String8* text,
-                                           bool exclusive = false);
+    static Counted<FileInOutStream> OpenOrCreate(char const* path, File::ShareMode share,
+                                                 File::OpenUnmanagedResult& result, String8* errorText = nullptr);
+    /// Makes the file, or empties it; with @p mustBeNew an existing file makes it fail with Exists.
+    static Counted<FileInOutStream> Create(char const* path, bool mustBeNew = false);
+    static Counted<FileInOutStream> Create(char const* path, File::ShareMode share, File::OpenUnmanagedResult& result,
+                                           String8* errorText = nullptr, bool mustBeNew = false);
+
+    bool IsReadOnly() const { return m_readOnly; }
+    /// False after reporting a failure; true for a stream that is closed already.
+    bool Close() { return CloseI(); }
+    /// Empties the file in place and stands at its start. False for a read-only or broken stream.
+    bool Recreate();
+    /// Gives this file the permissions and the hidden attribute of the other.
+    bool CopyFileAttributes(FileInOutStream const& from);
+    /// Sets the modification time to now. False for a stream that can't write.
+    bool UpdateTimestamps();
+
+    // By position: the stream's own stays where it is. Any number of threads may do this at once, beside the one that
+    // works with the stream, though not beside Close.
+
+    /// Fewer bytes only at the end of the file. A failure throws FileIOException, handler or not, and leaves the stream
+    /// whole: each of several readers learns of its own.
+    u64 ReadAt(u64 position, void* to, u64 count) const;
+    /// A failure breaks the stream, as for WriteBlock.
+    u64 WriteAt(u64 position, void const* from, u64 count);
+    /// Lets the system begin to write a range to the device, without waiting and without a promise. A size of 0 means
+    /// to the end, here and below.
+    void StartWriteBack(u64 offset, u64 size) const;
+    /// Tells the system that a range will not be read again soon.
+    void DropCache(u64 offset, u64 size) const;
 
     u64 ReadBlock(void* to, u64 count) override;
-    bool EOS() const override { return m_hitEnd; }
+    /// True once a read has tried to pass the end; a seek makes it false again. A broken stream isn't at its end.
+    bool EOS() const override { return IsClosed() || m_passedEnd; }
     bool CopyToStream(OutStream& out, StreamCopyProgress* progress = nullptr) override;
     bool WillDelegateCopyToStream() const override { return true; }
     bool SlowProgressInStream() const override { return true; }
     u64 GetSizeInStream() const override;
-    u64 TellInStream() const override { return m_position; }
+    u64 TellInStream() const override { return IsUsable() ? m_position : 0; }
+    /// May pass the end, but not the start. Costs no call but from the end.
     bool SeekInStream(SeekMethod method, i64 offset) override;
 
     u64 WriteBlock(void const* from, u64 count) override;
     bool Flush() override { return true; }
+    /// A flush that the device failed is never tried again: the stream is broken.
     bool ForceFlush() override;
     bool CopyFromStream(InStream& in, StreamCopyProgress* progress = nullptr) override;
     bool WillDelegateCopyFromStream() const override { return true; }
     bool SlowProgressOutStream() const override { return true; }
     u64 GetSizeOutStream() const override { return GetSizeInStream(); }
-    u64 TellOutStream() const override { return m_position; }
+    u64 TellOutStream() const override { return TellInStream(); }
+    bool WriteBlockAtPos(u64 position, void const* from, u64 count) override;
+    /// Stands at the smaller of @p size and the end afterwards.
     bool Truncate(u64 size) override;
-    bool SeekOutStream(SeekMethod method, i64 offset) override { return SeekInStream(method, offset); }
-
-    /// Reads at @p position without moving the stream's own. Fewer bytes only at the end of the file; a failure throws
-    /// FileIOException and leaves the stream as it is.
-    u64 ReadAt(u64 position, void* to, u64 count) const;
-    /// Writes at @p position without moving the stream's own; a failure breaks the stream.
-    u64 WriteAt(u64 position, void const* from, u64 count);
-    /// Hints: the range may go to the device now; its pages in memory may go.
-    void StartWriteBack(u64 position, u64 count);
-    void DropCache(u64 position, u64 count);
-
-    /// Empties the file and seeks to its start; false on a read-only or broken stream.
-    bool Recreate();
-    /// Gives this file the rights and attributes of @p from.
-    bool CopyFileAttributes(FileInOutStream const& from);
-    /// Sets the file's times to now. False only for a closed or read-only stream.
-    bool UpdateTimestamps();
-    bool IsReadOnly() const { return m_readOnly; }
-
-    void SetErrorHandler(Counted<FileStreamErrorHandler> const& handler);
-    bool Close();
-    bool IsClosed() const;
-    bool IsBroken() const;
-    FileIOException::Reason GetReason() const;
+    bool SeekOutStream(SeekMethod method, i64 offset) override;
 
 private:
-    FileInOutStream(int handle, bool readOnly);
+    FileInOutStream(Platform::FileHandle handle, bool readOnly, u64 size, bool lengthChanged);
     ~FileInOutStream() override;
+    static Counted<FileInOutStream> OpenI(char const* path, char const* mode, File::ShareMode share,
+                                          File::OpenUnmanagedResult& result, String8* errorText);
+    static Counted<FileInOutStream> AdoptI(Platform::FileHandle handle, bool readOnly, bool isNew);
+    bool SetSizeI(u64 size);
+    Platform::IoResult ReadAtI(u64 position, void* to, u64 count) const;
+    bool CanWrite() const { return IsUsable() && !m_readOnly; }
 
-    std::unique_ptr<FileStreamCore> m_core;
     bool const m_readOnly;
-    u64 m_position = 0;
-    bool m_hitEnd = false;
+    bool m_passedEnd = false;
+    u64 m_position = 0; // At most the highest i64.
+    // For the choice between the two flushes to the device; several threads may write at once.
+    std::atomic<u64> m_knownSize;
+    std::atomic<bool> m_lengthChanged;
 };
 
 } // namespace Kernel

@@ -2,58 +2,49 @@
 
 #include "libkernel/core/String.h"
 #include "libkernel/streams/File.h"
-#include "libkernel/streams/FileStreamErrorHandler.h"
+#include "libkernel/streams/FileWriterBase.h"
 #include "libkernel/streams/OutStream.h"
-
-#include <memory>
 
 namespace Kernel {
 
-class FileStreamCore;
-
-/// A file for writing, with a small buffer. Failures are reported once, as FileInStream has it; what a buffer still
-/// held may surface as late as Flush or Close. One thread at a time.
-class KERNEL_API FileOutStream : public OutStreamSeekable
+/// Writes a file. Failures as FileStreamBase tells them; one of bytes held back may come with a later call.
+class KERNEL_API FileOutStream final : public OutStreamSeekable, public FileWriterBase
 {
 public:
     using Result = File::OpenUnmanagedResult;
 
-    /// A new file, or an existing one emptied. Null on failure; the long form says why.
+    static constexpr u64 c_bufferSize = 4096;
+
+    /// Makes the file or empties it. Null on failure, and for a null path; @p result then tells why, and @p errorText,
+    /// if given, gets the error's name.
     static Counted<FileOutStream> Create(char const* path);
-    static Counted<FileOutStream> Create(char const* path, File::ShareMode share, Result& result, String8* text);
-    /// Every write goes to the end.
+    static Counted<FileOutStream> Create(char const* path, File::ShareMode share, File::OpenUnmanagedResult& result,
+                                         String8* errorText = nullptr);
+    /// Makes the file or keeps what is there: the stream begins at its end, and every write goes to the end.
     static Counted<FileOutStream> Append(char const* path);
-    static Counted<FileOutStream> Append(char const* path, File::ShareMode share, Result& result, String8* text);
+    static Counted<FileOutStream> Append(char const* path, File::ShareMode share, File::OpenUnmanagedResult& result,
+                                         String8* errorText = nullptr);
 
     u64 WriteBlock(void const* from, u64 count) override;
-    bool Flush() override;
-    bool ForceFlush() override;
+    bool Flush() override { return FlushI(); }
+    /// A flush that the device failed is never tried again: the stream is broken.
+    bool ForceFlush() override { return ForceFlushI(); }
     bool CopyFromStream(InStream& in, StreamCopyProgress* progress = nullptr) override;
     bool WillDelegateCopyFromStream() const override { return true; }
     bool SlowProgressOutStream() const override { return true; }
-    u64 GetSizeOutStream() const override;
-    u64 TellOutStream() const override;
-    bool Truncate(u64 size) override;
-    bool SeekOutStream(SeekMethod method, i64 offset) override;
-
-    void SetErrorHandler(Counted<FileStreamErrorHandler> const& handler);
-    bool Close();
-    bool IsClosed() const;
-    bool IsBroken() const;
-    FileIOException::Reason GetReason() const;
+    u64 GetSizeOutStream() const override { return GetSizeI(); }
+    u64 TellOutStream() const override { return GetPosition(); }
+    bool WriteBlockAtPos(u64 position, void const* from, u64 count) override;
+    /// Stands at the smaller of @p size and the end afterwards.
+    bool Truncate(u64 size) override { return TruncateI(size); }
+    /// May pass the end, but not the start.
+    bool SeekOutStream(SeekMethod method, i64 offset) override { return SeekI(method, offset); }
 
 private:
-    static constexpr u64 c_bufferSize = 4096;
-
-    FileOutStream(int handle, bool append);
+    FileOutStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, Placement placement, u64 size);
     ~FileOutStream() override;
-    bool WriteOut();
-
-    std::unique_ptr<FileStreamCore> m_core;
-    std::unique_ptr<u8[]> m_buffer;
-    u64 m_held = 0;
-    u64 m_position = 0; // Of the buffer's first byte.
-    bool const m_append;
+    static Counted<FileOutStream> OpenI(char const* path, char const* mode, File::ShareMode share, Placement placement,
+                                        File::OpenUnmanagedResult& result, String8* errorText);
 };
 
 } // namespace Kernel

@@ -5,11 +5,25 @@
 
 namespace Kernel {
 
-/// Opens a handle with the library's share mode. @p text, if not null, gets the platform's text for a failure.
-File::OpenUnmanagedResult OpenPlatformFile(char const* path, Platform::OpenFlags flags, File::ShareMode share,
-                                           Platform::FileHandle& handle, String8* text);
+/// How a file is to be opened: the meaning of a C mode string.
+struct OpenMode
+{
+    Platform::OpenFlags flags;
+    bool sequential = false;
+};
 
-/// Sets the hidden attribute, where it is asked for and the file system has one.
-void HidePlatformFile(char const* path, File::VisibilityMode visibility);
+/// Reads a mode such as "r+b", "w+xb" or "a+bS". False if it isn't one.
+bool ParseOpenMode(char const* text, OpenMode& mode);
+
+/// Opens a file and hides it if that is asked for. On failure `errno` is set and @p errorText, if given, gets its name.
+/// @p handle is then c_noHandle.
+File::OpenUnmanagedResult OpenPlatformFile(char const* path, OpenMode const& mode, File::ShareMode share,
+                                           File::VisibilityMode visibility, Platform::FileHandle& handle,
+                                           String8* errorText);
+File::OpenUnmanagedResult OpenPlatformFile(char const* path, char const* mode, File::ShareMode share,
+                                           Platform::FileHandle& handle, String8* errorText);
+
+/// Notes an error as an open does: in `errno` and in @p errorText, if given. Gives the result for it.
+File::OpenUnmanagedResult FailOpen(char const* path, int error, String8* errorText);
 
 } // namespace Kernel

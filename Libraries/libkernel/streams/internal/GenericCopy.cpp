@@ -42,4 +42,14 @@ bool GenericCopy(InStream& in, OutStream& out, StreamCopyProgress* progress)
     return in.EOS();
 }
 
+bool CopyFromFile(InStream& file, OutStream& out, StreamCopyProgress* progress)
+{
+    return out.WillDelegateCopyFromStream() ? GenericCopy(file, out, progress) : out.CopyFromStream(file, progress);
+}
+
+bool CopyToFile(InStream& in, OutStream& file, StreamCopyProgress* progress)
+{
+    return in.WillDelegateCopyToStream() ? GenericCopy(in, file, progress) : in.CopyToStream(file, progress);
+}
+
 } // namespace Kernel

@@ -10,4 +10,9 @@ class StreamCopyProgress;
 /// True if the source was read to its end and the target took all of it. MemoryException without memory for the buffer.
 bool GenericCopy(InStream& in, OutStream& out, StreamCopyProgress* progress);
 
+/// The copies of a file stream: a peer that is not a file gets the work, since it may know a shorter way; two files
+/// copy by the general loop.
+bool CopyFromFile(InStream& file, OutStream& out, StreamCopyProgress* progress);
+bool CopyToFile(InStream& in, OutStream& file, StreamCopyProgress* progress);
+
 } // namespace Kernel

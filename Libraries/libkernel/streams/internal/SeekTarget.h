@@ -22,6 +22,14 @@ inline bool ResolveSeek(SeekMethod method, i64 offset, u64 position, u64 size, u
     return true;
 }
 
+/// The same for files: a target below the start, or beyond what a file offset can be, is refused.
+inline bool ResolveSeekStrictly(SeekMethod method, i64 offset, u64 position, u64 size, u64& target)
+{
+    u64 const from = method == SeekMethod::Current ? position : method == SeekMethod::End ? size : 0;
+    if (offset < 0 && 0 - static_cast<u64>(offset) > from) return false;
+    return ResolveSeek(method, offset, position, size, target) && target <= static_cast<u64>(INT64_MAX);
+}
+
 /// What a source says is left. 0 also where it does not know its size.
 inline u64 BytesLeft(InStream const& in)
 {
