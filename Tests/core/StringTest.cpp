@@ -1,6 +1,10 @@
 #include "libkernel/core/String.h"
 
 #include <gtest/gtest.h>
+#include <new>
+#include <string>
+#include <thread>
+#include <vector>
 
 namespace Kernel {
 namespace {
@@ -11,8 +15,7 @@ TEST(StringTest, CapacityIsWhatTheBlockRoundsUpTo)
     {
         int units, utf8, utf16, utf32;
     };
-    for (Case const& c : {Case{1, 3, 1, 2}, Case{3, 3, 5, 4}, Case{4, 11, 5, 4}, Case{100, 107, 101, 100}})
-    {
+    for (Case const& c : {Case{1, 3, 1, 2}, Case{3, 3, 5, 4}, Case{4, 11, 5, 4}, Case{100, 107, 101, 100}}) {
         SCOPED_TRACE(c.units);
         String8 a;
         String16 b;
@@ -54,6 +57,89 @@ TEST(StringTest, SubstringSharesOnlyTheWhole)
     EXPECT_TRUE(s.GetSubstring(0).SharesBlockWith(s));
     EXPECT_EQ(s.GetSubstring(4, 100), "ef");
     EXPECT_TRUE(s.GetSubstring(6).IsEmpty());
+}
+
+TEST(StringTest, AppendsThatFitStayInTheBlock)
+{
+    String8 s("ab");
+    s.Reserve(1000);
+    char const* const units = s.GetData();
+    for (int i = 0; i < 100; ++i) (s += "x").Append(s.GetData(), 1);
+    EXPECT_EQ(s.GetData(), units);
+    EXPECT_EQ(s.GetLength(), 202);
+    EXPECT_EQ(s[201], 'a');
+}
+
+TEST(StringTest, EmptyBlockIsNeverWritten)
+{
+    String8 s;
+    *s.SetLength(0) = 0;
+    s.SetLength(-5);
+    s.Reserve(-1);
+    EXPECT_TRUE(s.SharesBlockWith(String8()));
+    EXPECT_TRUE(String8(nullptr, 5).IsEmpty());
+    String8 own("abc");
+    own.SetLength(-1);
+    EXPECT_EQ(own.GetLength(), 0);
+    EXPECT_EQ(own, "");
+    EXPECT_EQ(String8().GetLength(), 0);
+}
+
+TEST(StringTest, ReserveCutsASharedTextAndLeavesTheOther)
+{
+    String8 const original("abcdef");
+    String8 copy(original);
+    copy.Reserve(3);
+    EXPECT_EQ(copy, "abc");
+    copy = original;
+    copy.Reserve(0);
+    EXPECT_TRUE(copy.IsEmpty());
+    EXPECT_EQ(original, "abcdef");
+}
+
+TEST(StringTest, ConcatBuildsExactlyBothParts)
+{
+    String8 out("12");
+    ConcatString<TEncUtf8>(out, out.GetData(), 2, "34", 2);
+    EXPECT_EQ(out, "1234");
+    ConcatString<TEncUtf8>(out, nullptr, -3, out.GetData() + 1, 2);
+    EXPECT_EQ(out, "23");
+    ConcatString<TEncUtf8>(out, nullptr, 0, nullptr, 0);
+    EXPECT_TRUE(out.IsEmpty());
+    EXPECT_THROW(ConcatString<TEncUtf8>(out, "", INT32_MAX, "", 1), std::bad_alloc);
+    EXPECT_EQ("a" + String8("b") + "c", "abc");
+}
+
+TEST(StringTest, FindAgreesWithTheStandardLibrary)
+{
+    std::string const text = "abracadabra abcabcabd";
+    String8 const s(text.c_str());
+    for (char const* needle : {"a", "abr", "abcabd", "z", "abracadabra abcabcabd", "abracadabra abcabcabdx", "", "d"})
+        for (int start = -1; start <= s.GetLength() + 1; ++start) {
+            size_t const found = text.find(needle, static_cast<size_t>(std::max(start, 0)));
+            EXPECT_EQ(s.Find(needle, start), found == std::string::npos ? -1 : static_cast<int>(found))
+                << needle << " from " << start;
+        }
+    EXPECT_EQ(s.Find('c', 5), 14);
+    EXPECT_EQ(String8("a\0b", 3).Find('\0'), 1);
+    EXPECT_EQ(String16(u"xyzzy").Find(String16(u"zy")), 3);
+}
+
+TEST(StringTest, ThreadsMayChangeCopiesOfOneString)
+{
+    String8 const shared("shared text");
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 4; ++t)
+        threads.emplace_back([shared] {
+            for (int i = 0; i < 5000; ++i) {
+                String8 copy(shared);
+                copy += "!";
+                String8 const empty;
+                EXPECT_EQ(copy.GetLength(), shared.GetLength() + 1);
+            }
+        });
+    for (std::thread& t : threads) t.join();
+    EXPECT_EQ(shared, "shared text");
 }
 
 } // namespace

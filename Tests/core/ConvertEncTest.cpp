@@ -1,0 +1,136 @@
+#include "libkernel/core/ConvertEnc.h"
+
+#include "libkernel/core/CharTraits.h"
+
+#include <gtest/gtest.h>
+#include <iconv.h>
+#include <memory>
+#include <random>
+#include <vector>
+
+namespace Kernel {
+namespace {
+
+template <class Enc>
+char const* NameOf();
+template <>
+char const* NameOf<TEncUtf8>()
+{
+    return "UTF-8";
+}
+template <>
+char const* NameOf<TEncUtf16>()
+{
+    return "UTF-16LE";
+}
+template <>
+char const* NameOf<TEncUtf32>()
+{
+    return "UTF-32LE";
+}
+
+/// What the C library makes of the same text.
+template <class To>
+StringT<To> Reference(std::vector<u32> const& codePoints)
+{
+    std::vector<char> room(codePoints.size() * 4 + 4);
+    iconv_t const converter = iconv_open(NameOf<To>(), "UTF-32LE");
+    char* from = reinterpret_cast<char*>(const_cast<u32*>(codePoints.data()));
+    size_t fromLeft = codePoints.size() * 4;
+    char* to = room.data();
+    size_t toLeft = room.size();
+    EXPECT_EQ(iconv(converter, &from, &fromLeft, &to, &toLeft), 0u);
+    iconv_close(converter);
+    using Unit = typename To::Unit;
+    StringT<To> result;
+    size_t const bytes = static_cast<size_t>(to - room.data());
+    std::memcpy(result.SetLength(static_cast<int>(bytes / sizeof(Unit))), room.data(), bytes);
+    return result;
+}
+
+template <class To, class From>
+void ExpectConverts(std::vector<u32> const& codePoints)
+{
+    StringT<From> const from = Reference<From>(codePoints);
+    StringT<To> const expected = Reference<To>(codePoints);
+    ASSERT_TRUE((ConvertedTo<To>(from) == expected));
+    // Behind what is there already, and with the terminator for an end.
+    StringT<To> appended(expected);
+    ConvertEnc<To, From>(appended, from.GetData(), -1);
+    ASSERT_TRUE(appended == expected + expected);
+}
+
+std::vector<u32> RandomText(std::mt19937& random, int style)
+{
+    std::vector<u32> text(random() % 100);
+    for (u32& c : text) {
+        u32 const limits[] = {0x7F, 0x7FF, 0xFFFF, 0x10FFFF};
+        do c = random() % limits[style < 4 ? style : random() % 8 ? 0 : random() % 4] + 1;
+        while (c >= 0xD800 && c < 0xE000);
+    }
+    return text;
+}
+
+TEST(ConvertEncTest, NinePairsAgreeWithTheCLibrary)
+{
+    std::mt19937 random(3);
+    for (int round = 0; round < 1500; ++round) {
+        std::vector<u32> const text = RandomText(random, round % 5);
+        SCOPED_TRACE(round);
+        ExpectConverts<TEncUtf8, TEncUtf8>(text);
+        ExpectConverts<TEncUtf8, TEncUtf16>(text);
+        ExpectConverts<TEncUtf8, TEncUtf32>(text);
+        ExpectConverts<TEncUtf16, TEncUtf8>(text);
+        ExpectConverts<TEncUtf16, TEncUtf16>(text);
+        ExpectConverts<TEncUtf16, TEncUtf32>(text);
+        ExpectConverts<TEncUtf32, TEncUtf8>(text);
+        ExpectConverts<TEncUtf32, TEncUtf16>(text);
+        ExpectConverts<TEncUtf32, TEncUtf32>(text);
+        if (HasFatalFailure()) return;
+    }
+}
+
+template <class To, class From>
+void ConvertExact(std::vector<u8> const& bytes)
+{
+    using Unit = typename From::Unit;
+    size_t const units = bytes.size() / sizeof(Unit);
+    std::unique_ptr<Unit[]> const exact(new Unit[units]);
+    std::memcpy(exact.get(), bytes.data(), units * sizeof(Unit));
+    StringT<To> text;
+    ConvertEnc<To, From>(text, exact.get(), static_cast<int>(units));
+    EXPECT_EQ(text.GetData()[text.GetLength()], 0u);
+}
+
+TEST(ConvertEncTest, IllFormedTextStaysInsideItsBounds)
+{
+    std::mt19937 random(5);
+    for (int round = 0; round < 3000; ++round) {
+        std::vector<u8> bytes(random() % 80);
+        for (u8& b : bytes)
+            b = static_cast<u8>(round % 2 ? random() : (random() % 4 ? 0xD8 + random() % 40 : random()));
+        ConvertExact<TEncUtf16, TEncUtf8>(bytes);
+        ConvertExact<TEncUtf32, TEncUtf8>(bytes);
+        ConvertExact<TEncUtf8, TEncUtf16>(bytes);
+        ConvertExact<TEncUtf32, TEncUtf16>(bytes);
+        ConvertExact<TEncUtf8, TEncUtf32>(bytes);
+        ConvertExact<TEncUtf16, TEncUtf32>(bytes);
+    }
+}
+
+TEST(ConvertEncTest, LastCodePointCutShortIsDropped)
+{
+    EXPECT_EQ(ConvertedTo<TEncUtf16>(String8("ab\xF0")), u"ab");
+    EXPECT_EQ(ConvertedTo<TEncUtf8>(String16(u"ab\xD83D")), "ab");
+}
+
+TEST(ConvertEncTest, ZeroUnitsPassThroughByLength)
+{
+    EXPECT_EQ(ConvertedTo<TEncUtf16>(String8("a\0b", 3)), String16(u"a\0b", 3));
+    String8 out("x");
+    ConvertEnc<TEncUtf8, TEncUtf16>(out, nullptr, 0);
+    EXPECT_EQ(out, "x");
+}
+
+} // namespace
+} // namespace Kernel

@@ -1,0 +1,74 @@
+#include "libkernel/core/Hash.h"
+
+#include "libkernel/core/BaseCharTraits.h"
+
+#include <gtest/gtest.h>
+#include <vector>
+
+namespace Kernel {
+namespace {
+
+u32 HashOf(void const* bytes, u64 count, u32 seed)
+{
+    HashAccumulator hash(seed);
+    hash.AddToHash(bytes, count);
+    return hash.GetHash();
+}
+
+TEST(HashTest, AccumulatorGivesThePublishedValuesOfLookup3)
+{
+    char const text[] = "Four score and seven years ago";
+    EXPECT_EQ(HashOf(text, 30, 0), 0x17770551u);
+    EXPECT_EQ(HashOf(text, 30, 1), 0xCD628161u);
+    EXPECT_EQ(HashOf("", 0, 0), 0xDEADBEEFu);
+    EXPECT_EQ(HashOf("", 0, 0xDEADBEEF), 0xBD5B7DDEu);
+}
+
+TEST(HashTest, AlignmentDoesNotMatterAndEveryByteDoes)
+{
+    for (u64 count = 1; count <= 40; ++count) {
+        std::vector<u8> room(count + 8, 0x55);
+        u32 const first = HashOf(room.data(), count, 3);
+        for (u64 shift = 1; shift < 8; ++shift) EXPECT_EQ(HashOf(room.data() + shift, count, 3), first);
+        for (u64 i = 0; i < count; ++i) {
+            room[i] ^= 1;
+            EXPECT_NE(HashOf(room.data(), count, 3), first) << count << " " << i;
+            room[i] ^= 1;
+        }
+    }
+}
+
+TEST(HashTest, StringsFeedTheBytesOfTheirUnits)
+{
+    char16_t const wide[] = u"abc\u00E9";
+    unsigned int const widest[] = {'a', 0x1F600, 'c', 0};
+    HashAccumulator a, b, c;
+    AddToHash(a, String8("abc"));
+    AddToHash(b, String16(wide));
+    AddToHash(c, String32(widest));
+    EXPECT_EQ(a.GetHash(), HashOf("abc", 3, 0));
+    EXPECT_EQ(b.GetHash(), HashOf(wide, 8, 0));
+    EXPECT_EQ(c.GetHash(), HashOf(widest, 12, 0));
+}
+
+TEST(HashTest, PointersAreHashedLowestByteFirst)
+{
+    // FNV-1a of eight zero bytes, and of the characters "foobar" with two zero bytes behind, step by step from the
+    // published value 0x85944171F73967E8 of "foobar".
+    EXPECT_EQ(HashConstVoidStar(nullptr), 0xA8C7F832281A39C5u);
+    u64 const prime = 0x100000001B3;
+    EXPECT_EQ(HashConstVoidStar(reinterpret_cast<void const*>(0x7261626F6F66)), 0x85944171F73967E8u * prime * prime);
+}
+
+TEST(HashTest, StringHashTakesBytesAsSigned)
+{
+    EXPECT_EQ(BaseCharTraits<char>::GenerateHash("", 0), 0u);
+    EXPECT_EQ(BaseCharTraits<char>::GenerateHash("a", 1), 0x9E3779B9u + 'a');
+    EXPECT_EQ(BaseCharTraits<char>::GenerateHash("\xFF", 1), 0x9E3779B8u);
+    EXPECT_EQ(BaseCharTraits<char16_t>::GenerateHash(u"\u00FF", 1), 0x9E3779B9u + 0xFF);
+    u32 const h = 0x9E3779B9u + 'a';
+    EXPECT_EQ(BaseCharTraits<char>::GenerateHash("ab", 2), 'b' + (h << 6) + (h >> 2) + 0x9E3779B9u);
+}
+
+} // namespace
+} // namespace Kernel
