@@ -57,6 +57,7 @@
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/FileStoreLink.h"
 #include "libkernel/filestore/FileStoreLoadContext.h"
+#include "libkernel/filestore/FileStoreLockRank.h"
 #include "libkernel/filestore/FileStoreOut.h"
 #include "libkernel/filestore/FileStoreOutPathGenerator.h"
 #include "libkernel/filestore/FileStorePostSaveInterface.h"

@@ -168,9 +168,9 @@ private:
     FileStoreItemType const* const m_type;
     CriticalSection m_loadLock;                  // Held over loads and backing. Outside every lock of a store.
     mutable std::atomic<void const*> m_loader{}; // Mark of the thread that holds m_loadLock, or null.
-    CriticalSectionSpin m_ownersLock;            // Inside the store lock.
-    OwnerMap m_owners;                           // Guarded by m_ownersLock.
-    CriticalSectionSpin m_itemLock;              // Inside the owners lock. Guards all that follows.
+    CriticalSectionSpin m_ownersLock{FileStoreLockRank::c_owners}; // Inside the store lock.
+    OwnerMap m_owners;                                             // Guarded by m_ownersLock.
+    CriticalSectionSpin m_itemLock{FileStoreLockRank::c_item};     // Inside the owners lock. Guards all that follows.
     bool m_loaded = false;
     bool m_loading = false;                          // A load is running; its item is not here yet.
     std::vector<Counted<FileStoreLink>> m_forgotten; // Stores that took their state back while a load was running.

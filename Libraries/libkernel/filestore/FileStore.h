@@ -127,7 +127,7 @@ private:
     void RemoveCS(DelayLoadHolder& holder);
 
     Counted<FileStoreLink> const m_link;
-    CriticalSectionSpin m_storeLock; // Guards all that follows.
+    CriticalSectionSpin m_storeLock{FileStoreLockRank::c_store}; // Guards all that follows.
     // The two directions of one relation. Holders are not kept alive: one takes itself out when it dies. A path may
     // have passed to another holder, and its first one is then in m_pathOfHolder alone.
     PathMap m_holderOfPath;

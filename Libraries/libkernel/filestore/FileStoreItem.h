@@ -43,7 +43,7 @@ protected:
 private:
     friend class DelayLoadHolder;
 
-    CriticalSectionSpin m_holderLock; // Inside a holder's item lock.
+    CriticalSectionSpin m_holderLock{FileStoreLockRank::c_holderOfItem}; // Inside a holder's item lock.
     DelayLoadHolder* m_holder = nullptr;
 };
 

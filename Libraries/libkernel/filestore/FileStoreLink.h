@@ -2,6 +2,7 @@
 
 #include "libkernel/concurrency/CriticalSection.h"
 #include "libkernel/core/Countable.h"
+#include "libkernel/filestore/FileStoreLockRank.h"
 
 #include <atomic>
 
@@ -33,9 +34,10 @@ private:
     /// The store's memory is about to go.
     void StoreDestroyed();
 
-    CriticalSectionSpin m_lock; // Keeps the store's memory valid while a pointer to it is in use. Before store locks.
-    std::atomic<FileStore*> m_store; // Null: dead to the outside.
-    FileStore* m_storeInMemory;      // Guarded by m_lock. Null once the store is destroyed.
+    CriticalSectionSpin m_lock{FileStoreLockRank::c_link}; // Keeps the store's memory valid while a pointer to it is in
+                                                           // use. Before store locks.
+    std::atomic<FileStore*> m_store;                       // Null: dead to the outside.
+    FileStore* m_storeInMemory;                            // Guarded by m_lock. Null once the store is destroyed.
 };
 
 } // namespace Kernel

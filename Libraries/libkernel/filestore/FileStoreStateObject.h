@@ -91,7 +91,8 @@ private:
     void SetDirtyStatePostLoad(NonCounted<FileStoreLink> link, DirtyState state, bool overwrite);
     void RemoveDirtyState(NonCounted<FileStoreLink> link);
 
-    CriticalSectionSpin m_stateLock; // The innermost lock of all: nothing is called under it.
+    CriticalSectionSpin m_stateLock{
+        FileStoreLockRank::c_state}; // The innermost lock of all: nothing is called under it.
     DirtyMap m_states;
 };
 
