@@ -1,8 +1,7 @@
-#include "libkernel/core/Trace.h"
 #include "libkernel/filestore/BackstoreException.h"
 #include "libkernel/filestore/VoidFileStore.h"
-#include "libkernel/platform/Debug.h"
 #include "support/MemoryFileStore.h"
+#include "support/TraceCapture.h"
 
 #include <gtest/gtest.h>
 
@@ -300,15 +299,10 @@ TEST(VoidFileStore, HasNothingAndTakesNothing)
 
 TEST(BackstoreException, IsTracedAndCarriesItsReason)
 {
-    static String8 s_traced;
-    Platform::SetDebugSink([](char const* text) { s_traced += text; });
-    bool const was = IsTraceEnabled();
-    SetIsTraceEnabled(true);
+    Kernel::Test::TraceCapture const capture;
     BackstoreException const exception(true);
-    SetIsTraceEnabled(was);
-    Platform::SetDebugSink(nullptr);
-    EXPECT_TRUE(s_traced.BeginsWith("== BackstoreException"));
-    EXPECT_TRUE(s_traced.EndsWith("\n"));
+    EXPECT_EQ(0u, Kernel::Test::TraceCapture::GetText().find("== BackstoreException"));
+    EXPECT_EQ('\n', Kernel::Test::TraceCapture::GetText().back());
     EXPECT_TRUE(exception.GetOutOfSpace());
 }
 

@@ -92,9 +92,9 @@ MemoryFileStore::~MemoryFileStore()
     if (!diesSuddenly) PreDestruction();
 }
 
-MemoryFileStore::Revision MemoryFileStore::Put(char const* path, char const* bytes, bool incremental)
+MemoryFileStore::Revision MemoryFileStore::Put(char const* path, String8 const& bytes, bool incremental)
 {
-    return Commit(path, String8(bytes), incremental);
+    return Commit(path, bytes, incremental);
 }
 
 MemoryFileStore::Revision MemoryFileStore::Delete(char const* path)

@@ -84,7 +84,7 @@ public:
     static Counted<MemoryFileStore> Create() { return Counted<MemoryFileStore>(new MemoryFileStore); }
 
     /// Commits a revision with this one change.
-    Revision Put(char const* path, char const* bytes, bool incremental = false);
+    Revision Put(char const* path, String8 const& bytes, bool incremental = false);
     Revision Delete(char const* path);
     /// A holder of the type that goes with the path.
     Counted<DelayLoadHolder> Hold(char const* path, FileStoreLoadContext* context = nullptr)

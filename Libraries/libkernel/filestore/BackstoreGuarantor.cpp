@@ -3,6 +3,7 @@
 #include "libkernel/filestore/BackstoreException.h"
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/VoidFileStore.h"
+#include "libkernel/serialisation/OutSerialiserFile.h"
 #include "libkernel/streams/NullOutStream.h"
 
 #include <unordered_set>
@@ -102,6 +103,20 @@ bool BackstoreGuarantor::Process(Counted<FileStoreItem const> const& item, Count
         HolderEnumerator enumerator;
         enumerator.AddItem(item);
         return BackHolders(enumerator, store.Get());
+    } catch (BackstoreException const&) {
+        return false;
+    }
+}
+
+bool BackstoreGuarantor::Process(Serialisable const& object)
+{
+    try {
+        HolderEnumerator enumerator;
+        Counted<NullOutStream> const stream(new NullOutStream);
+        OutSerialiserFile file(*stream, enumerator, IDTag("Item"), 0);
+        file.SaveObject(IDTag("Item"), NonCounted<Serialisable const>(&object));
+        file.Close();
+        return BackHolders(enumerator, nullptr);
     } catch (BackstoreException const&) {
         return false;
     }
