@@ -1,6 +1,5 @@
 #include "libkernel/filestore/FileStoreOut.h"
 
-#include "libkernel/core/Abortable.h"
 #include "libkernel/core/Exception.h"
 #include "libkernel/filestore/FileStoreOutPathGenerator.h"
 
@@ -28,11 +27,6 @@ void FileStoreOut::CreateFile(Counted<DelayLoadHolder> holder)
 void FileStoreOut::CreateFile(String8 const& path, Counted<FileStoreItem const> const& item)
 {
     CreateFile(path, item, Counted<FileStoreCompressionHint>());
-}
-
-bool FileStoreOut::IsAbortRequested() const
-{
-    return IsAbortFlagSet(m_abort);
 }
 
 void FileStoreOut::TestAbort() const

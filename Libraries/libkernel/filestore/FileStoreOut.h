@@ -1,6 +1,7 @@
 #pragma once
 
 #include "libkernel/concurrency/CriticalSection.h"
+#include "libkernel/core/Abortable.h"
 #include "libkernel/core/String.h"
 #include "libkernel/filestore/DelayLoadHolder.h"
 #include "libkernel/filestore/FileStoreCompressionHint.h"
@@ -62,7 +63,7 @@ public:
     bool IsFullSave() const { return m_purpose == PurposeSave; }
 
     /// True if an abort flag was given and is set. Reads it atomically, since another thread sets it.
-    bool IsAbortRequested() const;
+    bool IsAbortRequested() const { return m_abort && IsAbortFlagSet(m_abort); }
     /// Throws AbortException if the abort flag is set. Sets nothing: who gives the save up calls SetAborted.
     void TestAbort() const;
     bool WasAborted() const { return m_aborted.load(std::memory_order_acquire); }

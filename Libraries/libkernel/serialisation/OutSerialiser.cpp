@@ -10,6 +10,7 @@
 #include "libkernel/serialisation/OutSerialiserObjectList.h"
 #include "libkernel/serialisation/OutSerialiserTarget.h"
 #include "libkernel/serialisation/internal/DefaultTable.h"
+#include "libkernel/serialisation/internal/OutSerialiserInline.h"
 #include "libkernel/serialisation/internal/PropWriter.h"
 
 #include <bit>
@@ -21,8 +22,6 @@ namespace Kernel {
 static_assert(std::endian::native == std::endian::little);
 
 namespace {
-
-constexpr u64 c_tagHeaderSize = 5; // Type byte and tag.
 
 bool CompareBools(Defaults::DefaultTypeArray const& item, bool const* values, u64 count)
 {
@@ -69,38 +68,6 @@ void OutSerialiser::Fail(int code, std::source_location where) const
     throw SaveException(where.file_name(), static_cast<int>(where.line()), code);
 }
 
-u8* OutSerialiser::ClaimI(u64 count)
-{
-    u8* const room = m_target.Claim(count);
-    if (!room) Fail(SaveException::ShortWrite);
-    return room;
-}
-
-void OutSerialiser::PutI(void const* bytes, u64 count)
-{
-    if (!m_target.Put(bytes, count)) Fail(SaveException::ShortWrite);
-}
-
-u8* OutSerialiser::PutHeaderI(IDTag tag, u8 type, u64 more)
-{
-    u8* const room = ClaimI(c_tagHeaderSize + more);
-    room[0] = type;
-    StoreLittleEndian(room + 1, tag.value);
-    return room + c_tagHeaderSize;
-}
-
-u32 OutSerialiser::CheckCountI(u64 count) const
-{
-    if (count > std::numeric_limits<u32>::max()) Fail(SaveException::TooLarge);
-    return static_cast<u32>(count);
-}
-
-u16 OutSerialiser::CheckShortI(u64 size) const
-{
-    if (size > std::numeric_limits<u16>::max()) Fail(SaveException::TooLarge);
-    return static_cast<u16>(size);
-}
-
 int OutSerialiser::CheckLengthI(u64 length) const
 {
     if (length > static_cast<u64>(std::numeric_limits<int>::max())) Fail(SaveException::TooLarge);
@@ -113,31 +80,42 @@ bool OutSerialiser::IsDefaultI(IDTag tag, Test const& test) const
     return m_defaults && m_defaults->Any(tag, test);
 }
 
-void OutSerialiser::StartI(IDTag tag)
+void OutSerialiser::AbortI()
 {
-    if (m_store.IsAbortRequested()) {
-        m_store.SetAborted();
-        throw AbortException();
-    }
-    if (m_isClosed) Fail(SaveException::Misuse);
-    if (m_isChildActive || !m_usedTags.Add(tag)) Fail(SaveException::TagOrChild);
+    m_store.SetAborted();
+    throw AbortException();
+}
+
+void OutSerialiser::SaveScalarI(IDTag tag, PropType type, u64 bits, u32 size)
+{
+    if (!m_isFullSave) return;
+    StartI(tag);
+    if (IsDefaultI(tag, [&](DefaultTable::Row const& row) { return row.EqualsScalar(type, bits, size); })) return;
+    // Two stores whatever the size: each runs past what counts, and what comes next covers the rest.
+    u8* const to = m_target.Reserve(c_tagHeaderSize + sizeof bits);
+    if (!to) Fail(SaveException::ShortWrite);
+    StoreLittleEndian(to, u64{tag.value} << 8 | static_cast<u8>(type));
+    StoreLittleEndian(to + c_tagHeaderSize, bits);
+    m_target.Advance(c_tagHeaderSize + size);
 }
 
 void OutSerialiser::SaveTypeI(IDTag tag, PropType type, void const* value, u64 size)
 {
     if (!m_isFullSave) return;
-    StartI(tag);
     u8 const number = static_cast<u8>(type);
-    if (size == 0 || number >= c_propTypeCount || c_propSizes[number] != size) Fail(SaveException::Misuse);
-    if (IsDefaultI(tag, [&](DefaultTable::Row const& row) { return row.EqualsScalar(type, value, size); })) return;
-    u8* const to = PutHeaderI(tag, number, size);
-    switch (size) {
-    // Copies of a known size are one store.
-    case 1: *to = *static_cast<u8 const*>(value); return;
-    case 4: std::memcpy(to, value, 4); return;
-    case 8: std::memcpy(to, value, 8); return;
-    default: std::memcpy(to, value, size); return;
+    bool const isSound = size != 0 && number < c_propTypeCount && c_propSizes[number] == size;
+    if (isSound && size <= sizeof(u64)) {
+        u64 bits = 0;
+        std::memcpy(&bits, value, size);
+        return SaveScalarI(tag, type, bits, static_cast<u32>(size));
     }
+    StartI(tag);
+    if (!isSound) Fail(SaveException::Misuse);
+    auto const equals = [&](DefaultTable::Row const& row) {
+        auto const* const item = row.As<Defaults::DefaultType>();
+        return item && item->Compare(type, value, size);
+    };
+    if (!IsDefaultI(tag, equals)) std::memcpy(PutHeaderI(tag, number, size), value, size);
 }
 
 void OutSerialiser::SaveTypeArrayI(IDTag tag, PropType type, void const* values, u64 unitSize, u64 count)
@@ -160,8 +138,7 @@ void OutSerialiser::SaveTypeArrayI(IDTag tag, PropType type, void const* values,
 
 void OutSerialiser::SaveBoolI(IDTag tag, bool value)
 {
-    u8 const byte = value ? 1 : 0;
-    SaveTypeI(tag, PropType::Bool, &byte, 1);
+    SaveScalarI(tag, PropType::Bool, value ? 1 : 0, 1);
 }
 
 template <class Bools>
@@ -192,11 +169,6 @@ void OutSerialiser::SaveTypes(IDTag tag, std::vector<bool> const& values)
 void OutSerialiser::SaveTypes(IDTag tag, std::deque<bool> const& values)
 {
     SaveTypes(tag, std::vector<bool>(values.begin(), values.end()));
-}
-
-void OutSerialiser::SaveType(IDTag tag, String8 const& text)
-{
-    SaveStringI(tag, text.GetData(), static_cast<u64>(text.GetLength()));
 }
 
 void OutSerialiser::SaveType(IDTag tag, String16 const& text)

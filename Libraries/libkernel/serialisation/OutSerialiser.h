@@ -105,14 +105,17 @@ public:
     template <PropValue T>
     void SaveType(IDTag tag, T const& value)
     {
-        SaveTypeI(tag, PropTypeOf<T>(), &value, sizeof(T));
+        SaveScalarI(tag, PropTypeOf<T>(), PropBits(value), sizeof(T));
     }
     template <std::same_as<bool> T>
     void SaveType(IDTag tag, T value)
     {
         SaveBoolI(tag, value);
     }
-    void SaveType(IDTag tag, String8 const& text);
+    void SaveType(IDTag tag, String8 const& text)
+    {
+        SaveStringI(tag, text.GetData(), static_cast<u64>(text.GetLength()));
+    }
     /// Stored as UTF-8.
     void SaveType(IDTag tag, String16 const& text);
     void SaveType(IDTag tag, String32 const& text);
@@ -215,7 +218,12 @@ public:
     {
         StartObjectArrayTestI(tag);
         StartObjectArrayBeginI(tag, std::ranges::size(objects));
-        for (auto const& object : objects) SaveObjectI(object, isOwner);
+        auto const end = std::ranges::end(objects);
+        for (auto at = std::ranges::begin(objects); at != end;) {
+            NonCounted<Serialisable const> const object(*at);
+            if (++at != end) PrefetchI(NonCounted<Serialisable const>(*at).Get());
+            SaveObjectI(object, isOwner);
+        }
     }
     /// A sized range of Consolidated.
     template <std::ranges::sized_range R>
@@ -374,6 +382,8 @@ private:
     void StartI(IDTag tag);
     void PutRawDataI(IDTag tag, void const* bytes, u64 size);
     void PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes);
+    [[noreturn]] void AbortI();
+    void SaveScalarI(IDTag tag, PropType type, u64 bits, u32 size);
     void SaveBoolI(IDTag tag, bool value);
     template <class Bools>
     void SaveBoolsI(IDTag tag, Bools const& values, u64 count);
@@ -388,6 +398,7 @@ private:
         value.Save(child);
         child.Close();
     }
+    void PrefetchI(Serialisable const* next) const;
     void PutObjectRecordI(ObjectRecord kind, u32 index);
     template <class T>
     void SaveObjectBodyI(T const& object, u32 index);

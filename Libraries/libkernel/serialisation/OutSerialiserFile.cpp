@@ -4,6 +4,7 @@
 #include "libkernel/core/Endian.h"
 #include "libkernel/filestore/FileStoreOut.h"
 #include "libkernel/filestore/VoidFileStore.h"
+#include "libkernel/serialisation/internal/OutSerialiserInline.h"
 
 #include <exception>
 

@@ -8,45 +8,45 @@ namespace Kernel {
 OutSerialiserObjectList::OutSerialiserObjectList() = default;
 OutSerialiserObjectList::~OutSerialiserObjectList() = default;
 
-// The object's record, or the free one where it belongs. Objects lie at multiples of 16 and often in a row: the
-// product's upper half spreads them.
-OutSerialiserObjectList::Record* OutSerialiserObjectList::Map::Probe(void const* object) const
-{
-    u64 const mixed = reinterpret_cast<std::uintptr_t>(object) * 0x9E3779B97F4A7C15ull;
-    u32 place = static_cast<u32>(mixed >> 32) & (size - 1);
-    while (records[place].object && records[place].object != object) place = (place + 1) & (size - 1);
-    return &records[place];
-}
-
 void OutSerialiserObjectList::Map::Grow()
 {
     Map larger;
-    larger.size = size ? size * 2 : c_firstSize;
+    larger.size = size ? size * 4 : c_firstSize;
     larger.used = used;
-    larger.records = std::make_unique<Record[]>(larger.size);
-    for (u32 i = 0; i < size; ++i)
-        if (records[i].object) *larger.Probe(records[i].object) = records[i];
+    larger.slots = std::make_unique<Slot[]>(larger.size);
+    for (u32 i = 0; i < size; ++i) {
+        if (!slots[i].place) continue;
+        u32 at = slots[i].hash & (larger.size - 1);
+        while (larger.slots[at].place) at = (at + 1) & (larger.size - 1);
+        larger.slots[at] = slots[i];
+    }
     *this = std::move(larger);
 }
 
-OutSerialiserObjectList::Record& OutSerialiserObjectList::FindOrAddI(Map& map, void const* object, bool& isNew)
+OutSerialiserObjectList::Record& OutSerialiserObjectList::FindOrAddI(Map& map, void const* object, u32& index,
+                                                                     bool& isNew)
 {
     if (map.used >= map.size / 4 * 3) map.Grow();
-    Record& record = *map.Probe(object);
-    isNew = !record.object;
-    ++record.references;
-    if (!isNew) return record;
+    u32 const hash = GetHash(object);
+    u32 const mask = map.size - 1;
+    u32 at = hash & mask;
+    for (; map.slots[at].place; at = (at + 1) & mask) {
+        if (map.slots[at].hash != hash) continue;
+        index = map.slots[at].place - 1;
+        Record& record = GetRecord(index);
+        if (record.object != object) continue;
+        ++record.references;
+        isNew = false;
+        return record;
+    }
     ++map.used;
-    record.object = object;
-    record.index = m_nextIndex++;
+    index = m_nextIndex++;
+    map.slots[at] = {hash, index + 1};
+    if (index % c_pieceSize == 0) m_records.push_back(std::make_unique_for_overwrite<Record[]>(c_pieceSize));
+    isNew = true;
+    Record& record = GetRecord(index);
+    record = {object, 1, 0, 0};
     return record;
-}
-
-OutSerialiserObjectList::Record* OutSerialiserObjectList::FindShared(void const* object)
-{
-    if (!m_sharedObjects.size) return nullptr;
-    Record* const record = m_sharedObjects.Probe(object);
-    return record->object ? record : nullptr;
 }
 
 bool OutSerialiserObjectList::IsDescribed(ClassPropertiesBase const* description) const

@@ -19,11 +19,10 @@ class KERNEL_API OutSerialiserObjectList
 public:
     struct Record
     {
-        void const* object = nullptr;
-        u32 index = 0;
-        u32 references : 30 = 0;
-        u32 isOwned : 1 = 0;   ///< Some owner saved the object.
-        u32 isWriting : 1 = 0; ///< The object is being written: it lies in the set that stops a cycle.
+        void const* object;
+        u32 references : 30;
+        u32 isOwned : 1;   ///< Some owner saved the object.
+        u32 isWriting : 1; ///< The object is being written: it lies in the set that stops a cycle.
     };
 
     OutSerialiserObjectList();
@@ -31,11 +30,22 @@ public:
     OutSerialiserObjectList& operator=(OutSerialiserObjectList const&) = delete;
     ~OutSerialiserObjectList();
 
-    /// The object's record, entered with the next index if there was none; then @p isNew is true. The reference is good
-    /// until the next call. Plain and shared objects have a map each and one counter of indices.
-    Record& FindOrAdd(void const* object, bool& isNew) { return FindOrAddI(m_objects, object, isNew); }
-    Record& FindOrAddShared(void const* object, bool& isNew) { return FindOrAddI(m_sharedObjects, object, isNew); }
-    Record* FindShared(void const* object);
+    /// The object's record, entered with the next index if there was none; then @p isNew is true. The reference stays
+    /// good. Plain and shared objects have a map each and one counter of indices.
+    Record& FindOrAdd(void const* object, u32& index, bool& isNew)
+    {
+        return FindOrAddI(m_objects, object, index, isNew);
+    }
+    Record& FindOrAddShared(void const* object, u32& index, bool& isNew)
+    {
+        return FindOrAddI(m_sharedObjects, object, index, isNew);
+    }
+
+    /// A plain object is asked for soon.
+    void Prefetch(void const* object) const
+    {
+        if (m_objects.size) __builtin_prefetch(&m_objects.slots[GetHash(object) & (m_objects.size - 1)]);
+    }
 
     bool IsDescribed(ClassPropertiesBase const* description) const;
     void MarkAsDescribed(ClassPropertiesBase const* description);
@@ -48,21 +58,40 @@ public:
     void KeepAlive(Counted<Countable const> const& object) { m_keptAlive.push_back(object); }
 
 private:
-    // Open addressing with linear probing; the size is a power of two and more than a quarter is always free.
+    // Open addressing with linear probing; the size is a power of two and a quarter is always free. The hash is kept,
+    // so that a look-up goes to the records only for the object itself.
+    struct Slot
+    {
+        u32 hash;
+        u32 place; // Index plus 1; 0 is a free slot.
+    };
     struct Map
     {
-        static constexpr u32 c_firstSize = 32;
-        std::unique_ptr<Record[]> records;
+        static constexpr u32 c_firstSize = 64;
+        std::unique_ptr<Slot[]> slots;
         u32 size = 0;
         u32 used = 0;
 
-        Record* Probe(void const* object) const;
         void Grow();
     };
-    Record& FindOrAddI(Map& map, void const* object, bool& isNew);
+    // Records lie in pieces in the order of their indices: they never move, and pieces of this size come back warm from
+    // the save before.
+    static constexpr u32 c_pieceSize = 256;
+
+    // Objects lie at multiples of 16. Neighbours within a page stay neighbours, since objects that were made together
+    // are often saved together; pages are spread.
+    static u32 GetHash(void const* object)
+    {
+        u64 const address = reinterpret_cast<std::uintptr_t>(object);
+        u64 const page = (address >> 12) * 0x9E3779B97F4A7C15ull;
+        return static_cast<u32>(page >> 32) + static_cast<u32>(address >> 4 & 0xFF);
+    }
+    Record& FindOrAddI(Map& map, void const* object, u32& index, bool& isNew);
+    Record& GetRecord(u32 index) const { return m_records[index / c_pieceSize][index % c_pieceSize]; }
 
     Map m_objects;
     Map m_sharedObjects;
+    std::vector<std::unique_ptr<Record[]>> m_records;
     u32 m_nextIndex = 0;
     bool m_isHandlingException = false;
     mutable ClassPropertiesBase const* m_lastDescribed = nullptr; // Of the last successful question.

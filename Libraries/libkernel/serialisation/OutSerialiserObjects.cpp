@@ -9,6 +9,7 @@
 #include "libkernel/serialisation/OutSerialiser.h"
 #include "libkernel/serialisation/OutSerialiserObjectList.h"
 #include "libkernel/serialisation/internal/DefaultTable.h"
+#include "libkernel/serialisation/internal/OutSerialiserInline.h"
 #include "libkernel/serialisation/internal/PropWriter.h"
 
 // Objects, classes and references to stored items. Each structure has two forms here: the one that writes, and the one
@@ -63,6 +64,14 @@ void OutSerialiser::StartObjectArrayBeginI(IDTag tag, u64 count)
     StoreLittleEndian(PutHeaderI(tag, c_objectType | c_propArrayBit, 4), stored);
 }
 
+// Objects and the map lie all over memory. The next of a row is on its way while this one is saved, which for most
+// objects of a tree is over soon.
+void OutSerialiser::PrefetchI(Serialisable const* next) const
+{
+    __builtin_prefetch(next);
+    m_objects.Prefetch(next);
+}
+
 void OutSerialiser::PutObjectRecordI(ObjectRecord kind, u32 index)
 {
     u8* const to = ClaimI(5);
@@ -77,13 +86,14 @@ void OutSerialiser::SaveObjectI(NonCounted<Serialisable const> object, bool isOw
         *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
         return;
     }
+    u32 index = 0;
     bool isNew = false;
-    auto& record = m_objects.FindOrAdd(object.Get(), isNew);
+    auto& record = m_objects.FindOrAdd(object.Get(), index, isNew);
     record.isOwned |= isOwner;
     if (isNew)
-        SaveObjectBodyI(*object, record.index);
+        SaveObjectBodyI(*object, index);
     else
-        PutObjectRecordI(ObjectRecord::Back, record.index);
+        PutObjectRecordI(ObjectRecord::Back, index);
 }
 
 void OutSerialiser::SaveSharedObjectI(Consolidated<SharedSerialisable> const& object)
@@ -93,13 +103,14 @@ void OutSerialiser::SaveSharedObjectI(Consolidated<SharedSerialisable> const& ob
         *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
         return;
     }
+    u32 index = 0;
     bool isNew = false;
-    auto& record = m_objects.FindOrAddShared(object.Get(), isNew);
+    auto& record = m_objects.FindOrAddShared(object.Get(), index, isNew);
     if (record.isWriting) Fail(SaveException::Misuse);
-    if (!isNew) return PutObjectRecordI(ObjectRecord::Back, record.index);
+    if (!isNew) return PutObjectRecordI(ObjectRecord::Back, index);
     record.isWriting = true;
-    SaveObjectBodyI(*object, record.index);
-    m_objects.FindShared(object.Get())->isWriting = false;
+    SaveObjectBodyI(*object, index);
+    record.isWriting = false;
 }
 
 // On an exception the mark of the active child stays, so that nobody writes on behind half an object.
@@ -212,20 +223,22 @@ void OutSerialiser::SaveDefaultI(Defaults::DefaultBase const& item)
 
 void OutSerialiser::SaveObjectEnumeratePathsOnlyI(Serialisable const& object)
 {
+    u32 index = 0;
     bool isNew = false;
-    m_objects.FindOrAdd(&object, isNew);
+    m_objects.FindOrAdd(&object, index, isNew);
     if (isNew) EnumerateObjectBodyI(object);
 }
 
 void OutSerialiser::SaveSharedObjectEnumeratePathsOnlyI(SharedSerialisable const& object)
 {
+    u32 index = 0;
     bool isNew = false;
-    auto& record = m_objects.FindOrAddShared(&object, isNew);
+    auto& record = m_objects.FindOrAddShared(&object, index, isNew);
     if (record.isWriting) Fail(SaveException::Misuse);
     if (!isNew) return;
     record.isWriting = true;
     EnumerateObjectBodyI(object);
-    m_objects.FindShared(&object)->isWriting = false;
+    record.isWriting = false;
 }
 
 template <class T>

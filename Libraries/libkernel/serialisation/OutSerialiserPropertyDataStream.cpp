@@ -2,6 +2,7 @@
 
 #include "libkernel/core/ConvertEnc.h"
 #include "libkernel/core/Endian.h"
+#include "libkernel/serialisation/internal/OutSerialiserInline.h"
 #include "libkernel/serialisation/internal/PropWriter.h"
 
 #include <cstring>

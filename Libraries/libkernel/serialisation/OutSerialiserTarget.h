@@ -25,12 +25,15 @@ public:
     OutSerialiserTarget(OutSerialiserTarget const&) = delete;
     OutSerialiserTarget& operator=(OutSerialiserTarget const&) = delete;
 
-    /// Room for @p count bytes, at most c_maxClaim, which the caller fills at once. Null when the stream failed.
+    /// Room for @p count bytes, at most c_maxClaim; Advance then takes as many of them as were filled. Null when the
+    /// stream failed.
+    u8* Reserve(u64 count) { return count <= static_cast<u64>(m_end - m_next) || Flush() ? m_next : nullptr; }
+    void Advance(u64 count) { m_next += count; }
+    /// Both at once: the caller fills the whole room.
     u8* Claim(u64 count)
     {
-        if (count > static_cast<u64>(m_end - m_next) && !Flush()) return nullptr;
-        u8* const room = m_next;
-        m_next += count;
+        u8* const room = Reserve(count);
+        if (room) m_next += count;
         return room;
     }
     /// False when the stream failed.

@@ -4,6 +4,7 @@
 #include "libkernel/core/Types.h"
 
 #include <array>
+#include <bit>
 #include <concepts>
 #include <type_traits>
 
@@ -195,6 +196,20 @@ constexpr PropType PropTypeOf()
         constexpr u8 step = sizeof(V) == 1 ? 0 : sizeof(V) == 2 ? 1 : sizeof(V) == 4 ? 2 : 3;
         return static_cast<PropType>((std::is_signed_v<V> ? 5 : 1) + step);
     }
+}
+
+/// The number that the bytes of a value make on the wire.
+template <PropValue T>
+constexpr u64 PropBits(T const& value)
+{
+    if constexpr (std::integral<T>)
+        return static_cast<std::make_unsigned_t<T>>(value);
+    else if constexpr (std::same_as<T, float>)
+        return std::bit_cast<u32>(value);
+    else if constexpr (std::same_as<T, double>)
+        return std::bit_cast<u64>(value);
+    else
+        return value.value;
 }
 
 } // namespace Kernel

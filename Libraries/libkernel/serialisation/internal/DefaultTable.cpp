@@ -15,7 +15,7 @@ DefaultTable::Row MakeRow(Defaults::DefaultBase const& item)
     if (!scalar || scalar->GetBytes().size() > sizeof row.value) return row;
     row.type = scalar->GetPropType();
     row.size = static_cast<u8>(scalar->GetBytes().size());
-    std::memcpy(&row.value, scalar->GetBytes().data(), row.size);
+    for (u32 i = 0; i < row.size; ++i) row.value |= u64{scalar->GetBytes()[i]} << (8 * i);
     return row;
 }
 

@@ -22,7 +22,7 @@ public:
         Defaults::DefaultItemType kind;
         PropType type; // The next three are set for a scalar of at most 8 bytes; size is 0 otherwise.
         u8 size;
-        u64 value; // Its bytes as a little-endian number.
+        u64 value; // The number that its bytes make.
         Defaults::DefaultBase const* item;
 
         /// The item as a @p D, or null if it is of another kind.
@@ -31,13 +31,9 @@ public:
         {
             return kind == D::c_kind ? static_cast<D const*>(item) : nullptr;
         }
-        bool EqualsScalar(PropType valueType, void const* bytes, u64 count) const
+        bool EqualsScalar(PropType valueType, u64 bits, u32 count) const
         {
-            if (size == 0) {
-                auto const* const scalar = As<Defaults::DefaultType>();
-                return scalar && scalar->Compare(valueType, bytes, count);
-            }
-            return size == count && type == valueType && std::memcmp(&value, bytes, count) == 0;
+            return size == count && type == valueType && value == bits;
         }
     };
 

@@ -2,7 +2,7 @@
 
 #include "libkernel/core/ConvertEnc.h"
 #include "libkernel/core/Endian.h"
-#include "libkernel/serialisation/OutSerialiser.h"
+#include "libkernel/serialisation/internal/OutSerialiserInline.h"
 
 #include <algorithm>
 #include <vector>
