@@ -14,6 +14,9 @@ KERNEL_API void YieldThread();
 /// Starts a thread that nobody joins, with every signal blocked. False if the system has no more.
 KERNEL_API bool StartDetachedThread(void (*run)(void*), void* context);
 
+/// Calls @p run in every child process that this one forks from here on, before the fork returns there.
+KERNEL_API void RunInChildProcesses(void (*run)());
+
 /// True if that thread of this process runs or waits only for a processor.
 KERNEL_API bool IsThreadRunnable(u64 id);
 

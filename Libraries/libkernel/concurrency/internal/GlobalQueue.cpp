@@ -8,7 +8,6 @@
 #include <atomic>
 #include <memory>
 #include <mutex>
-#include <pthread.h>
 #include <vector>
 
 // One lock guards three rings of pending jobs and the census of the workers. It is held for some tens of nanoseconds at
@@ -355,7 +354,7 @@ Pool& GetPool()
 {
     static bool const made = [] {
         BeginAnew();
-        ::pthread_atfork(nullptr, nullptr, BeginAnew);
+        Platform::RunInChildProcesses(BeginAnew);
         return true;
     }();
     (void)made;

@@ -69,6 +69,11 @@ void YieldThread()
     ::sched_yield();
 }
 
+void RunInChildProcesses(void (*run)())
+{
+    ::pthread_atfork(nullptr, nullptr, run);
+}
+
 bool StartDetachedThread(void (*run)(void*), void* context)
 {
     std::unique_ptr<Start> start(new (std::nothrow) Start{run, context});
