@@ -39,7 +39,12 @@ TEST(AssertTrapDeathTest, SecondTrapAndFailedAssertionEndTheProcess)
             Trap two;
         },
         "");
-    EXPECT_DEATH(FailAssertion("f", "c", 1), "");
+    EXPECT_DEATH(FailAssertion("f", "c", 1), "c");
+#if !defined(NDEBUG)
+    int const five = 5;
+    KERNEL_ASSERT(five == 5);
+    EXPECT_DEATH(KERNEL_ASSERT(five == 4), "five == 4");
+#endif
 }
 
 } // namespace

@@ -4,7 +4,7 @@
 
 namespace Kernel {
 
-/// Tells the AssertTrap of the host, then ends the process.
+/// Tells the AssertTrap of the host and standard error, then ends the process.
 [[noreturn]] KERNEL_API void FailAssertion(char const* file, char const* condition, int line);
 
 } // namespace Kernel

@@ -1,8 +1,8 @@
 #include "libkernel/core/AssertTrap.h"
 
 #include "libkernel/core/Assert.h"
+#include "libkernel/platform/Debug.h"
 
-#include <cstdlib>
 #include <cstring>
 #include <string>
 
@@ -38,7 +38,8 @@ AssertTrap::AssertTrap()
 {
     GetSourceRoot();
     AssertTrap* none = nullptr;
-    if (!s_pInstance.compare_exchange_strong(none, this)) std::abort();
+    if (!s_pInstance.compare_exchange_strong(none, this))
+        Platform::FailAssertion("a second assert trap was made", __FILE__, __LINE__);
 }
 
 AssertTrap::~AssertTrap()
@@ -58,7 +59,7 @@ void AssertTrap::NotifyAssert(char const* file, char const* message, int line)
 void FailAssertion(char const* file, char const* condition, int line)
 {
     AssertTrap::NotifyAssert(file, condition, line);
-    std::abort();
+    Platform::FailAssertion(condition, file, line);
 }
 
 } // namespace Kernel

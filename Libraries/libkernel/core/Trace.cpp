@@ -1,6 +1,7 @@
 #include "libkernel/core/Trace.h"
 
 #include "libkernel/platform/Debug.h"
+#include "libkernel/platform/Lock.h"
 
 #include <atomic>
 #include <cstdlib>
@@ -17,6 +18,8 @@ enum class TraceState : u8
 };
 
 std::atomic<TraceState> s_state{TraceState::Unknown};
+constinit Platform::RecursiveLock s_lock(4000,
+                                         0); // Keeps texts whole: tries as long as short locks do, outside the order.
 
 TraceState FindState()
 {
@@ -34,7 +37,10 @@ void Trace(String8 const& text)
 
 void Trace(char const* text)
 {
-    if (text && IsTraceEnabled()) Platform::WriteDebugOutput(text);
+    if (!text || !IsTraceEnabled()) return;
+    s_lock.Acquire();
+    Platform::WriteDebugOutput(text);
+    s_lock.Release();
 }
 
 bool IsTraceEnabled()

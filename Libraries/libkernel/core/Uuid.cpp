@@ -1,6 +1,5 @@
 #include "libkernel/core/Uuid.h"
 
-#include "libkernel/core/BaseCharTraits.h"
 #include "libkernel/core/Hash.h"
 #include "libkernel/platform/Random.h"
 
@@ -24,7 +23,7 @@ int DigitValue(char c)
 
 } // namespace
 
-Uuid const Uuid::Null{Uuid::NullTag{}};
+constinit Uuid const Uuid::Null{Uuid::NullTag{}};
 
 Uuid::Uuid()
 {
@@ -80,11 +79,15 @@ String8 Uuid::ToString() const
     return text;
 }
 
+// Upper-case digits sort as their values do, so the bytes in the order of the text decide as the texts would.
 bool operator<(Uuid const& a, Uuid const& b)
 {
-    String8 const textA = a.ToString();
-    String8 const textB = b.ToString();
-    return BaseCharTraits<char>::Compare(textA.GetData(), textA.GetLength(), textB.GetData(), textB.GetLength()) < 0;
+    for (int place : c_order) {
+        if (place < 0) continue;
+        auto const i = static_cast<size_t>(place);
+        if (a.m_bytes[i] != b.m_bytes[i]) return a.m_bytes[i] < b.m_bytes[i];
+    }
+    return false;
 }
 
 } // namespace Kernel
