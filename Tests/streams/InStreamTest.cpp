@@ -1,0 +1,139 @@
+#include "libkernel/streams/InStream.h"
+
+#include "StreamTestSupport.h"
+
+#include <gtest/gtest.h>
+
+namespace Kernel {
+namespace {
+
+using namespace Test;
+
+constexpr u64 c_piece = 1 << 20;
+
+TEST(InStreamTest, NumbersAreLittleEndianAndOneTransferEach)
+{
+    auto out = MakeCounted<PlainTarget>();
+    *out << static_cast<signed char>(-2) << static_cast<unsigned char>(0xFE) << static_cast<short>(-2)
+         << static_cast<unsigned short>(0x1234) << -3 << 0x12345678u << i64{-4} << u64{0x123456789ABCDEF0};
+    EXPECT_EQ(out->writes, (std::vector<u64>{1, 1, 2, 2, 4, 4, 8, 8}));
+    EXPECT_EQ(out->text, std::string("\xFE\xFE\xFE\xFF\x34\x12\xFD\xFF\xFF\xFF\x78\x56\x34\x12"
+                                     "\xFC\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xF0\xDE\xBC\x9A\x78\x56\x34\x12",
+                                     30));
+
+    auto in = MakeCounted<PlainSource>(out->text);
+    signed char a;
+    unsigned char b;
+    short c;
+    unsigned short d;
+    int e;
+    unsigned int f;
+    i64 g;
+    u64 h;
+    *in >> a >> b >> c >> d >> e >> f >> g >> h;
+    EXPECT_EQ(in->reads, out->writes);
+    EXPECT_EQ(std::make_tuple(a, b, c, d, e, f, g, h),
+              std::make_tuple(-2, 0xFE, -2, 0x1234, -3, 0x12345678u, i64{-4}, u64{0x123456789ABCDEF0}));
+}
+
+TEST(InStreamTest, ATypedTransferThatComesUpShortThrowsAndChangesNothing)
+{
+    auto in = MakeCounted<PlainSource>("abc");
+    int value = 7;
+    EXPECT_THROW(*in >> value, InStream::ReadException);
+    EXPECT_EQ(value, 7);
+
+    auto out = MakeCounted<PlainTarget>();
+    out->room = 3;
+    EXPECT_THROW(*out << value, OutStream::WriteException);
+}
+
+TEST(InStreamTest, TheGeneralCopyGoesInMebibytesAndReportsEach)
+{
+    std::string const text = Pattern(2 * c_piece + 5);
+    for (bool const fromTarget : {false, true}) {
+        SCOPED_TRACE(fromTarget);
+        auto in = MakeCounted<PlainSource>(text);
+        auto out = MakeCounted<PlainTarget>();
+        char first;
+        in->ReadBlock(&first, 1);
+        ProgressLog log;
+        EXPECT_TRUE(fromTarget ? out->CopyFromStream(*in, &log) : in->CopyToStream(*out, &log));
+        EXPECT_EQ(out->text, text.substr(1));
+        EXPECT_EQ(out->writes, (std::vector<u64>{c_piece, c_piece, 4}));
+        u64 const total = text.size() - 1;
+        EXPECT_EQ(log.reports, (Reports{{0, total}, {c_piece, total}, {2 * c_piece, total}, {total, total}}));
+    }
+}
+
+TEST(InStreamTest, TheGeneralCopyFailsWhereASideStopsEarly)
+{
+    auto in = MakeCounted<PlainSource>(Pattern(100));
+    in->silentFrom = 60;
+    auto out = MakeCounted<PlainTarget>();
+    EXPECT_FALSE(in->CopyToStream(*out));
+    EXPECT_EQ(out->text, Pattern(100).substr(0, 60)) << "what came must have been written";
+
+    auto narrow = MakeCounted<PlainTarget>();
+    narrow->room = 99;
+    ProgressLog log;
+    EXPECT_FALSE(narrow->CopyFromStream(*MakeCounted<PlainSource>(Pattern(100)), &log));
+    EXPECT_EQ(log.reports, (Reports{{0, 100}}));
+}
+
+TEST(InStreamTest, ASourceWithoutASizeIsCopiedWholeByEveryTarget)
+{
+    auto in = MakeCounted<PlainSource>(Pattern(5000));
+    in->sized = false;
+    auto memory = MakeCounted<MemoryInOutStream>();
+    EXPECT_TRUE(memory->CopyFromStream(*in));
+    EXPECT_EQ(Content(*memory), Pattern(5000));
+}
+
+/// Counts seeks and can refuse them, to look at the default of WriteBlockAtPos.
+class SeekableTarget : public OutStreamSeekable
+{
+public:
+    ~SeekableTarget() override = default;
+    u64 WriteBlock(void const* from, u64 count) override { return m_memory->WriteBlock(from, std::min(count, room)); }
+    bool Truncate(u64 size) override { return m_memory->Truncate(size); }
+    bool SeekOutStream(SeekMethod method, i64 offset) override
+    {
+        return seeksLeft-- > 0 && m_memory->SeekOutStream(method, offset);
+    }
+    u64 GetSizeOutStream() const override { return m_memory->GetSizeOutStream(); }
+    u64 TellOutStream() const override { return m_memory->TellOutStream(); }
+
+    int seeksLeft = 2;
+    u64 room = 100;
+
+private:
+    Counted<MemoryInOutStream> m_memory = MakeCounted<MemoryInOutStream>();
+};
+
+TEST(InStreamTest, WritingAtAPositionFailsWithAnyOfItsSteps)
+{
+    struct Case
+    {
+        char const* what;
+        int seeks;
+        u64 room;
+        u64 position;
+        bool expected;
+    };
+    for (Case const& c : {Case{"all well", 2, 100, 3, true}, Case{"no seek there", 0, 100, 3, false},
+                          Case{"no seek back", 1, 100, 3, false}, Case{"short write", 2, 1, 3, false},
+                          Case{"beyond any offset", 2, 100, ~u64{0}, false}})
+    {
+        SCOPED_TRACE(c.what);
+        auto out = MakeCounted<SeekableTarget>();
+        Write(*out, "abcdefgh");
+        out->seeksLeft = c.seeks;
+        out->room = c.room;
+        EXPECT_EQ(out->WriteBlockAtPos(c.position, "XY", 2), c.expected);
+        EXPECT_EQ(out->TellOutStream(), c.seeks == 1 ? 5u : 8u);
+    }
+}
+
+} // namespace
+} // namespace Kernel
