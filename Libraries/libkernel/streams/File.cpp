@@ -79,12 +79,11 @@ bool ParseOpenMode(char const* text, OpenMode& mode)
 
 File::OpenUnmanagedResult FailOpen(char const* path, int error, String8* errorText)
 {
-    Result result = File::TranslateError(error);
-    if (error == EACCES) {
-        bool const exists = Platform::GetFileCalls().access(path, Platform::Access::Exists) == 0;
-        result = exists ? Result::NotPermitted : Result::NotFound;
+    Result const result = File::TranslateOpenError(error, path);
+    if (errorText) {
+        char const* const known = FileIOException::ErrorToString(error);
+        *errorText = String8(known ? known : std::strerror(error));
     }
-    if (errorText) *errorText = String8(FileIOException::ErrorToString(error));
     errno = error;
     return result;
 }

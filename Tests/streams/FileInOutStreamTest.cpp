@@ -1,0 +1,210 @@
+#include "libkernel/streams/FileInOutStream.h"
+
+#include "StreamTestSupport.h"
+#include "libkernel/platform/Errors.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <thread>
+
+namespace Kernel {
+namespace {
+
+using namespace Test;
+using TestSupport::FaultyFiles;
+using TestSupport::FileCall;
+using TestSupport::ReadWholeFile;
+using TestSupport::TempFolder;
+using TestSupport::WriteWholeFile;
+using Result = File::OpenUnmanagedResult;
+using ShareMode = File::ShareMode;
+
+class FileInOutStreamTest : public testing::Test
+{
+protected:
+    TempFolder m_folder;
+    std::string const m_path = m_folder / "file";
+};
+
+TEST_F(FileInOutStreamTest, EachFormOpensOrMakesTheFile)
+{
+    Result result{};
+    EXPECT_FALSE(FileInOutStream::Open(m_path.c_str(), ShareMode::DenyNone, result));
+    EXPECT_EQ(result, Result::NotFound);
+    EXPECT_FALSE(FileInOutStream::OpenReadOnly(m_path.c_str()));
+    EXPECT_TRUE(FileInOutStream::OpenOrCreate(m_path.c_str()));
+    EXPECT_FALSE(FileInOutStream::Create(m_path.c_str(), true));
+    EXPECT_FALSE(FileInOutStream::Create(m_path.c_str(), ShareMode::DenyNone, result, nullptr, true));
+    EXPECT_EQ(result, Result::Exists);
+
+    WriteWholeFile(m_path, "old");
+    EXPECT_EQ(ReadAll(*FileInOutStream::OpenOrCreate(m_path.c_str())), "old");
+    EXPECT_EQ(FileInOutStream::Create(m_path.c_str())->GetSize(), 0u);
+    EXPECT_TRUE(FileInOutStream::Create((m_folder / "new").c_str(), true));
+    EXPECT_FALSE(FileInOutStream::Open(m_folder.GetPath().c_str(), ShareMode::DenyNone, result));
+    EXPECT_EQ(result, Result::IsDirectory);
+    EXPECT_FALSE(FileInOutStream::Open(nullptr) || FileInOutStream::OpenOrCreate(nullptr) ||
+                 FileInOutStream::OpenReadOnly(nullptr) || FileInOutStream::Create(nullptr));
+}
+
+TEST_F(FileInOutStreamTest, AnOpenThatFailsForAMomentDoesNotEmptyTheFile)
+{
+    WriteWholeFile(m_path, "kept");
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::Open, .error = EMFILE});
+    Counted<FileInOutStream> stream = FileInOutStream::OpenOrCreate(m_path.c_str());
+    EXPECT_TRUE(faults.HasFired());
+    ASSERT_TRUE(stream);
+    EXPECT_EQ(ReadAll(*stream), "kept");
+}
+
+TEST_F(FileInOutStreamTest, OneWriterWhoDeniesShutsOutTheNext)
+{
+    Result result{};
+    Counted<FileInOutStream> first = FileInOutStream::Create(m_path.c_str(), ShareMode::DenyWrite, result);
+    String8 text;
+    EXPECT_FALSE(FileInOutStream::Open(m_path.c_str(), ShareMode::DenyWrite, result, &text));
+    EXPECT_EQ(result, Result::NotPermitted);
+    EXPECT_FALSE(text.IsEmpty());
+    EXPECT_FALSE(FileInOutStream::OpenOrCreate(m_path.c_str()));
+    EXPECT_TRUE(FileInOutStream::OpenReadOnly(m_path.c_str()));
+    first.Reset();
+    EXPECT_TRUE(FileInOutStream::Open(m_path.c_str(), ShareMode::DenyWrite, result));
+}
+
+TEST_F(FileInOutStreamTest, EachCallReachesTheSystemInOnePiece)
+{
+    FaultyFiles calls;
+    Counted<FileInOutStream> stream = FileInOutStream::Create(m_path.c_str());
+    calls.ResetCounts();
+    *stream << 1u << u64{2};
+    EXPECT_EQ(ReadWholeFile(m_path).size(), 12u) << "nothing is held back";
+    Write(*stream, Pattern(3'000'000));
+    stream->Rewind();
+    stream->SkipBlock(12);
+    std::string text(3'000'000, '\0');
+    EXPECT_EQ(stream->ReadBlock(text.data(), text.size()), text.size());
+    EXPECT_TRUE(text == Pattern(3'000'000));
+    EXPECT_EQ(calls.GetCount(FileCall::Write), 3);
+    EXPECT_EQ(calls.GetCount(FileCall::Read), 1);
+    EXPECT_EQ(calls.GetCount(FileCall::Seek), 0) << "seeks are the stream's own";
+}
+
+TEST_F(FileInOutStreamTest, ReadsAndWritesShareOnePosition)
+{
+    Counted<FileInOutStream> stream = FileInOutStream::Create(m_path.c_str());
+    Write(*stream, "0123456789");
+    EXPECT_TRUE(stream->Seek(SeekMethod::End, -4));
+    char two[2];
+    EXPECT_EQ(stream->ReadBlock(two, 2), 2u);
+    Write(*stream, "X");
+    EXPECT_EQ(ReadAll(*stream), "9");
+    EXPECT_TRUE(stream->EOS());
+    EXPECT_TRUE(stream->SeekOutStream(SeekMethod::Current, 3));
+    EXPECT_FALSE(stream->EOS());
+    Write(*stream, "Y");
+    EXPECT_EQ(ReadWholeFile(m_path), std::string("01234567X9\0\0\0Y", 14));
+    EXPECT_FALSE(stream->Seek(SeekMethod::Current, -15));
+    EXPECT_EQ(stream->Tell(), 14u);
+}
+
+TEST_F(FileInOutStreamTest, AReadOnlyStreamWritesNothing)
+{
+    WriteWholeFile(m_path, "abc");
+    Counted<FileInOutStream> stream = FileInOutStream::OpenReadOnly(m_path.c_str());
+    EXPECT_TRUE(stream->IsReadOnly());
+    EXPECT_EQ(stream->WriteBlock("x", 1), 0u);
+    EXPECT_EQ(stream->WriteAt(0, "x", 1), 0u);
+    EXPECT_FALSE(stream->WriteBlockAtPos(0, "x", 1) || stream->Truncate(0) || stream->Recreate() ||
+                 stream->UpdateTimestamps());
+    EXPECT_FALSE(stream->IsBroken());
+    EXPECT_EQ(ReadAll(*stream), "abc");
+}
+
+TEST_F(FileInOutStreamTest, TruncateNeverLengthensAndRecreateEmpties)
+{
+    WriteWholeFile(m_path, "abcdef");
+    Counted<FileInOutStream> stream = FileInOutStream::Open(m_path.c_str());
+    EXPECT_TRUE(stream->Truncate(100));
+    EXPECT_EQ(stream->Tell(), 6u);
+    EXPECT_TRUE(stream->Truncate(4));
+    EXPECT_EQ(stream->Tell(), 4u);
+    EXPECT_EQ(ReadWholeFile(m_path), "abcd");
+    EXPECT_TRUE(stream->Recreate());
+    EXPECT_EQ(stream->Tell(), 0u);
+    Write(*stream, "new");
+    EXPECT_EQ(ReadWholeFile(m_path), "new");
+}
+
+TEST_F(FileInOutStreamTest, ManyThreadsReadByPositionBesideAWriter)
+{
+    std::string const text = Pattern(200'000);
+    WriteWholeFile(m_path, text);
+    Counted<FileInOutStream> stream = FileInOutStream::Open(m_path.c_str());
+    stream->Seek(SeekMethod::End, 0);
+    std::vector<std::thread> threads;
+    std::atomic<int> wrong = 0;
+    for (unsigned t = 0; t < 4; ++t)
+        threads.emplace_back([&, t] {
+            std::string piece(1000, '\0');
+            for (u64 at = t * 100; at + 1000 <= text.size(); at += 1700)
+                wrong += stream->ReadAt(at, piece.data(), 1000) != 1000 || piece != text.substr(at, 1000);
+        });
+    for (int i = 0; i < 50; ++i) Write(*stream, "tail");
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_EQ(wrong, 0);
+    EXPECT_EQ(stream->Tell(), text.size() + 200);
+
+    char bytes[10];
+    EXPECT_EQ(stream->ReadAt(text.size() + 195, bytes, 10), 5u);
+    EXPECT_EQ(stream->ReadAt(~u64{0}, bytes, 10), 0u);
+    EXPECT_FALSE(stream->EOS()) << "not a matter of the position";
+    EXPECT_THROW(stream->WriteAt(~u64{0} - 3, bytes, 10), FileIOException);
+    EXPECT_TRUE(stream->IsBroken());
+}
+
+TEST_F(FileInOutStreamTest, AFailedReadByPositionIsItsReadersAlone)
+{
+    WriteWholeFile(m_path, "abc");
+    Counted<FileInOutStream> stream = FileInOutStream::Open(m_path.c_str());
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::Read, .error = EIO});
+    char bytes[3];
+    EXPECT_THROW(stream->ReadAt(0, bytes, 3), FileIOException);
+    EXPECT_EQ(stream->ReadAt(0, bytes, 3), 3u);
+    EXPECT_FALSE(stream->IsBroken());
+}
+
+TEST_F(FileInOutStreamTest, HintsChangeNothing)
+{
+    Counted<FileInOutStream> stream = FileInOutStream::Create(m_path.c_str());
+    Write(*stream, Pattern(10'000));
+    stream->StartWriteBack(0, 0);
+    stream->ForceFlush();
+    stream->DropCache(0, 10'000);
+    EXPECT_TRUE(ReadWholeFile(m_path) == Pattern(10'000));
+    EXPECT_EQ(stream->Tell(), 10'000u);
+}
+
+TEST_F(FileInOutStreamTest, AttributesAndTimesCanBeCarriedOver)
+{
+    WriteWholeFile(m_path, "a");
+    std::string const other = m_folder / "other";
+    WriteWholeFile(other, "b");
+    ASSERT_EQ(::chmod(m_path.c_str(), 0640), 0);
+    Counted<FileInOutStream> to = FileInOutStream::Open(other.c_str());
+    EXPECT_TRUE(to->CopyFileAttributes(*FileInOutStream::OpenReadOnly(m_path.c_str())));
+    struct ::stat info;
+    ASSERT_EQ(::stat(other.c_str(), &info), 0);
+    EXPECT_EQ(info.st_mode & 0777u, 0640u);
+
+    Platform::GetFileCalls().setTimes(other.c_str(), 0, 0);
+    EXPECT_TRUE(to->UpdateTimestamps());
+    ASSERT_EQ(::stat(other.c_str(), &info), 0);
+    EXPECT_GT(info.st_mtime, 1'000'000'000);
+}
+
+} // namespace
+} // namespace Kernel
