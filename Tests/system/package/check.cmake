@@ -12,7 +12,7 @@ endfunction()
 
 function(check_answer what)
     run("${what}" ${ARGN})
-    if(NOT output STREQUAL "/a/b of 2\n")
+    if(NOT output STREQUAL "Spring tide at noon.\n")
         message(FATAL_ERROR "${what} printed '${output}'")
     endif()
 endfunction()
@@ -29,7 +29,7 @@ file(RENAME "${WORK}/prefix" "${WORK}/moved")
 run("configuring the consumer" ${CMAKE_COMMAND} -G Ninja -S ${SOURCE} -B ${WORK}/build
     -D CMAKE_PREFIX_PATH=${WORK}/moved -D CMAKE_CXX_COMPILER=${COMPILER} -D "CMAKE_CXX_FLAGS=${FLAGS}")
 run("building the consumer" ${CMAKE_COMMAND} --build ${WORK}/build)
-check_answer("the consumer" ${WORK}/build/consumer)
+check_answer("the consumer" ${WORK}/build/consumer ${WORK}/first.doc)
 
 find_program(pkg_config pkg-config)
 file(GLOB_RECURSE pc "${WORK}/moved/*/libkernel.pc")
@@ -42,7 +42,7 @@ if(pkg_config)
     cmake_path(GET pc_dir PARENT_PATH lib_dir)
     run("building with pkg-config" ${COMPILER} -std=c++20 ${SOURCE}/consumer.cpp -o ${WORK}/by-pkg-config ${flags}
         -Wl,-rpath,${lib_dir})
-    check_answer("the program built with pkg-config" ${WORK}/by-pkg-config)
+    check_answer("the program built with pkg-config" ${WORK}/by-pkg-config ${WORK}/second.doc)
 endif()
 
 file(GLOB tool "${WORK}/moved/bin/kerneltool")
