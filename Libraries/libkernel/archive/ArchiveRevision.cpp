@@ -1,12 +1,28 @@
 #include "libkernel/archive/ArchiveRevision.h"
 
 #include "libkernel/archive/internal/ArchiveFile.h"
+#include "libkernel/archive/internal/ArchiveFormat.h"
 
 #include <algorithm>
 
 namespace Kernel {
 
 Archive::FileInfo::~FileInfo() = default;
+
+Archive::FileRevision::Method Archive::FileRevision::GetMethod() const
+{
+    return static_cast<Method>(ArchiveFormat::MethodOf(compressionCode));
+}
+
+CompressionPredictorType Archive::FileRevision::GetPredictor() const
+{
+    return static_cast<CompressionPredictorType>(ArchiveFormat::PredictorOf(compressionCode));
+}
+
+CompressionPredictorStripingType Archive::FileRevision::GetStriping() const
+{
+    return static_cast<CompressionPredictorStripingType>(ArchiveFormat::StripingOf(compressionCode));
+}
 
 Archive::Revision::Revision() = default;
 Archive::Revision::~Revision() = default;

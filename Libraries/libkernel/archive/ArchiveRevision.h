@@ -5,6 +5,7 @@
 #include "libkernel/core/RawData.h"
 #include "libkernel/filestore/FileStoreBackData.h"
 #include "libkernel/filestore/FileStoreRevision.h"
+#include "libkernel/streams/CompressionPredictor.h"
 
 #include <unordered_map>
 #include <vector>
@@ -34,8 +35,16 @@ private:
 };
 
 /// Where and how one version of a file is stored; a position of 0 marks a deletion.
-struct Archive::FileRevision
+struct KERNEL_API Archive::FileRevision
 {
+    /// How the bytes are packed.
+    enum class Method
+    {
+        Direct = 0,
+        ZLib = 1,
+        ZStandard = 2
+    };
+
     Counted<FileInfo const> info;
     Counted<FileStoreBackData const> backData; ///< Or null. Guarded by the archive's state lock.
     u64 filePos = 0;                           ///< Offset of the block's tag in its file.
@@ -48,6 +57,10 @@ struct Archive::FileRevision
     bool added = false; ///< This revision adds the path.
 
     bool IsDeletion() const { return filePos == 0; }
+    /// What the compression code says.
+    Method GetMethod() const;
+    CompressionPredictorType GetPredictor() const;
+    CompressionPredictorStripingType GetStriping() const;
 };
 
 /// One commit. Once it is in an archive's history nothing changes but the back data of its entries.
