@@ -216,6 +216,19 @@ TEST_F(FileStoreTest, EndOfAStoreLeavesBackDataUnlessAnotherStoreLives)
     EXPECT_FALSE(y->ReleaseItem()) << "no store and no back data: the only copy";
 }
 
+TEST_F(FileStoreTest, StoreThatLetsGoOfItsHoldersLivesOn)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const x = a->Hold("x");
+    a->PreDestruction();
+    EXPECT_EQ("(unknown)", PathIn(*a, x));
+    EXPECT_EQ("X", TextOf(x));
+    EXPECT_TRUE(a->GetFileStoreLink()->IsAlive());
+    Counted<DelayLoadHolder> const again = a->Hold("x");
+    EXPECT_NE(x, again);
+    EXPECT_TRUE(again->HasLivingOwner());
+}
+
 TEST_F(FileStoreTest, EndOfAStoreSurvivesAFailingCopy)
 {
     a->Put("x", "X");

@@ -100,6 +100,7 @@ public:
     using FileStore::AddBackData;
     using FileStore::BreakFileStoreAssociations;
     using FileStore::ClearObjectDirtyState;
+    using FileStore::PreDestruction;
     using FileStore::ProcessPreFileDelete;
     using FileStore::RelinkFileStoreAssociations;
     using FileStore::RemoveDelayLoadLinks;

@@ -184,11 +184,9 @@ void FileStore::PreDestruction()
         Counted<DelayLoadHolder> holder;
         {
             CriticalSectionSpinScope const scope(m_storeLock);
+            ++m_ownerChanges;
             auto const first = m_pathOfHolder.begin();
-            if (first == m_pathOfHolder.end()) {
-                m_link->m_store.store(nullptr, std::memory_order_release);
-                return;
-            }
+            if (first == m_pathOfHolder.end()) return;
             holder = CountedIfAlive(first->first);
             RemoveCS(*first->first);
         }

@@ -94,7 +94,8 @@ protected:
     /// Undoes BreakFileStoreAssociations.
     void RelinkFileStoreAssociations();
     /// Takes this store from every holder, with back data as above, as far as it can be had. To be called first in the
-    /// destructor of a concrete store, while the virtual operations still work. Throws nothing.
+    /// destructor of a concrete store, while the virtual operations still work; a store whose files move away calls it
+    /// too, and goes on. Throws nothing.
     void PreDestruction();
 
     /// Sets the object's state for this store after a commit; a clean one stays clean.
