@@ -194,8 +194,7 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
 
     // Reached through a link, the file must be in one exact state. A commit writes the same figures into the info block
     // and the table it names; a block that only half arrived may still show the link the old numbers over a new table.
-    if (data.testLink && data.revisions.size() > before)
-    {
+    if (data.testLink && data.revisions.size() > before) {
         Archive::Revision const& newest = *data.revisions[data.revisions.size() - before - 1];
         if (newest.m_fileEnd != front.info.fileEnd || newest.m_timeStamp != front.info.saveTimeStamp)
             return Archive::OpenLinkMismatch;

@@ -14,7 +14,7 @@ namespace {
 
 constexpr int c_keptPerPool = 8;
 constexpr size_t c_largeContext = 16u << 20; // Bytes. A context at the default level takes a fifth of this.
-constexpr int c_lastSmallLevel = 8;         // Contexts of higher levels are above that.
+constexpr int c_lastSmallLevel = 8;          // Contexts of higher levels are above that.
 constexpr std::align_val_t c_blockAlignment{64};
 
 // Constant-initialised and never destroyed, so streams may live in statics; what the pools hold stays reachable.
