@@ -177,17 +177,6 @@ TEST_F(FileInOutStreamTest, AFailedReadByPositionIsItsReadersAlone)
     EXPECT_FALSE(stream->IsBroken());
 }
 
-TEST_F(FileInOutStreamTest, HintsChangeNothing)
-{
-    Counted<FileInOutStream> stream = FileInOutStream::Create(m_path.c_str());
-    Write(*stream, Pattern(10'000));
-    stream->StartWriteBack(0, 0);
-    stream->ForceFlush();
-    stream->DropCache(0, 10'000);
-    EXPECT_TRUE(ReadWholeFile(m_path) == Pattern(10'000));
-    EXPECT_EQ(stream->Tell(), 10'000u);
-}
-
 TEST_F(FileInOutStreamTest, AttributesAndTimesCanBeCarriedOver)
 {
     WriteWholeFile(m_path, "a");

@@ -184,18 +184,6 @@ TEST_F(FileTest, AHiddenFileHasTheMarkWhereTheFileSystemTakesIt)
     EXPECT_EQ(Platform::GetFileCalls().getAttribute(m_path.c_str(), Platform::c_hiddenAttribute, value), 0);
 }
 
-TEST_F(FileTest, TheAgeOfAFileIsInSeconds)
-{
-    File file;
-    EXPECT_EQ(file.GetSecondSinceModified(), -1);
-    ASSERT_TRUE(file.Open(m_path.c_str(), AccessMode::Create));
-    Platform::FileInfo info;
-    ASSERT_EQ(Platform::GetFileCalls().stat(m_path.c_str(), true, info), 0);
-    constexpr i64 second = 1'000'000'000;
-    Platform::GetFileCalls().setTimes(m_path.c_str(), Platform::c_keepTime, info.modifyTime - 90 * second);
-    EXPECT_NEAR(static_cast<double>(file.GetSecondSinceModified()), 90, 30);
-}
-
 TEST_F(FileTest, TheFirstOpenRaisesTheLimitOfOpenFiles)
 {
     File file;

@@ -90,50 +90,5 @@ TEST(InStreamTest, ASourceWithoutASizeIsCopiedWholeByEveryTarget)
     EXPECT_EQ(Content(*memory), Pattern(5000));
 }
 
-/// Counts seeks and can refuse them, to look at the default of WriteBlockAtPos.
-class SeekableTarget : public OutStreamSeekable
-{
-public:
-    ~SeekableTarget() override = default;
-    u64 WriteBlock(void const* from, u64 count) override { return m_memory->WriteBlock(from, std::min(count, room)); }
-    bool Truncate(u64 size) override { return m_memory->Truncate(size); }
-    bool SeekOutStream(SeekMethod method, i64 offset) override
-    {
-        return seeksLeft-- > 0 && m_memory->SeekOutStream(method, offset);
-    }
-    u64 GetSizeOutStream() const override { return m_memory->GetSizeOutStream(); }
-    u64 TellOutStream() const override { return m_memory->TellOutStream(); }
-
-    int seeksLeft = 2;
-    u64 room = 100;
-
-private:
-    Counted<MemoryInOutStream> m_memory = MakeCounted<MemoryInOutStream>();
-};
-
-TEST(InStreamTest, WritingAtAPositionFailsWithAnyOfItsSteps)
-{
-    struct Case
-    {
-        char const* what;
-        int seeks;
-        u64 room;
-        u64 position;
-        bool expected;
-    };
-    for (Case const& c : {Case{"all well", 2, 100, 3, true}, Case{"no seek there", 0, 100, 3, false},
-                          Case{"no seek back", 1, 100, 3, false}, Case{"short write", 2, 1, 3, false},
-                          Case{"beyond any offset", 2, 100, ~u64{0}, false}})
-    {
-        SCOPED_TRACE(c.what);
-        auto out = MakeCounted<SeekableTarget>();
-        Write(*out, "abcdefgh");
-        out->seeksLeft = c.seeks;
-        out->room = c.room;
-        EXPECT_EQ(out->WriteBlockAtPos(c.position, "XY", 2), c.expected);
-        EXPECT_EQ(out->TellOutStream(), c.seeks == 1 ? 5u : 8u);
-    }
-}
-
 } // namespace
 } // namespace Kernel
