@@ -4,7 +4,6 @@
 #include "Verbs.h"
 #include "libkernel/filesystem/FileSystem.h"
 #include "libkernel/platform/PlatformFile.h"
-#include "libkernel/streams/FileInStream.h"
 
 #include <algorithm>
 #include <map>
@@ -66,7 +65,8 @@ void ShowFile(Json const& file, char const* name)
     table.Add({"  version", number("fileVersion") + ", flags " + number("flags")});
     table.Add({"  saved", FormatTime(TimeStamp(file["saveTimeStamp"].get<i64>())) + ", save " + number("saveCount") +
                               ", write counter " + number("writeCounter")});
-    table.Add({"  size", FormatSize(file["fileEnd"].get<u64>()) + ", newest table at " + number("firstFAT")});
+    table.Add({"  size", FormatSize(file["fileEnd"].get<u64>()) +
+                             (number("firstFAT") == "0" ? ", no table" : ", newest table at " + number("firstFAT"))});
     table.Add({"  stored",
                FormatSize(file["totalBytes"].get<u64>()) + ", of it dead " + FormatSize(file["deadBytes"].get<u64>())});
     table.Add({"  next UID", number("nextFreeUID")});
@@ -228,20 +228,9 @@ int RunVerify(Arguments const& arguments)
 int RunTest(Arguments const& arguments)
 {
     String8 const path = arguments.At(0);
-    File::OpenUnmanagedResult opened{};
+    // Opening reads every header and table, and no block.
     Archive::OpenResult result = Archive::OpenIOError;
-    try {
-        if (Counted<FileInStream> const stream = FileInStream::OpenEx(path.GetData(), opened)) {
-            result = Archive::TestArchive(*stream, IDTag(), nullptr, nullptr);
-        } else {
-            // The archive's own words for a file that does not open.
-            IDTag tag;
-            result = Archive::GetArchiveUID(path, tag);
-            if (result == Archive::OpenOk) result = Archive::OpenIOError;
-        }
-    } catch (FileIOException const&) {
-        result = Archive::OpenIOError;
-    }
+    Archive::Open(path, Archive::OpenModeReadOnly, IDTag(), result);
     if (arguments.Has(Option::Json))
         PrintJson({{"result", static_cast<int>(result)}, {"name", GetName(result)}});
     else
