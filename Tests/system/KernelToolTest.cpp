@@ -1,0 +1,419 @@
+#include "support/KernelTool.h"
+
+#include "support/ArchiveFixture.h"
+#include "support/TempFolder.h"
+
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+// The contract of the command line: exit statuses, JSON keys and what a call leaves behind.
+
+namespace KernelTest {
+namespace {
+
+namespace fs = std::filesystem;
+using Json = nlohmann::ordered_json;
+using testing::HasSubstr;
+
+std::vector<std::string> KeysOf(Json const& value)
+{
+    std::vector<std::string> keys;
+    for (auto const& [key, ignored] : value.items()) keys.push_back(key);
+    return keys;
+}
+
+class KernelToolTest : public testing::Test
+{
+protected:
+    void SetUp() override
+    {
+        if (!*KERNELTOOL) GTEST_SKIP() << "the tool is not built";
+        fs::create_directories(m_folder / "in/sub");
+        WriteWhole(m_folder / "in/a.txt", "alpha");
+        WriteWhole(m_folder / "in/sub/b.txt", std::string(5000, 'b'));
+        WriteWhole(m_folder / "in/empty", "");
+        ASSERT_EQ(Run({"archive", "create", m_doc}).status, 0);
+        ASSERT_EQ(Run({"archive", "put", m_doc, "--tree", m_folder / "in"}).status, 0);
+    }
+    ToolResult Run(std::vector<std::string> const& words, std::string const& input = {})
+    {
+        return RunKernelTool(words, m_folder.GetPath(), input);
+    }
+    Json RunJson(std::vector<std::string> words, int status = 0)
+    {
+        words.push_back("--json");
+        ToolResult const result = Run(words);
+        EXPECT_EQ(result.status, status) << result.err;
+        return Json::parse(result.out, nullptr, false);
+    }
+
+    TestSupport::TempFolder m_folder;
+    std::string const m_doc = m_folder / "doc";
+};
+
+TEST_F(KernelToolTest, TreeGoesInUnderRelativePathsAndComesOutTheSame)
+{
+    fs::create_symlink("a.txt", m_folder / "in/link");
+    ASSERT_EQ(Run({"archive", "put", m_doc, "--tree", m_folder / "in", "--prefix", "copy"}).status, 0);
+    ASSERT_EQ(Run({"archive", "extract", m_doc, m_folder / "out"}).status, 0);
+    for (char const* name : {"a.txt", "sub/b.txt", "empty", "copy/a.txt", "copy/sub/b.txt", "copy/empty"})
+        EXPECT_TRUE(fs::is_regular_file(m_folder / (std::string("out/") + name))) << name;
+    EXPECT_FALSE(fs::exists(m_folder / "out/copy/link"));
+    EXPECT_EQ(ReadWhole(m_folder / "out/copy/sub/b.txt"), std::string(5000, 'b'));
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).out, "alpha");
+}
+
+TEST_F(KernelToolTest, JsonHasTheAgreedKeysInOrder)
+{
+    ASSERT_EQ(Run({"archive", "rm", m_doc, "empty"}).status, 0);
+    std::vector<std::string> const file = {
+        "path",          "fileVersion", "flags",       "firstFAT",     "fileEnd",       "totalBytes", "deadBytes",
+        "saveTimeStamp", "saveCount",   "nextFreeUID", "writeCounter", "thumbnailsPos", "link",       "referencePath"};
+    Json const info = RunJson({"archive", "info", m_doc});
+    EXPECT_EQ(KeysOf(info), (std::vector<std::string>{"archiveUID", "readOnly", "revisions", "items", "nextFreeUID",
+                                                      "master", "scratch"}));
+    EXPECT_EQ(KeysOf(info["master"]), file);
+    EXPECT_EQ(info["archiveUID"], "Docu");
+    EXPECT_EQ(info["revisions"], 2);
+    EXPECT_EQ(info["items"], 2);
+    EXPECT_EQ(info["nextFreeUID"], 4);
+    EXPECT_EQ(info["master"]["fileEnd"], fs::file_size(m_doc));
+    EXPECT_TRUE(info["scratch"].is_null());
+
+    Json const list = RunJson({"archive", "ls", m_doc});
+    ASSERT_EQ(list.size(), 2u);
+    EXPECT_EQ(KeysOf(list[0]),
+              (std::vector<std::string>{"path", "uid", "size", "storedSize", "method", "predictor", "striping", "crc",
+                                        "storedCrc", "buildIndex", "revision", "in"}));
+    EXPECT_EQ(list[0]["path"], "a.txt");
+    EXPECT_EQ(list[0]["crc"], "d0e0396a"); // By zlib's crc32.
+    EXPECT_EQ(list[1]["method"], "zstd");
+
+    Json const history = RunJson({"archive", "history", m_doc});
+    ASSERT_EQ(history.size(), 2u);
+    EXPECT_EQ(KeysOf(history[0]), (std::vector<std::string>{"index", "in", "timeStamp", "tag", "nextFAT", "fileEnd",
+                                                            "totalBytes", "deadBytes", "userDataSize", "entries"}));
+    EXPECT_EQ(KeysOf(history[0]["entries"][0]),
+              (std::vector<std::string>{"path", "uid", "kind", "filePos", "size", "storedSize"}));
+    EXPECT_EQ(history[0]["nextFAT"], 0);
+    EXPECT_EQ(history[0]["fileEnd"], info["master"]["firstFAT"]); // The second revision is a table and nothing else.
+    EXPECT_EQ(history[1]["fileEnd"], info["master"]["fileEnd"]);
+    EXPECT_EQ(history[1]["entries"], Json::parse(R"([{"path": "empty", "uid": 2, "kind": "deleted"}])"));
+
+    EXPECT_EQ(RunJson({"archive", "verify", m_doc}), Json::parse(R"({"checked": 3, "damaged": []})"));
+    EXPECT_EQ(RunJson({"archive", "test", m_doc}), Json::parse(R"({"result": 0, "name": "OpenOk"})"));
+}
+
+TEST_F(KernelToolTest, PutLeavesUnchangedItemsAloneExceptInARewriteSession)
+{
+    std::string const before = ReadWhole(m_doc);
+    Json const report = RunJson({"archive", "put", m_doc, "--tree", m_folder / "in"});
+    EXPECT_EQ(report["unchanged"].size(), 3u);
+    EXPECT_EQ(ReadWhole(m_doc), before);
+
+    ASSERT_EQ(Run({"archive", "put", m_doc, "a.txt=" + m_folder / "in/a.txt", "sub/b.txt=-"}, "new").status, 0);
+    EXPECT_EQ(RunJson({"archive", "history", m_doc})[1]["entries"].size(), 1u);
+    ASSERT_EQ(Run({"archive", "put", m_doc, "a.txt=" + m_folder / "in/a.txt", "--session", "rewrite"}).status, 0);
+    Json const last = RunJson({"archive", "history", m_doc})[2];
+    ASSERT_EQ(last["entries"].size(), 1u);
+    EXPECT_EQ(last["entries"][0]["kind"], "changed");
+}
+
+TEST_F(KernelToolTest, OptionsOfASaveReachTheFile)
+{
+    struct
+    {
+        char const* what;
+        std::vector<std::string> options;
+        char const* method;
+        int predictor, striping, tag;
+    } const cases[] = {
+        {"stored", {"--level", "store"}, "direct", 0, 0, 0},
+        {"smallest", {"--level", "max", "--session", "incremental"}, "zstd", 0, 0, 1},
+        {"bytes", {"--predictor", "8", "--striped"}, "zstd", 1, 0, 0},
+        {"words", {"--predictor=16", "--striped"}, "zstd", 2, 1, 0},
+        {"ints", {"--predictor", "32", "--level", "min", "--session", "export"}, "zstd", 3, 0, 0},
+    };
+    WriteWhole(m_folder / "user", "12345");
+    std::string numbers;
+    for (int i = 0; i < 50000; ++i) numbers.append(reinterpret_cast<char const*>(&i), sizeof(i));
+    WriteWhole(m_folder / "numbers", numbers);
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        std::vector<std::string> words = {
+            "archive",         "put",     m_doc, std::string(c.what) + "=" + m_folder / "numbers", "--user-data",
+            m_folder / "user", "--verify"};
+        words.insert(words.end(), c.options.begin(), c.options.end());
+        ASSERT_EQ(Run(words).status, 0);
+        Json found;
+        for (Json const& row : RunJson({"archive", "ls", m_doc}))
+            if (row["path"] == c.what) found = row;
+        EXPECT_EQ(found["method"], c.method);
+        EXPECT_EQ(found["predictor"], c.predictor);
+        EXPECT_EQ(found["striping"], c.striping);
+        Json const revision = RunJson({"archive", "history", m_doc}).back();
+        EXPECT_EQ(revision["tag"], c.tag);
+        EXPECT_EQ(revision["userDataSize"], 5);
+        EXPECT_EQ(Run({"archive", "cat", m_doc, c.what}).out, numbers);
+    }
+}
+
+TEST_F(KernelToolTest, EarlierRevisionsCanBeReadBack)
+{
+    ASSERT_EQ(Run({"archive", "put", m_doc, "a.txt=-"}, "second").status, 0);
+    ASSERT_EQ(Run({"archive", "rm", m_doc, "a.txt"}).status, 0);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).status, 1);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt", "--at", "1"}).out, "second");
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt", "--at", "2"}).out, "alpha");
+    EXPECT_EQ(RunJson({"archive", "ls", m_doc, "--at", "3"}).size(), 0u);
+    EXPECT_EQ(Run({"archive", "ls", m_doc, "--at", "4"}).status, 1);
+}
+
+TEST_F(KernelToolTest, ScratchFileOpensItsMasterAndRollsDown)
+{
+    std::string const scratch = m_folder / "doc.scratch";
+    ASSERT_EQ(Run({"archive", "scratch", "doc", scratch}).status, 0);
+    std::string const master = ReadWhole(m_doc);
+    ASSERT_EQ(Run({"archive", "put", scratch, "a.txt=-", "--scratch"}, "from scratch").status, 0);
+    EXPECT_EQ(ReadWhole(m_doc), master);
+    Json const info = RunJson({"archive", "info", scratch});
+    EXPECT_EQ(info["scratch"]["link"]["path"], m_doc);
+    EXPECT_EQ(info["scratch"]["link"]["saveCount"], info["master"]["saveCount"]);
+    EXPECT_EQ(RunJson({"archive", "ls", scratch})[0]["in"], "scratch");
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).out, "alpha");
+
+    ASSERT_EQ(Run({"archive", "put", scratch, "new=-"}, "n").status, 0);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).out, "from scratch");
+    EXPECT_EQ(RunJson({"archive", "verify", scratch})["damaged"].size(), 0u);
+
+    ToolResult const again = Run({"archive", "scratch", m_doc, scratch});
+    EXPECT_EQ(again.status, 1);
+    EXPECT_THAT(again.err, HasSubstr("Exists (3)"));
+}
+
+TEST_F(KernelToolTest, ThumbnailOutlivesLaterSaves)
+{
+    std::string const image = "\x89PNG not really";
+    WriteWhole(m_folder / "image", image);
+    std::string const item = Run({"archive", "cat", m_doc, "empty"}).out;
+    ASSERT_EQ(Run({"archive", "thumbnail", m_doc, "--set", m_folder / "image"}).status, 0);
+    ASSERT_EQ(Run({"archive", "put", m_doc, "new=-"}, "n").status, 0);
+    ASSERT_EQ(Run({"archive", "rm", m_doc, "new"}).status, 0);
+    ASSERT_EQ(Run({"archive", "thumbnail", m_doc, "--get", m_folder / "got"}).status, 0);
+    EXPECT_EQ(ReadWhole(m_folder / "got"), image);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "empty"}).out, item);
+    ASSERT_EQ(Run({"archive", "create", m_folder / "bare"}).status, 0);
+    EXPECT_EQ(Run({"archive", "thumbnail", m_folder / "bare", "--get", m_folder / "none"}).status, 1);
+}
+
+TEST_F(KernelToolTest, ExtractStaysInsideItsTarget)
+{
+    std::string const secret = m_folder / "secret";
+    WriteWhole(secret, "untouched");
+    fs::create_directories(m_folder / "outside");
+    fs::create_directories(m_folder / "out/real");
+    fs::create_symlink(m_folder / "outside", m_folder / "out/folderlink");
+    fs::create_symlink(secret, m_folder / "out/filelink");
+    std::vector<std::string> const bad = {"../secret", secret,    "x/../../secret", "folderlink/inside",
+                                          "filelink",  "real/..", "real",           "a.txt/below"};
+    for (std::string const& item : bad)
+        ASSERT_EQ(Run({"archive", "put", m_doc, item + "=-"}, "evil").status, 0) << item;
+
+    ToolResult const result = Run({"archive", "extract", m_doc, m_folder / "out", "--json"});
+    EXPECT_EQ(result.status, 1);
+    Json const report = Json::parse(result.out);
+    EXPECT_THAT(report["skipped"].get<std::vector<std::string>>(), testing::UnorderedElementsAreArray(bad));
+    EXPECT_EQ(report["written"].size(), 3u);
+    EXPECT_EQ(ReadWhole(secret), "untouched");
+    EXPECT_TRUE(fs::is_empty(m_folder / "outside"));
+    EXPECT_TRUE(fs::is_empty(m_folder / "out/real"));
+    EXPECT_EQ(ReadWhole(m_folder / "out/a.txt"), "alpha");
+    for (auto const& entry : fs::recursive_directory_iterator(m_folder / "out"))
+        EXPECT_EQ(entry.path().string().find(".kerneltool"), std::string::npos) << entry.path();
+}
+
+TEST_F(KernelToolTest, DamageIsListedAndTheRestStaysReadable)
+{
+    Json const list = RunJson({"archive", "history", m_doc})[0]["entries"];
+    std::string bytes = ReadWhole(m_doc);
+    bytes[list[0]["filePos"].get<size_t>() + 4 + 9] ^= 1;
+    WriteWhole(m_doc, bytes);
+
+    Json const report = RunJson({"archive", "verify", m_doc}, 3);
+    ASSERT_EQ(report["damaged"].size(), 1u);
+    EXPECT_EQ(KeysOf(report["damaged"][0]), (std::vector<std::string>{"path", "revision", "problem"}));
+    EXPECT_EQ(report["damaged"][0]["path"], "a.txt");
+    EXPECT_EQ(report["damaged"][0]["revision"], 0);
+    EXPECT_EQ(report["checked"], 3);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "sub/b.txt"}).out, std::string(5000, 'b'));
+    EXPECT_THAT(Run({"archive", "cat", m_doc, "a.txt"}).err, HasSubstr("failed: OpenCorrupt (12)"));
+    EXPECT_EQ(Run({"archive", "extract", m_doc, m_folder / "out"}).status, 1);
+    EXPECT_FALSE(fs::exists(m_folder / "out/a.txt"));
+    EXPECT_TRUE(fs::exists(m_folder / "out/sub/b.txt"));
+
+    ASSERT_EQ(Run({"archive", "put", m_doc, "--tree", m_folder / "in"}).status, 0);
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).out, "alpha");
+}
+
+TEST_F(KernelToolTest, FailuresNameTheResultAndLeaveTheFileAlone)
+{
+    WriteWhole(m_folder / "junk", "no document at all, but long enough for a header");
+    WriteWhole(m_folder / "short", ReadWhole(m_doc).substr(0, fs::file_size(m_doc) - 70));
+    std::string const before = ReadWhole(m_doc);
+    struct
+    {
+        std::vector<std::string> words;
+        int status;
+        char const* text;
+    } const cases[] = {
+        {{"archive", "create", m_doc}, 1, "failed: Exists (3)"},
+        {{"archive", "create", m_folder / "none/doc"}, 1, "failed: NotFound (2)"},
+        {{"archive", "ls", m_folder / "none"}, 1, "failed: OpenNotFound (2)"},
+        {{"archive", "ls", m_folder / "in"}, 1, "failed: OpenIsDirectory (26)"},
+        {{"archive", "ls", m_folder / "junk"}, 1, "failed: OpenNotArchive (8)"},
+        {{"archive", "test", m_folder / "junk"}, 1, "failed: OpenNotArchive (8)"},
+        {{"archive", "test", m_folder / "none"}, 1, "failed: OpenNotFound (2)"},
+        {{"archive", "test", m_folder / "short"}, 3, "failed: OpenCorrupt (12)"},
+        {{"archive", "rm", m_doc, "a.txt", "none"}, 1, "failed: OpenNotFound (2)"},
+        {{"archive", "put", m_doc, "x=" + m_folder / "none"}, 1, "failed: NotFound (2)"},
+        {{"archive", "put", m_doc, "x=" + m_folder / "in"}, 1, "failed: IsDirectory (13)"},
+        {{"archive", "put", m_doc, "x=" + m_doc}, 1, "failed: InUse (4)"},
+        {{"archive", "put", m_doc, "--tree", m_folder / "none"}, 1, "failed: NotFound (2)"},
+        {{"archive", "put", m_doc, "x=" + m_folder / "junk", "--scratch"}, 1, "failed: SessionNoScratch (6)"},
+        {{"archive", "extract", m_doc, m_folder / "junk"}, 1, "failed: "},
+        {{"archive", "put", m_doc}, 2, "nothing to put"},
+        {{"archive", "put", m_doc, "x"}, 2, "ITEM=SOURCE"},
+        {{"archive", "put", m_doc, "x=-", "x=-"}, 2, "standard input"},
+        {{"archive", "put", m_doc, "x=-", "--level", "huge"}, 2, "--level is one of"},
+        {{"archive", "create", m_folder / "n", "--uid", "toolong"}, 2, "--uid"},
+        {{"archive", "ls", m_doc, "--at", "-1"}, 2, "--at"},
+        {{"archive", "ls", m_doc, "--zlib"}, 2, "unknown option"},
+        {{"archive", "ls"}, 2, "argument is missing"},
+        {{"archive", "ls", m_doc, "more"}, 2, "unexpected argument"},
+        {{"archive", "defragment", m_doc}, 2, "unknown verb"},
+        {{"nothing"}, 2, "unknown group"},
+        {{}, 2, "no group"},
+        {{"stream", "check", m_folder / "junk"}, 3, "failed: NotAStream (1)"},
+        {{"stream", "dump", m_folder / "junk", "--json"}, 1, "failed: NotAStream (1)"},
+        {{"stream", "dump", m_folder / "none"}, 1, "failed: NotFound (2)"},
+    };
+    for (auto const& c : cases) {
+        ToolResult const result = Run(c.words);
+        SCOPED_TRACE(c.text + std::string(" | ") + result.err);
+        EXPECT_EQ(result.status, c.status);
+        EXPECT_THAT(result.err, testing::StartsWith("kerneltool: "));
+        EXPECT_THAT(result.err, HasSubstr(c.text));
+    }
+    EXPECT_EQ(ReadWhole(m_doc), before);
+}
+
+TEST_F(KernelToolTest, SecondWriterIsRefusedAndReadersAreNot)
+{
+    Kernel::Counted<Kernel::Archive> const held = OpenDocument(m_doc);
+    ASSERT_TRUE(held);
+    ToolResult const writer = Run({"archive", "rm", m_doc, "a.txt"});
+    EXPECT_EQ(writer.status, 1);
+    EXPECT_THAT(writer.err, HasSubstr("failed: OpenReadOnlyArchive (7)\nAnother program"));
+    EXPECT_EQ(Run({"archive", "cat", m_doc, "a.txt"}).out, "alpha");
+    EXPECT_EQ(Run({"archive", "verify", m_doc}).status, 0);
+}
+
+TEST_F(KernelToolTest, ReferencePathIsKept)
+{
+    ASSERT_EQ(Run({"archive", "create", m_folder / "ref", "--uid", "Draw", "--reference", "/else/where"}).status, 0);
+    Json const info = RunJson({"archive", "info", m_folder / "ref"});
+    EXPECT_EQ(info["archiveUID"], "Draw");
+    EXPECT_EQ(info["master"]["referencePath"], "/else/where");
+    EXPECT_EQ(info["master"]["flags"], 2);
+}
+
+TEST_F(KernelToolTest, NamesFromADocumentCannotDriveTheTerminal)
+{
+    ASSERT_EQ(Run({"archive", "put", m_doc, "\x1b[2Jevil\nline=-"}, "x").status, 0);
+    std::string const out = Run({"archive", "ls", m_doc}).out;
+    EXPECT_EQ(out.find('\x1b'), std::string::npos);
+    EXPECT_THAT(out, HasSubstr("\\x1b[2Jevil\\x0aline"));
+    ASSERT_EQ(Run({"archive", "put", m_doc, "\xff\xfe=-"}, "x").status, 0);
+    EXPECT_FALSE(RunJson({"archive", "ls", m_doc}).is_discarded());
+}
+
+TEST_F(KernelToolTest, FullStandardOutputIsAFailure)
+{
+    ToolResult const result = RunKernelTool({"archive", "cat", m_doc, "a.txt"}, m_folder.GetPath(), {}, "/dev/full");
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.err, HasSubstr("writing standard output failed: OutOfSpace (4)"));
+}
+
+TEST_F(KernelToolTest, StreamDumpShowsWhatWasSaved)
+{
+    // Header of kind PCFl, then a u32, a string and an array of doubles.
+    std::string bytes("\x00\xFFKS\x02\x00lFCP\x03\x00\x18\x00\x00\x00", 16);
+    bytes += std::string("\x03"
+                         "DIUM\x07\x00\x00\x00",
+                         9) +
+             std::string("\x2B"
+                         "emaN\x04\x00\x00\x00text",
+                         13) +
+             std::string("\x8A"
+                         "slaV\x01\x00\x00\x00\x00\x00\x00\x00\x00\x00\xF0\x3F",
+                         17) +
+             std::string(1, '\0');
+    WriteWhole(m_folder / "stream", bytes);
+    EXPECT_EQ(RunJson({"stream", "dump", m_folder / "stream"}), Json::parse(R"(
+        {"fileTag": "PCFl", "formatVersion": 2, "fileVersion": 3, "buildIndex": 24, "properties": [
+            {"tag": "MUID", "type": 3, "value": 7}, {"tag": "Name", "type": 43, "value": "text"},
+            {"tag": "Vals", "type": 10, "array": true, "value": [1.0]}]})"));
+    EXPECT_EQ(Run({"stream", "check", m_folder / "stream"}).status, 0);
+    EXPECT_EQ(Run({"stream", "check", m_folder / "stream", "--zlib"}).status, 3);
+    WriteWhole(m_folder / "cut", bytes.substr(0, bytes.size() - 3));
+    Json const report = RunJson({"stream", "check", m_folder / "cut"}, 3);
+    EXPECT_EQ(report["name"], "Damaged");
+    EXPECT_EQ(report["path"], "Vals");
+}
+
+// Help, man page and completions say the same as the table of verbs.
+TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
+{
+    std::string const tool = std::string(KERNEL_SOURCE_DIR) + "/Tools/kerneltool/";
+    std::string man = ReadWhole(tool + "kerneltool.1");
+    for (size_t at; (at = man.find("\\-")) != std::string::npos;) man.erase(at, 1); // Dashes stand for themselves.
+    EXPECT_EQ(Run({"--completions", "bash"}).out, ReadWhole(tool + "completions/kerneltool.bash"));
+    EXPECT_EQ(Run({"--completions", "zsh"}).out, ReadWhole(tool + "completions/_kerneltool"));
+    EXPECT_THAT(Run({"--version"}).out, HasSubstr("(build index 24)"));
+    EXPECT_THAT(Run({"--help"}).out, HasSubstr("Example:"));
+    struct
+    {
+        char const* group;
+        std::vector<char const*> verbs;
+    } const groups[] = {
+        {"archive",
+         {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch", "thumbnail"}},
+        {"stream", {"dump", "check"}}};
+    for (auto const& group : groups) {
+        EXPECT_THAT(Run({group.group, "--help"}).out, HasSubstr("Example:"));
+        for (char const* verb : group.verbs) {
+            ToolResult const help = Run({group.group, verb, "--help"});
+            EXPECT_EQ(help.status, 0);
+            EXPECT_THAT(help.out, HasSubstr("Example:\n  kerneltool ")) << verb;
+            EXPECT_THAT(man, HasSubstr(std::string(group.group) + " " + verb));
+            for (size_t at = help.out.find("\n  --"); at != std::string::npos; at = help.out.find("\n  --", at + 1)) {
+                std::string const option = help.out.substr(at + 3, help.out.find(' ', at + 3) - at - 3);
+                EXPECT_THAT(man, HasSubstr(option)) << verb;
+            }
+        }
+    }
+}
+
+TEST_F(KernelToolTest, ProgressBarStaysOnStandardError)
+{
+    ToolResult const always = Run({"archive", "verify", m_doc, "--json", "--progress", "always"});
+    EXPECT_THAT(always.err, HasSubstr("Verifying ["));
+    EXPECT_THAT(always.err, HasSubstr("100 %"));
+    EXPECT_FALSE(Json::parse(always.out, nullptr, false).is_discarded());
+    EXPECT_EQ(Run({"archive", "verify", m_doc}).err, "");
+}
+
+} // namespace
+} // namespace KernelTest
