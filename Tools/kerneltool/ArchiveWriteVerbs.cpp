@@ -53,7 +53,7 @@ String8 MakeAbsolute(String8 const& path)
 {
     Path result(path);
     if (!result.IsRelative()) return path;
-    Path absolute(FileSystem::GetCurrentDirectory());
+    Path absolute{String8(std::string_view(Platform::GetCurrentFolder()))};
     absolute.Append(path);
     absolute.Canonicalize();
     return absolute.GetString();
@@ -230,13 +230,18 @@ int RunPut(Arguments const& arguments)
     Json unchanged = Json::array();
     std::vector<NamedSource const*> wanted;
     u64 total = 0;
-    for (NamedSource const& source : sources) {
-        bool const keep = options.type != Archive::SessionTypeRewrite &&
-                          HasSameBytes(*archive, String8(std::string_view(source.item)), source.source);
-        (keep ? unchanged : written).push_back(source.item);
-        if (keep) continue;
-        wanted.push_back(&source);
-        total += source.source.GetSize();
+    {
+        u64 all = 0;
+        for (NamedSource const& source : sources) all += source.source.GetSize();
+        LongWork work("Comparing", all, arguments);
+        for (NamedSource const& source : sources) {
+            bool const keep = options.type != Archive::SessionTypeRewrite &&
+                              HasSameBytes(*archive, String8(std::string_view(source.item)), source.source, work);
+            (keep ? unchanged : written).push_back(source.item);
+            if (keep) continue;
+            wanted.push_back(&source);
+            total += source.source.GetSize();
+        }
     }
     if (!wanted.empty()) {
         LongWork work("Writing", total, arguments);

@@ -107,7 +107,7 @@ u64 Source::Read(Stream const& stream, void* to, u64 count) const
     return got;
 }
 
-bool HasSameBytes(Archive& archive, String8 const& path, Source const& source)
+bool HasSameBytes(Archive& archive, String8 const& path, Source const& source, LongWork& work)
 {
     Archive::FileRevision entry;
     Counted<Archive::Revision const> revision;
@@ -120,10 +120,10 @@ bool HasSameBytes(Archive& archive, String8 const& path, Source const& source)
         Counted<InStream> const stream = archive.OpenFileInStream(path);
         if (!stream) return false;
         for (;;) {
-            StopIfInterrupted();
             u64 const a = stream->ReadBlock(stored.data(), pieceSize);
             u64 const b = source.Read(in, wanted.data(), pieceSize);
             if (a != b || std::memcmp(stored.data(), wanted.data(), a) != 0) return false;
+            work.Advance(a);
             if (a < pieceSize) return true;
         }
     } catch (AbortException const&) {

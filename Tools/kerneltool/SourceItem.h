@@ -39,8 +39,8 @@ private:
     Kernel::u64 m_size = 0;
 };
 
-/// True if the item at @p path has these bytes. A damaged item has not.
-bool HasSameBytes(Kernel::Archive& archive, Kernel::String8 const& path, Source const& source);
+/// True if the item at @p path has these bytes. A damaged item has not. Tells @p work of the bytes it compares.
+bool HasSameBytes(Kernel::Archive& archive, Kernel::String8 const& path, Source const& source, LongWork& work);
 
 /// An item whose bytes are read from their source while it is saved, a piece at a time. @p work is borrowed.
 class SourceItem : public Kernel::FileStoreItem
