@@ -91,12 +91,22 @@ InSerialiser::~InSerialiser()
 
 InSerialiserProperty* InSerialiser::FindPropertyI(IDTag tag) const
 {
-    return FindProperty(m_properties, m_count, tag);
+    if (!(m_tagBits & GetTagBit(tag))) return nullptr;
+    if (m_count > c_unsortedList) return FindSorted(m_properties, m_count, tag);
+    u32 at = m_next;
+    for (u32 left = m_count; left > 0; --left) {
+        if (at >= m_count) at = 0;
+        Property& property = m_properties[at++];
+        if (property.tag != tag) continue;
+        m_next = at;
+        return &property;
+    }
+    return nullptr;
 }
 
 InSerialiserProperty const* InSerialiser::FindPropertyOrDefaultI(IDTag tag) const
 {
-    if (Property const* const own = FindProperty(m_properties, m_count, tag)) return own;
+    if (Property const* const own = FindPropertyI(tag)) return own;
     return m_classInfo ? m_classInfo->FindDefault(tag) : nullptr;
 }
 
@@ -140,6 +150,7 @@ std::vector<IDTag> InSerialiser::GetTags() const
 {
     std::vector<IDTag> tags;
     for (u32 i = 0; i < m_count; ++i) tags.push_back(m_properties[i].tag);
+    std::sort(tags.begin(), tags.end());
     return tags;
 }
 
@@ -158,6 +169,8 @@ void InSerialiser::TearDownAllProperties() const
     // What is released may look into this list.
     Property* const properties = std::exchange(m_properties, nullptr);
     u32 const count = std::exchange(m_count, 0);
+    m_tagBits = 0;
+    m_next = 0;
     for (u32 i = 0; i < count; ++i) {
         if (properties[i].HoldsSomething()) properties[i].Release();
     }
@@ -169,7 +182,14 @@ bool InSerialiser::LoadTypeI(IDTag tag, PropType type, void* value, u64 size) co
 {
     Property const* const property = FindValueI(tag, ScalarByte(type));
     if (!property || c_propSizes[ScalarByte(type)] != size || size == 0) return false;
-    std::memcpy(value, size <= 8 ? reinterpret_cast<u8 const*>(&property->number) : property->bytes, size);
+    switch (size) {
+    // Copies of a known size are one store.
+    case 1: std::memcpy(value, &property->number, 1); break;
+    case 2: std::memcpy(value, &property->number, 2); break;
+    case 4: std::memcpy(value, &property->number, 4); break;
+    case 8: std::memcpy(value, &property->number, 8); break;
+    default: std::memcpy(value, size < 8 ? reinterpret_cast<u8 const*>(&property->number) : property->bytes, size);
+    }
     return true;
 }
 
@@ -493,32 +513,32 @@ bool InSerialiser::LoadObjectOrSharedObjectI(IDTag tag, Counted<Serialisable>& o
     return true;
 }
 
-template <class P>
-bool InSerialiser::LoadArrayI(IDTag tag, PropertyType kind, P const*& objects, u64& count) const
+template <class T>
+bool InSerialiser::LoadArrayI(IDTag tag, PropertyType kind, T* const*& objects, u64& count) const
 {
     Property const* const property = FindPropertyOrDefaultI(tag);
     if (!property || (property->kind != kind && property->kind != Type::NullArray)) return false;
     bool const isNull = property->kind == Type::NullArray;
-    objects = isNull ? nullptr : property->objects->GetObjects<P>();
+    objects = isNull ? nullptr : property->objects->GetObjects<T>();
     count = isNull ? property->number : property->objects->count;
     return true;
 }
 
-bool InSerialiser::LoadObjectsI(IDTag tag, Counted<Serialisable> const*& objects, u64& count, bool owner) const
+bool InSerialiser::LoadObjectsI(IDTag tag, Serialisable* const*& objects, u64& count, bool owner) const
 {
     if (!LoadArrayI(tag, Type::ObjectArray, objects, count)) return false;
-    for (u64 i = 0; m_markers && objects && i < count; ++i) m_markers->CountLoad(objects[i].Get(), owner);
+    for (u64 i = 0; m_markers && objects && i < count; ++i) m_markers->CountLoad(objects[i], owner);
     return true;
 }
 
-bool InSerialiser::LoadSharedObjectsI(IDTag tag, Consolidated<SharedSerialisable> const*& objects, u64& count) const
+bool InSerialiser::LoadSharedObjectsI(IDTag tag, SharedSerialisable* const*& objects, u64& count) const
 {
     return LoadArrayI(tag, Type::SharedObjectArray, objects, count);
 }
 
 bool InSerialiser::LoadObjectsBase(IDTag tag, std::vector<Counted<Serialisable>>& objects, bool owner) const
 {
-    Counted<Serialisable> const* stored = nullptr;
+    Serialisable* const* stored = nullptr;
     u64 count = 0;
     if (!LoadObjectsI(tag, stored, count, owner)) return false;
     if (stored)
@@ -530,13 +550,11 @@ bool InSerialiser::LoadObjectsBase(IDTag tag, std::vector<Counted<Serialisable>>
 
 bool InSerialiser::LoadSharedObjectsBase(IDTag tag, std::vector<Consolidated<SharedSerialisable>>& objects) const
 {
-    Consolidated<SharedSerialisable> const* stored = nullptr;
+    SharedSerialisable* const* stored = nullptr;
     u64 count = 0;
     if (!LoadSharedObjectsI(tag, stored, count)) return false;
-    if (stored)
-        objects.assign(stored, stored + count);
-    else
-        objects.assign(count, nullptr);
+    objects.assign(count, nullptr);
+    for (u64 i = 0; stored && i < count; ++i) objects[i] = Consolidated<SharedSerialisable>::Trust(stored[i]);
     return true;
 }
 

@@ -196,9 +196,9 @@ public:
     /// Whichever of the two is stored; the other is cleared.
     bool LoadObjectOrSharedObjectI(IDTag tag, Counted<Serialisable>& object, Consolidated<SharedSerialisable>& shared,
                                    bool owner) const;
-    /// Gives the objects in place. @p objects is null if all @p count are null.
-    bool LoadObjectsI(IDTag tag, Counted<Serialisable> const*& objects, u64& count, bool owner) const;
-    bool LoadSharedObjectsI(IDTag tag, Consolidated<SharedSerialisable> const*& objects, u64& count) const;
+    /// Gives the objects in place, owned by the property. @p objects is null if all @p count are null.
+    bool LoadObjectsI(IDTag tag, Serialisable* const*& objects, u64& count, bool owner) const;
+    bool LoadSharedObjectsI(IDTag tag, SharedSerialisable* const*& objects, u64& count) const;
     bool LoadObjectsBase(IDTag tag, std::vector<Counted<Serialisable>>& objects, bool owner) const;
     bool LoadSharedObjectsBase(IDTag tag, std::vector<Consolidated<SharedSerialisable>>& objects) const;
     /// The same with the class checked: false, with the output untouched, if an object is not a @p T.
@@ -235,14 +235,14 @@ protected:
 private:
     friend class InSerialiserLoader;
 
-    InSerialiserProperty* FindPropertyI(IDTag tag) const;
-    InSerialiserProperty const* FindPropertyOrDefaultI(IDTag tag) const;
-    InSerialiserProperty const* FindValueI(IDTag tag, u8 typeByte) const;
-    InSerialiserProperty const* FindKindI(IDTag tag, PropertyType kind) const;
+    inline InSerialiserProperty* FindPropertyI(IDTag tag) const;
+    inline InSerialiserProperty const* FindPropertyOrDefaultI(IDTag tag) const;
+    inline InSerialiserProperty const* FindValueI(IDTag tag, u8 typeByte) const;
+    inline InSerialiserProperty const* FindKindI(IDTag tag, PropertyType kind) const;
     template <class Bools>
     bool LoadBoolsI(IDTag tag, Bools& values) const;
-    template <class P>
-    bool LoadArrayI(IDTag tag, PropertyType kind, P const*& objects, u64& count) const;
+    template <class T>
+    bool LoadArrayI(IDTag tag, PropertyType kind, T* const*& objects, u64& count) const;
     template <class Enc>
     bool LoadTextI(IDTag tag, StringT<Enc>& text) const;
     template <class Enc>
@@ -253,9 +253,11 @@ private:
     static Counted<T> CastI(Serialisable* object);
     static bool IsJsonTextSafe(std::string_view text);
 
-    // Sorted by tag; in a pool that outlives them. Const operations tear properties down.
+    // In a pool that outlives them. Const operations tear properties down.
     mutable InSerialiserProperty* m_properties = nullptr;
+    mutable u64 m_tagBits = 0; // A tag whose bit is not there is not there.
     mutable u32 m_count = 0;
+    mutable u32 m_next = 0; // Behind the property found last, where the next one asked for mostly lies.
     u32 m_buildIndex = 0;
     InSerialiserClassInfoBase const* m_classInfo = nullptr; // Not owned; null at file level and in inline classes.
     Counted<InSerialiserObjectMarkers> m_markers;           // Null unless somebody wants the report.
@@ -382,13 +384,13 @@ bool InSerialiser::LoadObject(IDTag tag, Counted<T>& object, bool owner) const
 template <class T>
 bool InSerialiser::LoadObjects(IDTag tag, std::vector<Counted<T>>& objects, bool owner) const
 {
-    Counted<Serialisable> const* stored = nullptr;
+    Serialisable* const* stored = nullptr;
     u64 count = 0;
     if (!LoadObjectsI(tag, stored, count, owner)) return false;
     std::vector<Counted<T>> cast(count);
     for (u64 i = 0; stored && i < count; ++i) {
         if (!stored[i]) continue;
-        cast[i] = CastI<T>(stored[i].Get());
+        cast[i] = CastI<T>(stored[i]);
         if (!cast[i]) return false;
     }
     objects = std::move(cast);
@@ -409,13 +411,13 @@ bool InSerialiser::LoadSharedObject(IDTag tag, Consolidated<T>& object) const
 template <class T>
 bool InSerialiser::LoadSharedObjects(IDTag tag, std::vector<Consolidated<T>>& objects) const
 {
-    Consolidated<SharedSerialisable> const* stored = nullptr;
+    SharedSerialisable* const* stored = nullptr;
     u64 count = 0;
     if (!LoadSharedObjectsI(tag, stored, count)) return false;
     std::vector<Consolidated<T>> cast(count);
     for (u64 i = 0; stored && i < count; ++i) {
         if (!stored[i]) continue;
-        cast[i] = Consolidated<T>::Trust(Counted<T>(dynamic_cast<T*>(stored[i].Get())));
+        cast[i] = Consolidated<T>::Trust(Counted<T>(dynamic_cast<T*>(stored[i])));
         if (!cast[i]) return false;
     }
     objects = std::move(cast);

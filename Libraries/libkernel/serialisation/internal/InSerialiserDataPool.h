@@ -10,7 +10,7 @@ namespace Kernel {
 class InSerialiserSource;
 
 /// One block of a pool. Bytes are taken from the front.
-class KERNEL_API InSerialiserDataPoolBucket : public Countable
+class InSerialiserDataPoolBucket : public Countable
 {
 public:
     /// Null if there is no memory.
@@ -29,7 +29,7 @@ private:
 /// Where the properties of a parse live: a bump allocator over blocks of 32 KiB, or of exactly the size of a larger
 /// piece. Memory goes back by returning to an earlier mark. What is put into it and needs a destructor is destroyed by
 /// whoever put it there, before that.
-class KERNEL_API InSerialiserDataPool
+class InSerialiserDataPool
 {
 public:
     static constexpr u64 c_bucketSize = 32 * 1024;

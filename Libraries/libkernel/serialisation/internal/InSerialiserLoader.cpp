@@ -42,6 +42,8 @@ InSerialiserLoader::~InSerialiserLoader()
         m_stack.back().Release();
         m_stack.pop_back();
     }
+    for (ObjectRecord& record : m_objects) record.Release();
+    for (auto& [index, record] : m_strayObjects) record.Release();
 }
 
 Counted<InSerialiserFile> InSerialiserLoader::ReadHeader()
@@ -86,7 +88,7 @@ bool InSerialiserLoader::ParseList(InSerialiser& list)
     m_source.CloseList();
 
     InSerialiserProperty* const first = m_stack.data() + base;
-    u32 const count = SortProperties(first, static_cast<u32>(m_stack.size() - base));
+    u32 const count = ArrangeProperties(first, static_cast<u32>(m_stack.size() - base), list.m_tagBits);
     m_stack.resize(base + count);
     if (count > 0) {
         u8* const at = GetPool().Allocate(count * sizeof(InSerialiserProperty));
@@ -102,15 +104,37 @@ bool InSerialiserLoader::ParseList(InSerialiser& list)
 bool InSerialiserLoader::ParseProperties()
 {
     for (;;) {
-        OwnedProperty owned;
         u8 typeByte = 0;
         if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) return true;
+        // Most properties are numbers, which own nothing.
+        if (IsKnownWireType(typeByte) && InSerialiserProperty::GetInlineSize(typeByte)) {
+            if (!ParseNumber(typeByte, m_stack.emplace_back())) return false;
+            continue;
+        }
+        OwnedProperty owned;
         owned.property.typeByte = typeByte;
         if (!ParseProperty(owned.property)) return false;
         m_stack.push_back(owned.property);
         owned.Disown();
     }
+}
+
+bool InSerialiserLoader::ParseNumber(u8 typeByte, InSerialiserProperty& property)
+{
+    u32 const size = InSerialiserProperty::GetInlineSize(typeByte);
+    if (!m_source.Fill(sizeof(u32) + size)) return false;
+    u8 const* const at = m_source.GetAt();
+    property.typeByte = typeByte;
+    property.kind = InSerialiserProperty::Type::Value;
+    property.tag = IDTag(LoadLittleEndian<u32>(at));
+    // Past the value lie bytes of the buffer mostly, and then one load and a mask do.
+    if (m_source.GetBuffered() >= sizeof(u32) + sizeof(u64))
+        property.number = LoadLittleEndian<u64>(at + sizeof(u32)) & (~u64(0) >> (64 - 8 * size));
+    else
+        std::memcpy(&property.number, at + sizeof(u32), size);
+    m_source.Take(sizeof(u32) + size);
+    return true;
 }
 
 bool InSerialiserLoader::ParseProperty(InSerialiserProperty& property)
@@ -120,14 +144,7 @@ bool InSerialiserLoader::ParseProperty(InSerialiserProperty& property)
         Trace(FormatT<String8>(">>> Use of unknown prop type: %1\n", GetWireType(typeByte)));
         throw FutureVersionException(false);
     }
-    if (u32 const size = InSerialiserProperty::GetInlineSize(typeByte)) {
-        if (!m_source.Fill(sizeof(u32) + size)) return false;
-        property.tag = IDTag(LoadLittleEndian<u32>(m_source.GetAt()));
-        std::memcpy(&property.number, m_source.GetAt() + sizeof(u32), size);
-        m_source.Take(sizeof(u32) + size);
-        property.kind = InSerialiserProperty::Type::Value;
-        return true;
-    }
+    if (InSerialiserProperty::GetInlineSize(typeByte)) return ParseNumber(typeByte, property);
     if (!IsLegalWireType(typeByte) || !m_source.ReadNumber(property.tag.value)) return false;
     switch (c_wireTypes[GetWireType(typeByte)].form) {
     case WireForm::DataStream: return ParseDataStream(property);
@@ -152,6 +169,10 @@ bool InSerialiserLoader::ReadHeader(u8 typeByte, WireHeader& header)
 bool InSerialiserLoader::ParseFlat(InSerialiserProperty& property)
 {
     u8 const typeByte = property.typeByte;
+    if (typeByte == static_cast<u8>(PropType::String)) {
+        u32 length = 0;
+        return m_source.ReadNumber(length) && m_source.Fits(length) && ParseText(property, length);
+    }
     WireForm const form = c_wireTypes[GetWireType(typeByte)].form;
     WireHeader header;
     if (!ReadHeader(typeByte, header)) return false;

@@ -75,13 +75,8 @@ public:
     void ReportProblem(String8 const& text) override;
 
 private:
-    struct ObjectRecord
-    {
-        Counted<Serialisable> object;
-        Consolidated<SharedSerialisable> shared;
-
-        bool IsEmpty() const { return !object && !shared; }
-    };
+    // An object that was read: a property of kind Object or SharedObject, which owns a reference, or None.
+    using ObjectRecord = InSerialiserProperty;
     struct ClassResult
     {
         InSerialiserClassInfoBase* info = nullptr;
@@ -108,6 +103,7 @@ private:
     bool ParseProperties();
     bool ParseList(InSerialiser& list);
     bool ParseProperty(InSerialiserProperty& property);
+    bool ParseNumber(u8 typeByte, InSerialiserProperty& property);
     bool ParseFlat(InSerialiserProperty& property);
     bool ReadHeader(u8 typeByte, WireHeader& header);
     bool ParseText(InSerialiserProperty& property, u32 length);
@@ -124,14 +120,13 @@ private:
     // Objects and classes.
     bool ParseObject(InSerialiserProperty& property);
     bool ParseObjects(InSerialiserProperty& property);
-    template <class P>
-    bool StoreObjects(InSerialiserProperty& property, u32 count, size_t base);
+    bool StoreObjects(InSerialiserProperty& property, InSerialiserProperty::Type kind, u32 count, size_t base);
     bool ReadObject(InSerialiserProperty& property);
     bool ReadNewObject(InSerialiserProperty& property);
     bool CreatePlain(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property);
     bool CreateShared(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property);
     ObjectRecord const* FindObject(u32 index) const;
-    bool AddObject(u32 index, ObjectRecord record);
+    bool AddObject(u32 index, InSerialiserProperty const& property);
     bool ReadClassRecord(ClassResult& result);
     bool ReadKnownClass(ClassResult& result);
     bool ReadClassDescription(ClassResult& result);

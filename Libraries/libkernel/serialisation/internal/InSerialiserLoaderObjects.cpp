@@ -82,8 +82,8 @@ void InSerialiserLoader::ReportObjects(InSerialiserFile::EndFunc const& end) con
     std::vector<NonCounted<Serialisable>> dropped;
     std::vector<NonCounted<Serialisable>> others;
     auto const sort = [&](ObjectRecord const& record) {
-        if (!record.object) return;
-        bool const isDropped = record.object->GetReferenceCount() == 1 && m_markers->WasLoaded(record.object.Get());
+        if (record.kind != InSerialiserProperty::Type::Object) return;
+        bool const isDropped = record.object->GetReferenceCount() == 1 && m_markers->WasLoaded(record.object);
         (isDropped ? dropped : others).push_back(record.object);
     };
     std::for_each(m_objects.begin(), m_objects.end(), sort);
@@ -95,20 +95,27 @@ void InSerialiserLoader::ReportObjects(InSerialiserFile::EndFunc const& end) con
 
 InSerialiserLoader::ObjectRecord const* InSerialiserLoader::FindObject(u32 index) const
 {
-    if (index < m_objects.size() && !m_objects[index].IsEmpty()) return &m_objects[index];
+    if (index < m_objects.size() && m_objects[index].kind != InSerialiserProperty::Type::None) return &m_objects[index];
     if (m_strayObjects.empty()) return nullptr;
     auto const at = m_strayObjects.find(index);
     return at == m_strayObjects.end() ? nullptr : &at->second;
 }
 
-bool InSerialiserLoader::AddObject(u32 index, ObjectRecord record)
+// Takes a reference of its own.
+bool InSerialiserLoader::AddObject(u32 index, InSerialiserProperty const& property)
 {
     if (FindObject(index)) return false;
-    if (index < m_objectsBegun) {
-        if (index >= m_objects.size()) m_objects.resize(index + size_t(1));
-        m_objects[index] = std::move(record);
-    } else
-        m_strayObjects[index] = std::move(record);
+    ObjectRecord* record = nullptr;
+    if (index >= m_objectsBegun)
+        record = &m_strayObjects[index];
+    else if (index == m_objects.size())
+        record = &m_objects.emplace_back();
+    else {
+        if (index > m_objects.size()) m_objects.resize(index + size_t(1));
+        record = &m_objects[index];
+    }
+    *record = property;
+    property.Retain();
     return true;
 }
 
@@ -131,13 +138,9 @@ bool InSerialiserLoader::ReadObject(InSerialiserProperty& property)
     if (!m_source.ReadNumber(index)) return false;
     ObjectRecord const* const record = FindObject(index);
     if (!record) return false;
-    if (record->object) {
-        property.object = Counted<Serialisable>(record->object).Detach();
-        property.kind = InSerialiserProperty::Type::Object;
-    } else {
-        property.shared = Counted<SharedSerialisable>(record->shared.GetCounted()).Detach();
-        property.kind = InSerialiserProperty::Type::SharedObject;
-    }
+    property.kind = record->kind;
+    property.object = record->object;
+    property.Retain();
     return true;
 }
 
@@ -169,26 +172,20 @@ bool InSerialiserLoader::ReadNewObject(InSerialiserProperty& property)
 bool InSerialiserLoader::CreatePlain(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property)
 {
     auto const& properties = static_cast<ClassProperties const&>(info.GetProperties());
-    Counted<Serialisable> object;
     if (auto const create = properties.GetCreateFunc()) {
         // In the map before its properties are read, so that they can refer to it.
-        object = create();
-        if (!object || !AddObject(index, {object, {}})) return false;
+        if (!property.SetObject(create()) || !AddObject(index, property)) return false;
         ObjectList const list(*this, info);
         if (!ParseList(*list)) return false;
-        if (!object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
-    } else if (auto const createLegacy = properties.GetCreateLegacyFunc()) {
-        ObjectList const list(*this, info);
-        if (!ParseList(*list)) return false;
-        object = createLegacy(*list, info.GetVersion());
-        if (!object) return false;
-        if (!object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
-        if (!AddObject(index, {object, {}})) return false;
-    } else
-        return false;
-    property.object = object.Detach();
-    property.kind = InSerialiserProperty::Type::Object;
-    return true;
+        if (!property.object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
+        return true;
+    }
+    auto const createLegacy = properties.GetCreateLegacyFunc();
+    if (!createLegacy) return false;
+    ObjectList const list(*this, info);
+    if (!ParseList(*list) || !property.SetObject(createLegacy(*list, info.GetVersion()))) return false;
+    if (!property.object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
+    return AddObject(index, property);
 }
 
 bool InSerialiserLoader::CreateShared(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property)
@@ -205,32 +202,26 @@ bool InSerialiserLoader::CreateShared(u32 index, InSerialiserClassInfoBase const
         if (!object) return false;
         if (!object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
     }
-    Consolidated<SharedSerialisable> const canonical = properties.ConsolidateObjectSacrifice(object);
-    if (!AddObject(index, {{}, canonical})) return false;
-    property.shared = Counted<SharedSerialisable>(canonical.GetCounted()).Detach();
-    property.kind = InSerialiserProperty::Type::SharedObject;
-    return true;
+    property.SetShared(properties.ConsolidateObjectSacrifice(object).GetCounted());
+    return AddObject(index, property);
 }
 
-template <class P>
-bool InSerialiserLoader::StoreObjects(InSerialiserProperty& property, u32 count, size_t base)
+bool InSerialiserLoader::StoreObjects(InSerialiserProperty& property, InSerialiserProperty::Type kind, u32 count,
+                                      size_t base)
 {
-    using Type = InSerialiserProperty::Type;
-    u8* const at = GetPool().Allocate(sizeof(StoredObjects) + count * sizeof(P));
+    u8* const at = GetPool().Allocate(sizeof(StoredObjects) + count * sizeof(void*));
     if (!at) return false;
     property.objects = new (at) StoredObjects{count};
-    P* const objects = std::uninitialized_default_construct_n(property.objects->GetObjects<P>(), count) - count;
-    // The stack begins at the first object that is not null.
+    // The stack begins at the first object that is not null. What its elements own passes to the array.
     size_t const nulls = count - (m_stack.size() - base);
-    for (size_t i = nulls; i < count; ++i) {
-        InSerialiserProperty& element = m_stack[base + i - nulls];
-        if (element.kind == Type::NullObject) continue;
-        if constexpr (std::is_same_v<P, Counted<Serialisable>>)
-            objects[i] = P(element.object);
-        else
-            objects[i] = P::Trust(Counted<SharedSerialisable>(element.shared));
-        element.Release();
-    }
+    auto const fill = [&](auto** objects, auto pointer) {
+        std::fill_n(objects, nulls, nullptr);
+        for (size_t i = nulls; i < count; ++i) objects[i] = m_stack[base + i - nulls].*pointer;
+    };
+    if (kind == InSerialiserProperty::Type::Object)
+        fill(property.objects->GetObjects<Serialisable>(), &InSerialiserProperty::object);
+    else
+        fill(property.objects->GetObjects<SharedSerialisable>(), &InSerialiserProperty::shared);
     m_stack.resize(base);
     return true;
 }
@@ -258,9 +249,7 @@ bool InSerialiserLoader::ParseObjects(InSerialiserProperty& property)
         property.kind = Type::NullArray;
         return true;
     }
-    if (!(kind == Type::Object ? StoreObjects<Counted<Serialisable>>(property, count, base)
-                               : StoreObjects<Consolidated<SharedSerialisable>>(property, count, base)))
-        return false;
+    if (!StoreObjects(property, kind, count, base)) return false;
     property.kind = kind == Type::Object ? Type::ObjectArray : Type::SharedObjectArray;
     return true;
 }

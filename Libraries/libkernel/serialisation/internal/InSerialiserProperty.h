@@ -40,19 +40,18 @@ struct StoredDataStream
     u16 version;
 };
 
-/// Objects of an array; they follow, Counted or Consolidated.
+/// Objects of an array; pointers to them follow, which own a reference each and may be null.
 struct StoredObjects
 {
     u64 count;
 
-    template <class P>
-    P* GetObjects()
+    /// @p T is Serialisable or SharedSerialisable, whichever they are.
+    template <class T>
+    T** GetObjects()
     {
-        return reinterpret_cast<P*>(this + 1);
+        return reinterpret_cast<T**>(this + 1);
     }
 };
-static_assert(sizeof(Counted<Serialisable>) == sizeof(void*));
-static_assert(sizeof(Consolidated<SharedSerialisable>) == sizeof(void*));
 
 struct StoredClass
 {
@@ -111,6 +110,11 @@ struct InSerialiserProperty
     /// Elements of an array of typed values.
     u64 GetArrayCount() const { return value->count; }
 
+    /// Takes over the object; false, with nothing changed, if it is null.
+    bool SetObject(Counted<Serialisable> taken);
+    void SetShared(Counted<SharedSerialisable> taken);
+    /// For an object of either kind: one more owner.
+    void Retain() const;
     /// False where Release would have nothing to do.
     bool HoldsSomething() const
     {
@@ -121,27 +125,22 @@ struct InSerialiserProperty
 };
 static_assert(sizeof(InSerialiserProperty) == 16 && std::is_trivially_copyable_v<InSerialiserProperty>);
 
-/// Sorts @p count properties by tag and drops all but the last of each tag. Gives the count that remains.
-u32 SortProperties(InSerialiserProperty* properties, u32 count);
+/// A list up to this size keeps the order of its file: whoever saves a class's properties in one order mostly asks for
+/// them in the same, so the next one asked for is the next in line. Longer lists are sorted.
+constexpr u32 c_unsortedList = 16;
 
-/// Finds a tag among sorted properties, or null.
-inline InSerialiserProperty* FindProperty(InSerialiserProperty* properties, u32 count, IDTag tag)
+/// One of 64 bits for a tag. A list keeps the bits of its tags, so that most questions for a tag that it lacks, which
+/// are as many as it has defaults, end at once.
+inline u64 GetTagBit(IDTag tag)
 {
-    // Object lists are short: a walk is cheaper than the branches of a search.
-    constexpr u32 c_walked = 16;
-    InSerialiserProperty* at = properties;
-    while (count > c_walked) {
-        u32 const half = count / 2;
-        if (at[half].tag <= tag) {
-            at += half;
-            count -= half;
-        } else
-            count = half;
-    }
-    for (InSerialiserProperty* const end = at + count; at != end; ++at) {
-        if (at->tag == tag) return at;
-    }
-    return nullptr;
+    return u64(1) << (tag.value * 0x9E3779B9u >> 26);
 }
+
+/// Puts a parsed list of @p count properties into the order in which it is searched, and drops all but the last of each
+/// tag. Gives the count that remains, and the bits of the tags.
+u32 ArrangeProperties(InSerialiserProperty* properties, u32 count, u64& tagBits);
+
+/// Finds a tag in sorted properties, or null.
+InSerialiserProperty* FindSorted(InSerialiserProperty* properties, u32 count, IDTag tag);
 
 } // namespace Kernel

@@ -15,7 +15,7 @@ namespace Kernel {
 /// Three ways of reading. A MemoryInStream is read where it lies. A stream that can seek is read ahead in blocks of
 /// c_blockSize, and Release sets it back. Any other is asked only for what is sure to belong to the parse: the bytes
 /// wanted, and one for each list that is open, since its closing byte must follow.
-class KERNEL_API InSerialiserSource
+class InSerialiserSource
 {
 public:
     static constexpr u64 c_blockSize = 64 * 1024;
@@ -53,6 +53,7 @@ public:
     /// Makes @p count bytes, at most c_blockSize, readable at GetAt.
     bool Fill(u64 count) { return count <= static_cast<u64>(m_end - m_at) || FillSlow(count, m_openLists); }
     u8 const* GetAt() const { return m_at; }
+    u64 GetBuffered() const { return static_cast<u64>(m_end - m_at); }
     /// Takes @p count bytes that Fill has made readable.
     void Take(u64 count) { m_at += count; }
 
