@@ -7,7 +7,7 @@
 #include "serialisation/ReaderClasses.h"
 #include "support/LoadEverything.h"
 
-#include <chrono>
+#include <ctime>
 #include <gtest/gtest.h>
 #include <random>
 #include <set>
@@ -356,7 +356,7 @@ TEST(InSerialiserHostileTest, StreamCutAtAnyByteGivesNull)
 
 TEST(InSerialiserHostileTest, FlippedBitsNeverBreakTheReader)
 {
-    std::vector<u8> const good = EveryItemForm().bytes;
+    std::vector<u8> const good = EveryItemForm(false).bytes;
     std::mt19937 random(20240607);
     int parsed = 0;
     int refused = 0;
@@ -394,16 +394,14 @@ TEST(InSerialiserHostileTest, ExceptionsLeaveNothingBehind)
 
 // Cost.
 
+// The process's own time, which other load on the machine does not lengthen.
 class Clock
 {
 public:
-    double GetSeconds() const
-    {
-        return std::chrono::duration<double>(std::chrono::steady_clock::now() - m_start).count();
-    }
+    double GetSeconds() const { return static_cast<double>(std::clock() - m_start) / CLOCKS_PER_SEC; }
 
 private:
-    std::chrono::steady_clock::time_point const m_start = std::chrono::steady_clock::now();
+    std::clock_t const m_start = std::clock();
 };
 
 TEST(InSerialiserHostileTest, SharedObjectsOfOneHashLoadInTime)

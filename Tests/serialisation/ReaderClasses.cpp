@@ -123,13 +123,13 @@ Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks, Deliv
     return checks ? InSerialiserFile::ParseWithChecks(*in) : InSerialiserFile::ParseSkipUnknownClasses(*in);
 }
 
-PropertyBytes EveryValueForm()
+PropertyBytes EveryValueForm(bool everySize)
 {
     PropertyBytes b;
     // Fixed sizes, alone and as arrays of two.
     for (int type = 1; type <= 116; ++type) {
         u32 const size = c_propSizes[static_cast<size_t>(type)];
-        if (size == 0 || type == 41) continue;
+        if (size == 0 || type == 41 || (!everySize && type > 10 && type % 9 != 0)) continue;
         b.U8(static_cast<u8>(type)).U32(0x10000 + static_cast<u32>(type));
         for (u32 i = 0; i < size; ++i) b.U8(static_cast<u8>(i + 1));
         b.U8(static_cast<u8>(type | 0x80)).U32(0x20000 + static_cast<u32>(type)).U32(2).Zeros(2 * size);
@@ -161,10 +161,10 @@ PropertyBytes EveryValueForm()
     return b;
 }
 
-PropertyBytes EveryItemForm()
+PropertyBytes EveryItemForm(bool everySize)
 {
     PropertyBytes b;
-    b.Header().Append(EveryValueForm());
+    b.Header().Append(EveryValueForm(everySize));
     // A class with every kind of default, its parent, objects in objects, arrays and references.
     b.Item(0x31, "Root").Object(0).U8(0).Code("RdDv").U16(1);
     b.U32Item("DfT1", 11).Item(0x83, "DfT2").U32(2).U32(1).U32(2).TextItem("Name", "default name");

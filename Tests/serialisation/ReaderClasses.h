@@ -96,9 +96,9 @@ Counted<InStream> Deliver(std::vector<u8> const& bytes, Delivery delivery);
 /// Bytes that have been taken from a stream of Deliver.
 u64 GetTaken(InStream const& in);
 Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks = true, Delivery delivery = Delivery::Memory);
-/// Items of every form but objects.
-PropertyBytes EveryValueForm();
+/// Items of every form but objects, in every size of the forms that have many, or only in some.
+PropertyBytes EveryValueForm(bool everySize = true);
 /// A whole stream with one of every form of item, and objects of the classes above.
-PropertyBytes EveryItemForm();
+PropertyBytes EveryItemForm(bool everySize = true);
 
 } // namespace Kernel::Test
