@@ -76,12 +76,15 @@ Counted<Archive::AccessBlock> Archive::CreateAccessBlock(Counted<AccessBlockAdor
 
 Counted<Archive::AccessBlock> Archive::BeginAccessBlockAndOpenFileHandle(Counted<AccessBlockAdorner> const& adorner)
 {
-    m->WaitWhileSuspended();
-    Counted<AccessBlock> const block = CreateAccessBlock(adorner);
-    if (!block) return nullptr;
-    CriticalSectionScope const lock(m->m_accessLock);
-    bool reopened = false;
-    return m->OpenFileHandleCS(reopened, false, false) == RestoreOk ? block : nullptr;
+    for (;;) {
+        m->WaitWhileSuspended();
+        Counted<AccessBlock> block; // Ends outside the lock.
+        CriticalSectionScope const lock(m->m_accessLock);
+        if (m->m_suspended) continue; // Again, between the wait and the lock.
+        block = CreateAccessBlock(adorner);
+        bool reopened = false;
+        return block && m->OpenFileHandleCS(reopened, false, false) == RestoreOk ? block : nullptr;
+    }
 }
 
 Counted<Archive::AccessBlockAdorner> Archive::CreateAccessBlockAdorner() const
@@ -161,6 +164,16 @@ Archive::RestoreResult Archive::GetLastRestoreResult() const
 
 // Suspension.
 
+bool ArchiveImpl::TrySuspendCS()
+{
+    Archive::OffliningState const offlining = GetOffliningState();
+    if (m_accessCount > m_accessOverride || offlining == Archive::OffliningRunning) return false;
+    CloseFilesCS();
+    if (!m_suspended) m_suspendWait = MakeCounted<MultiSemaphore>();
+    m_suspended = true;
+    return true;
+}
+
 bool Archive::Suspend()
 {
     for (;;) {
@@ -171,24 +184,21 @@ bool Archive::Suspend()
                 CriticalSectionScope const state(m->m_stateLock);
                 if (!m->m_master || !m->m_master->m_finalPath.IsEmpty()) return false;
             }
-            OffliningState const offlining = m->GetOffliningState();
-            bool const offliningHolds = offlining == OffliningRunning;
-            if (m->m_accessCount <= m->m_accessOverride && !offliningHolds) {
-                m->CloseFilesCS();
-                if (!m->m_suspended) m->m_suspendWait = MakeCounted<MultiSemaphore>();
-                m->m_suspended = true;
-                return true;
-            }
-            if (!offliningHolds) {
+            if (m->TrySuspendCS()) return true;
+            if (m->GetOffliningState() != OffliningRunning) {
                 if (!m->m_suspenderWait) m->m_suspenderWait = MakeCounted<Semaphore>();
                 wait = m->m_suspenderWait;
+                ++m->m_waitingSuspenders;
             }
         }
         // Offlining works in short steps and leaves off when it is asked to.
-        if (wait)
-            wait->Wait(0);
-        else
+        if (!wait) {
             m->WaitForOffliningToPause();
+            continue;
+        }
+        wait->Wait(0);
+        CriticalSectionScope const lock(m->m_accessLock);
+        --m->m_waitingSuspenders;
     }
 }
 
@@ -224,21 +234,28 @@ void ArchiveImpl::WaitWhileSuspended()
     }
 }
 
+// Suspends on the waiter's behalf: by the time it runs the next reader would long be at the file, and the one after
+// that before the first has left.
 void ArchiveImpl::SignalSuspenderCS()
 {
-    if (m_suspenderWait && m_accessCount <= m_accessOverride) m_suspenderWait->Signal();
+    if (m_waitingSuspenders == 0 || m_accessCount > m_accessOverride) return;
+    TrySuspendCS();
+    m_suspenderWait->Signal();
 }
 
 bool ArchiveImpl::GuaranteeFileHandle()
 {
-    WaitWhileSuspended();
-    CriticalSectionScope const lock(m_accessLock);
-    ++m_accessCount;
-    bool reopened = false;
-    if (OpenFileHandleCS(reopened, false, false) == Archive::RestoreOk) return true;
-    --m_accessCount;
-    SignalSuspenderCS();
-    return false;
+    for (;;) {
+        WaitWhileSuspended();
+        CriticalSectionScope const lock(m_accessLock);
+        if (m_suspended) continue; // Again, between the wait and the lock.
+        ++m_accessCount;
+        bool reopened = false;
+        if (OpenFileHandleCS(reopened, false, false) == Archive::RestoreOk) return true;
+        --m_accessCount;
+        SignalSuspenderCS();
+        return false;
+    }
 }
 
 void ArchiveImpl::DecrementAccessCount()

@@ -479,6 +479,14 @@ void ArchiveCommit::DropScratchRevisions()
         m_impl.m_revisionsByAddress.erase(revision.Get());
     }
     std::erase_if(m_impl.m_revisions, [](Counted<Archive::Revision> const& r) { return r->IsScratch(); });
+    // Other bytes may soon stand where their blocks lie: nothing is to be copied from there any more.
+    std::erase_if(m_impl.m_offlineQueue, [&](auto const& queued) {
+        auto const& [info, revision] = queued;
+        if (!revision->IsScratch()) return false;
+        if (Archive::FileRevision const* const entry = revision->Find(*info))
+            m_impl.m_offlineTotal -= std::min(entry->fileCompressedSize, m_impl.m_offlineTotal);
+        return true;
+    });
 }
 
 void ArchiveCommit::QueueForOfflining()

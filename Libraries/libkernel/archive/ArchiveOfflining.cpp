@@ -176,12 +176,6 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
     Counted<FileStoreBackData const> copy;
     ArchiveBackDataBucketStore& store = ArchiveBackDataBucketStore::GetInstance();
     try {
-        if (entry.fileCompressedSize == 0 && entry.fileSize == 0) {
-            // Nothing to copy, and nothing that could be lost.
-            CriticalSectionScope const lock(m_stateLock);
-            m_offlineQueue.erase(entry.info.Get());
-            return true;
-        }
         if (!GuaranteeFileHandle()) return false;
         struct Access
         {

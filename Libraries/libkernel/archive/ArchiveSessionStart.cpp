@@ -66,7 +66,18 @@ Archive::CreateSessionResult ArchiveImpl::CreateSessionI(ArchiveSessionHandle& h
         exclusive = m_exclusiveWait;
     }
     if (exclusive) exclusive->Wait(0);
+    for (;;) {
+        bool suspended = false;
+        Archive::CreateSessionResult const result = TryCreateSession(handle, type, choice, abort, suspended);
+        if (!suspended) return result;
+        WaitWhileSuspended();
+    }
+}
 
+Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle& handle, Archive::SessionType type,
+                                                           Archive::ArchiveChoice choice, bool const* abort,
+                                                           bool& suspended)
+{
     CriticalSectionScope const sessionLock(m_sessionLock);
     if (handle.IsValid()) return Archive::SessionHandleInUse;
     Counted<Archive::ArchiveFile> file;
@@ -90,7 +101,12 @@ Archive::CreateSessionResult ArchiveImpl::CreateSessionI(ArchiveSessionHandle& h
         state->enumerationOnly = choice == Archive::ChoiceNone;
         state->file = file;
         if (file) {
-            state->access = m_self.CreateAccessBlock(m_self.CreateUpgradeableAccessBlockAdorner());
+            {
+                CriticalSectionScope const lock(m_accessLock);
+                suspended = m_suspended;
+                if (suspended) return Archive::SessionNoMemory;
+                state->access = m_self.CreateAccessBlock(m_self.CreateUpgradeableAccessBlockAdorner());
+            }
             if (!state->access) return Archive::SessionNoMemory;
             if (!OpenForSession(*file)) return Archive::SessionFileUnusable;
 

@@ -194,18 +194,19 @@ bool Archive::CheckForReplacedFile()
 
 bool Archive::UpdateModifiedTimestamp()
 {
-    CriticalSectionScope const accessLock(m->m_accessLock);
-    if (!m->m_keepOpen) return false;
-    bool reopened = false;
-    if (m->OpenFileHandleCS(reopened, false, false) != RestoreOk) return false;
+    if (!GetKeepOpen() || !m->GuaranteeFileHandle()) return false;
     Counted<ArchiveFile> master;
     {
         CriticalSectionScope const lock(m->m_stateLock);
         master = m->m_master;
     }
-    if (!master) return false;
-    CriticalSectionScope const fileLock(master->m_lock);
-    return master->m_stream && master->m_stream->UpdateTimestamps();
+    bool updated = false;
+    if (master) {
+        CriticalSectionScope const fileLock(master->m_lock);
+        updated = master->m_stream && master->m_stream->UpdateTimestamps();
+    }
+    m->DecrementAccessCount();
+    return updated;
 }
 
 namespace {

@@ -130,6 +130,7 @@ struct ArchiveImpl
     Counted<MultiSemaphore> m_exclusiveWait; // Waiters for an exclusive block to end; null when there is none.
     Counted<MultiSemaphore> m_suspendWait;   // All access waits here while suspended.
     Counted<Semaphore> m_suspenderWait;      // Suspend waits here for the access count to fall.
+    u32 m_waitingSuspenders = 0;
     Archive::RestoreResult m_lastRestore = Archive::RestoreOk;
 
     // State lock.
@@ -204,6 +205,8 @@ struct ArchiveImpl
     void DecrementAccessCount();
     void WaitWhileSuspended();
     void SignalSuspenderCS();
+    /// Closes the files and holds access back, unless somebody uses them.
+    bool TrySuspendCS();
     void EndAccessBlock(Archive::AccessBlock const& block);
     /// A block that holds off new sessions for as long as it lives; null if there is one already or it is refused.
     Counted<Archive::AccessBlock> CreateExclusiveAccessBlock();
@@ -279,6 +282,9 @@ struct ArchiveImpl
     Archive::CreateSessionResult CreateSessionI(ArchiveSessionHandle& handle, Archive::SessionType type,
                                                 Archive::ArchiveChoice choice, bool const* abort,
                                                 bool skipExclusiveWait);
+    /// One try. With @p suspended the result means nothing: access is held back, and the caller waits without locks.
+    Archive::CreateSessionResult TryCreateSession(ArchiveSessionHandle& handle, Archive::SessionType type,
+                                                  Archive::ArchiveChoice choice, bool const* abort, bool& suspended);
     /// Opens the session's file and passes its write guard; false with the cause in m_lastRestore.
     bool OpenForSession(Archive::ArchiveFile& file);
     /// The info block on disk is the one this archive read or wrote last.
