@@ -1,0 +1,561 @@
+#include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/platform/PlatformFile.h"
+#include "libkernel/streams/InStream.h"
+#include "libkernel/streams/MemoryStreams.h"
+#include "libkernel/streams/OutStream.h"
+#include "support/ArchiveBuilder.h"
+#include "support/ArchiveFixture.h"
+#include "support/TempFolder.h"
+
+#include <atomic>
+#include <cstring>
+#include <ctime>
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <random>
+#include <set>
+#include <sys/stat.h>
+
+// Files made to hurt: a refusal is one of the documented results, at a cost that the size of the file justifies.
+
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__) && !defined(__clang__)
+#define KERNEL_TEST_COUNTS_MEMORY 1
+#endif
+
+namespace {
+
+// The largest block that was asked for since it was last set to 0.
+std::atomic<size_t> s_largest{0};
+
+void Note(size_t size)
+{
+    for (size_t seen = s_largest; size > seen && !s_largest.compare_exchange_weak(seen, size);) {
+    }
+}
+
+} // namespace
+
+#ifdef KERNEL_TEST_COUNTS_MEMORY
+extern "C" {
+void* __libc_malloc(size_t);
+void* __libc_calloc(size_t, size_t);
+void* __libc_realloc(void*, size_t);
+__attribute__((visibility("default"))) void* malloc(size_t size)
+{
+    Note(size);
+    return __libc_malloc(size);
+}
+__attribute__((visibility("default"))) void* calloc(size_t count, size_t size)
+{
+    Note(count * size);
+    return __libc_calloc(count, size);
+}
+__attribute__((visibility("default"))) void* realloc(void* block, size_t size)
+{
+    Note(size);
+    return __libc_realloc(block, size);
+}
+}
+#endif
+
+namespace KernelTest {
+namespace {
+
+using namespace Kernel;
+using TestSupport::ArchiveBuilder;
+using R = Archive::OpenResult;
+
+constexpr u64 c_far = u64{1} << 63;
+
+/// Device flushes cost nothing while one lives: nothing here is about them.
+class NoDeviceFlush
+{
+public:
+    NoDeviceFlush()
+    {
+        static Platform::FileCalls const s_calls = [] {
+            Platform::FileCalls calls = Platform::GetSystemFileCalls();
+            calls.flush = [](Platform::FileHandle, Platform::FlushKind) { return 0; };
+            calls.flushFolder = [](char const*) { return 0; };
+            return calls;
+        }();
+        Platform::SetFileCalls(&s_calls);
+    }
+    ~NoDeviceFlush() { Platform::SetFileCalls(nullptr); }
+};
+
+class ArchiveHostileTest : public testing::Test
+{
+protected:
+    R TestBytes(std::string const& bytes) const
+    {
+        auto const in = MakeCounted<MemoryInStream>(bytes.data(), bytes.size(), false);
+        return Archive::TestArchive(*in, c_documentTag, nullptr, nullptr);
+    }
+    /// In place: to empty the file first or to remove it costs milliseconds on some file systems.
+    void Overwrite(std::string const& bytes) const
+    {
+        std::ofstream(m_path, std::ios::binary | std::ios::app).close();
+        std::fstream(m_path, std::ios::in | std::ios::out | std::ios::binary) << bytes;
+        std::filesystem::resize_file(m_path, bytes.size());
+    }
+    /// Opens, counting what that costs.
+    Counted<Archive> Open(std::string const& bytes, R& result, Archive::OpenMode mode = Archive::OpenModeReadWrite)
+    {
+        Overwrite(bytes);
+        std::clock_t const start = std::clock();
+        s_largest = 0;
+        Counted<Archive> const archive = Archive::Open(Str(m_path), mode, c_documentTag, result);
+        EXPECT_LT(s_largest.load(), (u64{64} << 20) + 4 * bytes.size());
+        EXPECT_LT(std::clock() - start, CLOCKS_PER_SEC);
+        EXPECT_EQ(static_cast<bool>(archive), result == R::OpenOk);
+        if (result == R::OpenOk) {
+            EXPECT_EQ(TestBytes(bytes), R::OpenOk);
+        }
+        return archive;
+    }
+    /// Reads everything in every way there is; what comes is whole or refused.
+    static void ReadEverything(Archive& archive)
+    {
+        std::vector<String8> paths;
+        archive.GetFileList(paths);
+        s_largest = 0;
+        for (String8 const& path : paths) {
+            Get(archive, path.GetData());
+            try {
+                Counted<InStream> const in = archive.OpenFileInStream(path);
+                char buffer[4096];
+                for (u64 left = in ? in->GetSize() : 0; left != 0;) {
+                    u64 const got = in->ReadBlock(buffer, std::min<u64>(left, sizeof(buffer)));
+                    if (got == 0) break;
+                    left -= got;
+                }
+            } catch (ArchiveException const&) {
+            }
+        }
+        std::vector<Counted<Archive::Revision const>> revisions;
+        archive.GetRevisions(revisions);
+        for (auto const& revision : revisions)
+            for (Archive::FileRevision const& entry : revision->GetEntries())
+                if (!entry.IsDeletion()) archive.CheckStoredBlock(*revision, entry);
+        archive.LoadThumbnails();
+        while (archive.RewindWorkingRevision()) archive.GetFileList(paths);
+        archive.ResetWorkingRevisionToHead();
+    }
+    /// A save goes in and comes back beside what could be read before.
+    void ExpectSaves(Counted<Archive>& archive)
+    {
+        std::map<std::string, std::string> expected = GetAll(*archive);
+        ASSERT_TRUE(Save(*archive, {{"saved", "after"}}));
+        expected["saved"] = "after";
+        archive = nullptr;
+        archive = OpenDocument(m_path);
+        ASSERT_TRUE(archive);
+        std::map<std::string, std::string> found = GetAll(*archive);
+        // A block that ended behind the end of the file may end within it now.
+        for (auto const& [path, bytes] : expected)
+            if (bytes == "(unreadable)") found[path] = bytes;
+        ASSERT_EQ(found, expected);
+    }
+
+    NoDeviceFlush const m_noFlush;
+    TestSupport::TempFolder const m_folder;
+    std::string const m_path = m_folder / "doc";
+};
+
+ArchiveBuilder::Record Added(ArchiveBuilder& builder, u32 uid, std::string const& path, std::string const& bytes = "1")
+{
+    return {uid, 0, path, builder.AddBlock(bytes)};
+}
+
+TEST_F(ArchiveHostileTest, TablesThatMakeNoSenseAreRefusedWithTheirResult)
+{
+    using B = ArchiveBuilder;
+    struct
+    {
+        char const* what;
+        R result;
+        void (*make)(B&, B::Table&); // Changes a sound newest table, before it is added behind another.
+        void (*after)(B&);           // And the file, behind it.
+    } const cases[] = {
+        {"sound", R::OpenOk, nullptr, nullptr},
+        {"FirstFAT far away", R::OpenTruncated, nullptr, [](B& b) { b.firstFAT = c_far; }},
+        {"FirstFAT 58 from the end", R::OpenTruncated, nullptr, [](B& b) { b.firstFAT = b.GetEnd() - 58; }},
+        {"FirstFAT in a block", R::OpenCorrupt, nullptr, [](B& b) { b.firstFAT = 73; }},
+        {"names itself", R::OpenCorrupt, [](B& b, B::Table& t) { t.next = b.GetEnd(); }, nullptr},
+        {"names a later one", R::OpenCorrupt, [](B& b, B::Table& t) { t.next = b.GetEnd() + 1; }, nullptr},
+        {"names one far away", R::OpenCorrupt, [](B&, B::Table& t) { t.next = c_far; }, nullptr},
+        {"names a block", R::OpenCorrupt, [](B&, B::Table& t) { t.next = 72; }, nullptr},
+        {"names one that runs into it", R::OpenCorrupt, [](B& b, B::Table& t) { t.next = b.GetEnd() - 40; }, nullptr},
+        {"4 G records", R::OpenCorrupt, [](B&, B::Table& t) { t.recordCount = 0xFFFFFFFF; }, nullptr},
+        {"a record too few", R::OpenCorrupt, [](B&, B::Table& t) { t.recordCount = 0; }, nullptr},
+        {"4 GB of user data", R::OpenCorrupt, [](B&, B::Table& t) { t.userDataSize = 0xFFFFFFFF; }, nullptr},
+        {"65,535 path counts", R::OpenCorrupt, [](B&, B::Table& t) { t.pathCountCount = 0xFFFF; }, nullptr},
+        {"body one short", R::OpenCorrupt, [](B&, B::Table& t) { t.bodySize = 46; }, nullptr},
+        {"ends elsewhere", R::OpenCorrupt, [](B& b, B::Table& t) { t.fileEnd = b.GetEnd() + 1000; }, nullptr},
+        {"kind 3", R::OpenCorrupt, [](B&, B::Table& t) { t.records[0].kind = 3; }, nullptr},
+        {"#FT1", R::OpenCorrupt, [](B&, B::Table& t) { t.tag = "#FT1"; }, nullptr},
+        {"#FT5", R::OpenTooNew, [](B&, B::Table& t) { t.tag = "#FT5"; }, nullptr},
+        {"#FT9", R::OpenTooNew, [](B&, B::Table& t) { t.tag = "#FT9"; }, nullptr},
+        {"#FT:", R::OpenCorrupt, [](B&, B::Table& t) { t.tag = "#FT:"; }, nullptr},
+        {"one UID, two paths", R::OpenCorrupt, [](B&, B::Table& t) { t.records[0].uid = 1; }, nullptr},
+        {"wrong guard", R::OpenBadInfo, nullptr, [](B& b) { b.guardTag = "Pro1"; }},
+        {"wrong info", R::OpenBadInfo, nullptr, [](B& b) { b.infoTag = "#inf"; }},
+        {"half of its bytes dead and more", R::OpenOk, nullptr, [](B& b) { b.deadBytes = c_far; }},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        B builder;
+        builder.AddFile(1, "old", "bytes");
+        B::Table table;
+        table.records = {Added(builder, 2, "new")};
+        if (c.make) c.make(builder, table);
+        builder.AddTable(table);
+        if (c.after) c.after(builder);
+        R result{};
+        Counted<Archive> archive = Open(builder.Build(), result);
+        EXPECT_EQ(result, c.result);
+        // Whoever walks the headers alone may see less, but no less than the way the tables are tied.
+        if (std::strstr(c.what, "names itself")) {
+            EXPECT_EQ(TestBytes(builder.Build()), R::OpenCorrupt);
+        }
+        if (archive) ExpectSaves(archive);
+    }
+}
+
+TEST_F(ArchiveHostileTest, InfoBlockThatLagsIsRaisedFromTheTables)
+{
+    for (u64 const end : {u64{0}, u64{12}, u64{100}, u64{1} << 40, c_far}) {
+        SCOPED_TRACE(end);
+        ArchiveBuilder builder;
+        builder.AddFile(7, "a", "bytes");
+        builder.fileEnd = end;
+        builder.nextFreeUID = 3;
+        R result{};
+        Counted<Archive> archive = Open(builder.Build(), result);
+        ASSERT_TRUE(archive) << result;
+        EXPECT_EQ(StateOf(*archive).fileEnd, builder.GetEnd());
+        ExpectSaves(archive);
+        EXPECT_EQ(archive->GetFileInfo(Str("saved"))->GetUID(), 8u);
+    }
+    ArchiveBuilder used;
+    used.AddFile(0xFFFFFFFF, "a", "bytes");
+    R result{};
+    Counted<Archive> const archive = Open(used.Build(), result);
+    ASSERT_TRUE(archive);
+    EXPECT_THROW(Save(*archive, {{"b", "2"}}), OutStream::WriteException);
+    EXPECT_TRUE(Save(*archive, {{"a", "2"}}));
+    EXPECT_EQ(GetAll(*OpenDocument(m_path, Archive::OpenModeReadOnly)),
+              (std::map<std::string, std::string>{{"a", "2"}}));
+}
+
+TEST_F(ArchiveHostileTest, PathsThatAreNotUniqueHaveOneOutcome)
+{
+    ArchiveBuilder builder;
+    builder.AddFile(1, "twice", "old");
+    builder.AddFile(2, "twice", "new");
+    ArchiveBuilder::Table table;
+    table.records = {{3, 1, "", builder.AddBlock("never named")}, {4, 2}};
+    builder.AddTable(table);
+    R result{};
+    Counted<Archive> archive = Open(builder.Build(), result);
+    ASSERT_TRUE(archive);
+    EXPECT_EQ(GetAll(*archive), (std::map<std::string, std::string>{{"twice", "new"}}));
+    ReadEverything(*archive);
+    ExpectSaves(archive);
+}
+
+TEST_F(ArchiveHostileTest, BlocksThatAreNotThereAreRefused)
+{
+    struct
+    {
+        char const* what;
+        void (*change)(ArchiveBuilder::Details&);
+        bool corrupt; // Opening a stream says corruption, and not only that it fails.
+    } const cases[] = {
+        {"position that wraps", [](ArchiveBuilder::Details& d) { d.pos = ~u64{3}; }, true},
+        {"position far away", [](ArchiveBuilder::Details& d) { d.pos = u64{1} << 40; }, false},
+        {"position in the header", [](ArchiveBuilder::Details& d) { d.pos = 1; }, true},
+        {"an exabyte, stored 4", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60; }, true},
+        {"an exabyte of zlib", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60, d.code = 1; }, true},
+        {"an exabyte of zstd", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60, d.code = 2; }, true},
+        {"2^64-1 both", [](ArchiveBuilder::Details& d) { d.size = d.stored = ~u64{0}; }, false},
+        {"an exabyte both", [](ArchiveBuilder::Details& d) { d.size = d.stored = u64{1} << 60; }, false},
+        {"an exabyte both, zstd", [](ArchiveBuilder::Details& d) { d.size = d.stored = u64{1} << 60, d.code = 2; },
+         false},
+        {"a megabyte of zlib that is none", [](ArchiveBuilder::Details& d) { d.size = 100'000, d.code = 1; }, false},
+        {"wrong CRC", [](ArchiveBuilder::Details& d) { ++d.crc; }, false},
+        {"tag in another's bytes", [](ArchiveBuilder::Details& d) { d.pos = 72 + 4 + 6; }, false},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        ArchiveBuilder builder;
+        ArchiveBuilder::Table table;
+        table.records = {Added(builder, 1, "holds", "inner #Fil others"), Added(builder, 2, "bad", "1234")};
+        c.change(table.records[1].details);
+        builder.AddTable(table);
+        R result{};
+        Counted<Archive> archive = Open(builder.Build(), result);
+        ASSERT_TRUE(archive);
+        s_largest = 0;
+        EXPECT_FALSE(Get(*archive, "bad"));
+        bool corrupt = false;
+        try {
+            Counted<InStream> const in = archive->OpenFileInStream(Str("bad"));
+            // Comes to its end with an error only.
+            for (char buffer[1000]; in;) ASSERT_NE(in->ReadBlock(buffer, sizeof(buffer)), 0u);
+        } catch (ArchiveCorruptionException const&) {
+            corrupt = true;
+        } catch (ArchiveFileException const&) {
+        }
+        if (c.corrupt) {
+            EXPECT_TRUE(corrupt);
+        }
+        EXPECT_NE(archive->CheckStoredBlock(
+                      *archive->GetHeadRevisionForFile(Str("bad")),
+                      *archive->GetHeadRevisionForFile(Str("bad"))->Find(*archive->GetFileInfo(Str("bad")))),
+                  Archive::BlockCheck::Ok);
+        EXPECT_LT(s_largest.load(), u64{8} << 20);
+        EXPECT_EQ(Get(*archive, "holds"), "inner #Fil others");
+        EXPECT_TRUE(Save(*archive, {{"bad", "good"}}));
+        EXPECT_EQ(Get(*archive, "bad"), "good");
+    }
+}
+
+TEST_F(ArchiveHostileTest, LinksThatLeadNowhereHaveTheirResult)
+{
+    std::string const fifo = m_folder / "fifo";
+    std::string const ring = m_folder / "ring";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+    auto const linkTo = [](std::string const& path) {
+        ArchiveBuilder builder;
+        builder.link = {builder.saveTime, builder.saveCount, path};
+        return builder.Build();
+    };
+    WriteWhole(ring, linkTo(m_path));
+    struct
+    {
+        char const* what;
+        std::string bytes;
+        R readOnly, readWrite;
+    } const cases[] = {
+        {"itself", linkTo(m_path), R::OpenNotArchive, R::OpenReadOnlyArchive},
+        {"ring", linkTo(ring), R::OpenNotArchive, R::OpenNotArchive},
+        {"pipe", linkTo(fifo), R::OpenLinkedNotFound, R::OpenLinkedNotFound},
+        {"folder", linkTo(m_folder.GetPath()), R::OpenIsDirectory, R::OpenIsDirectory},
+        {"device", linkTo("/dev/zero"), R::OpenLinkedNotFound, R::OpenLinkedNotFound},
+        {"nothing", linkTo(m_path + "x"), R::OpenLinkedNotFound, R::OpenLinkedNotFound},
+        {"cut", linkTo(std::string(65535, 'x')).substr(0, 60'000), R::OpenTruncated, R::OpenTruncated},
+        {"very long", linkTo(std::string(65535, 'x')), R::OpenLinkedNotFound, R::OpenLinkedNotFound},
+        {"path with a zero", linkTo(std::string("x\0y", 3)), R::OpenLinkedNotFound, R::OpenLinkedNotFound},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        R result{};
+        Open(c.bytes, result, Archive::OpenModeReadOnly);
+        EXPECT_EQ(result, c.readOnly);
+        Open(c.bytes, result);
+        EXPECT_EQ(result, c.readWrite);
+        EXPECT_FALSE(Archive::VerifyLinks(Str(m_path)));
+        Archive::LinkInfo info;
+        EXPECT_NE(Archive::TestForScratchLinkAndReferenceInfo(Str(m_path), true, info), R::OpenOk);
+    }
+    Archive::OpenResult result{};
+    Archive::Open(Str(fifo), Archive::OpenModeReadOnly, IDTag(), result);
+    EXPECT_EQ(result, R::OpenNotFound);
+}
+
+TEST_F(ArchiveHostileTest, ThumbnailBlocksThatClaimTooMuchAreNone)
+{
+    using T = ArchiveBuilder::Thumbnail;
+    struct
+    {
+        char const* what;
+        std::vector<T> entries;
+        std::optional<u32> count, size;
+        bool reads;
+    } const cases[] = {
+        {"sound", {{42, 3}, {45, 2}}, {}, {}, true},
+        {"none", {}, {}, {}, true},
+        {"4 G entries", {{29, 3}}, 0xFFFFFFFF, {}, false},
+        {"4 G entries in 4 GB", {{29, 3}}, 0xFFFFFFFF, 0xFFFFFFFF, false},
+        {"outside", {{31, 5}}, {}, {}, false},
+        {"far away", {{~u64{0} - 2, 3}}, {}, {}, false},
+        {"larger than the file", {{29, 0xFFFFFFFF}}, {}, {}, false},
+        {"block past the end", {{29, 3}}, {}, 1000, false},
+        {"many over one range", std::vector<T>(100'000, T{16, 1'300'000}), {}, {}, false},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.what);
+        ArchiveBuilder builder;
+        builder.AddFile(1, "a", "1");
+        builder.AddThumbnails(c.entries, "abcde", c.count, c.size);
+        R result{};
+        Counted<Archive> const archive = Open(builder.Build(), result);
+        ASSERT_TRUE(archive);
+        s_largest = 0;
+        Counted<ArchiveThumbnails const> const thumbnails = archive->LoadThumbnails();
+        EXPECT_EQ(static_cast<bool>(thumbnails), c.reads);
+        if (thumbnails) {
+            EXPECT_EQ(thumbnails->GetRecs().size(), c.entries.size());
+        }
+        EXPECT_LT(s_largest.load(), u64{8} << 20);
+        EXPECT_TRUE(Save(*archive, {{"b", "2"}}));
+        EXPECT_FALSE(archive->LoadThumbnails());
+    }
+}
+
+TEST_F(ArchiveHostileTest, PathCounterThatIsUsedUpGivesNoPath)
+{
+    ArchiveBuilder builder;
+    ArchiveBuilder::Table table;
+    table.pathCounts = {{"a", "b", ~u64{0} - 1}};
+    builder.AddTable(table);
+    R result{};
+    Counted<Archive> const archive = Open(builder.Build(), result);
+    ASSERT_TRUE(archive);
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    String8 path;
+    auto const item = MakeCounted<BytesItem>();
+    EXPECT_TRUE(handle->GenerateIndexedPath({Str("a"), Str("b")}, item, nullptr, path));
+    EXPECT_EQ(path, "affffffffffffffffb");
+    auto const other = MakeCounted<BytesItem>();
+    EXPECT_FALSE(handle->GenerateIndexedPath({Str("a"), Str("b")}, other, nullptr, path));
+}
+
+TEST_F(ArchiveHostileTest, BlockTagInPlaceOfTheGuardReadsAndTakesNoSave)
+{
+    ArchiveBuilder builder;
+    builder.guardTag = "#Fil";
+    builder.AddFile(1, "a", "1");
+    R result{};
+    Counted<Archive> const archive = Open(builder.Build(), result);
+    ASSERT_TRUE(archive);
+    EXPECT_EQ(Get(*archive, "a"), "1");
+    ArchiveSessionHandle handle;
+    EXPECT_EQ(archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
+              Archive::SessionFileUnusable);
+    EXPECT_EQ(archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
+    EXPECT_EQ(ReadWhole(m_path), builder.Build());
+}
+
+TEST_F(ArchiveHostileTest, LongHistoriesOpenAndGoInTime)
+{
+    // 100,000 tables of one record each, over two blocks.
+    for (bool const broken : {false, true}) {
+        ArchiveBuilder builder;
+        ArchiveBuilder::Table table;
+        table.tag = broken ? "#FT1" : "#FT4";
+        table.records = {Added(builder, 1, "a")};
+        builder.AddTable(table);
+        table.tag = "#FT4";
+        table.records[0].kind = 1;
+        for (int i = 0; i < 100'000; ++i) builder.AddTable(table);
+        R result{};
+        std::clock_t const start = std::clock();
+        WriteWhole(m_path, builder.Build());
+        Counted<Archive> archive = Archive::Open(Str(m_path), Archive::OpenModeReadOnly, c_documentTag, result);
+        EXPECT_EQ(result, broken ? R::OpenCorrupt : R::OpenOk);
+        if (archive) {
+            EXPECT_EQ(Get(*archive, "a"), "1");
+        }
+        archive = nullptr;
+        EXPECT_LT(std::clock() - start, 10 * CLOCKS_PER_SEC); // The file has 10 MB.
+    }
+}
+
+/// A document with something of everything.
+std::string MakeRichDocument(std::string const& path)
+{
+    Counted<Archive> const archive = CreateDocument(path);
+    EXPECT_TRUE(Save(*archive, {{"a", "first"}, {"b", std::string(300, 'b')}, {"empty", ""}}));
+    EXPECT_TRUE(Save(*archive, {{"b", std::nullopt}, {"packed", std::string(2000, 'p')}}, false,
+                     Archive::SessionTypeIncremental, true));
+    ArchiveSessionHandle handle;
+    EXPECT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    String8 generated;
+    auto const item = MakeCounted<BytesItem>("generated");
+    EXPECT_TRUE(handle->GenerateIndexedPath({Str("img/"), Str(".png")}, item, nullptr, generated));
+    handle->CreateFile(generated, item);
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("second"));
+    handle->SetUserData("user", 4);
+    auto const thumbnails = MakeCounted<ArchiveThumbnails>();
+    auto const data = MakeCounted<RawData>(20);
+    std::memset(data->GetData(), 't', 20);
+    thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, data);
+    handle->SetThumbnails(thumbnails);
+    archive->CloseSession(handle, false);
+    return ReadWhole(path);
+}
+
+TEST_F(ArchiveHostileTest, CutAtAnyByteGivesTheResultOfTheStructureThatEnds)
+{
+    std::string const whole = MakeRichDocument(m_path);
+    Archive::FileState const state = StateOf(*OpenDocument(m_path));
+    std::map<std::string, std::string> const all = GetAll(*OpenDocument(m_path));
+    for (u64 size = 0; size <= whole.size(); ++size) {
+        R const expected = size < 12                    ? R::OpenNotArchive
+                           : size < 72                  ? R::OpenBadInfo
+                           : size < state.firstFAT + 59 ? R::OpenTruncated
+                           : size < state.fileEnd       ? R::OpenCorrupt
+                                                        : R::OpenOk;
+        std::string const bytes = whole.substr(0, size);
+        R result{};
+        Counted<Archive> archive = Open(bytes, result);
+        ASSERT_EQ(result, expected) << size;
+        R const tested = TestBytes(bytes);
+        // The headers alone are there when only the newest body is cut.
+        ASSERT_EQ(tested, expected == R::OpenCorrupt ? R::OpenOk : expected) << size;
+        if (!archive) continue;
+        EXPECT_EQ(GetAll(*archive), all);
+        EXPECT_EQ(static_cast<bool>(archive->LoadThumbnails()), size == whole.size());
+    }
+    // In front of the first table: link and reference path.
+    ArchiveBuilder builder;
+    builder.link = {0, 1, "/nowhere"};
+    builder.reference = "reference";
+    for (u64 size = 72; size < builder.GetFrontSize(); ++size) {
+        R result{};
+        Open(builder.Build().substr(0, size), result);
+        ASSERT_EQ(result, R::OpenTruncated) << size;
+    }
+}
+
+TEST_F(ArchiveHostileTest, FlippedBitsAreRefusedOrReadAndSavedInto)
+{
+    std::string const own = MakeRichDocument(m_path);
+    ArchiveBuilder builder(9);
+    builder.reference = "ref";
+    ArchiveBuilder::Table table;
+    table.tag = "#FT2";
+    table.records = {{1, 0, "z", builder.AddBlock(std::string(700, 'z'), 0x41)}, Added(builder, 2, "plain", "bytes")};
+    table.pathCounts = {{"p", "s", 9}};
+    builder.AddTable(table);
+    builder.AddFile(3, "zstd", std::string(500, 's'), 0x82);
+    std::string const built = builder.Build();
+    std::set<R> const documented = {R::OpenOk,      R::OpenLinkedNotFound, R::OpenLinkMismatch, R::OpenNotArchive,
+                                    R::OpenTooOld,  R::OpenTooNew,         R::OpenWrongType,    R::OpenCorrupt,
+                                    R::OpenBadInfo, R::OpenTruncated};
+    int opened = 0;
+    for (u32 seed = 0; seed < 10'000; ++seed) {
+        std::mt19937 random(seed);
+        std::string bytes = seed % 4 == 3 ? built : own;
+        for (u32 flips = 1 + random() % 3; flips != 0; --flips)
+            bytes[random() % bytes.size()] ^= char(1 << random() % 8);
+        SCOPED_TRACE("seed " + std::to_string(seed));
+        R result{};
+        Counted<Archive> archive = Open(bytes, result);
+        ASSERT_TRUE(documented.count(result)) << result;
+        if (!archive) continue;
+        ++opened;
+        ReadEverything(*archive);
+        ASSERT_LT(s_largest.load(), u64{70} << 20);
+        ExpectSaves(archive);
+        if (HasFailure()) break;
+    }
+    EXPECT_GT(opened, 3000);
+}
+
+} // namespace
+} // namespace KernelTest
