@@ -92,9 +92,24 @@ struct DelayLoadHolder::LoadAttempt
 {
     Counted<FileStoreItem> item;
     Counted<FileStoreBackData const> triedBackData;
-    std::vector<Counted<FileStoreLink>> failedStores;
+    struct FailedStore
+    {
+        Counted<FileStoreLink> link;
+        NonCounted<FileStoreRevision const> revision; // Compared only: it may be gone.
+    };
+    std::vector<FailedStore> failedStores;
     Counted<FileStoreLink> source; // The store that the item came from, and that has set its state. Null: back data.
     bool isFinal = true;           // False if a store was just being destroyed: its last words may bring back data.
+
+    bool HasFailedAt(Counted<FileStoreLink> const& link) const
+    {
+        return std::any_of(failedStores.begin(), failedStores.end(), [&](auto const& f) { return f.link == link; });
+    }
+    bool HasFailedAt(Counted<FileStoreLink> const& link, NonCounted<FileStoreRevision const> revision) const
+    {
+        return std::any_of(failedStores.begin(), failedStores.end(),
+                           [&](auto const& f) { return f.link == link && f.revision == revision; });
+    }
 };
 
 bool DelayLoadHolder::GetItemBase(JailCounted<FileStoreItem>& item)
@@ -176,7 +191,7 @@ void DelayLoadHolder::LoadFromStores(LoadAttempt& attempt) const
     while (TakeNextOwner(attempt, link, owner)) {
         Counted<FileStore> const store = link->GetFileStore();
         if (!store) attempt.isFinal = false;
-        attempt.failedStores.push_back(link);
+        attempt.failedStores.push_back({link, owner.revision});
         try {
             Counted<FileStoreItem> const item = store ? m_type->GetCreateFunc()() : nullptr;
             if (!item || !store->LoadFile(owner.path, owner.revision, *item, true)) continue;
@@ -192,11 +207,11 @@ void DelayLoadHolder::LoadFromStores(LoadAttempt& attempt) const
 
 bool DelayLoadHolder::TakeNextOwner(LoadAttempt const& attempt, Counted<FileStoreLink>& link, Owner& owner) const
 {
-    auto const& failed = attempt.failedStores;
     CriticalSectionSpinScope const scope(m_ownersLock);
     for (auto const& entry : m_owners) {
         if (!entry.value.valid || !entry.link->IsAlive()) continue;
-        if (std::find(failed.begin(), failed.end(), entry.link) != failed.end()) continue;
+        // A commit may have moved the bytes while they were being looked for: then the same store is asked again.
+        if (attempt.HasFailedAt(entry.link, entry.value.revision)) continue;
         link = entry.link;
         owner = entry.value;
         return true;
@@ -211,11 +226,10 @@ void DelayLoadHolder::FinishLoad(LoadAttempt const& attempt, FileStoreStateObjec
     CriticalSectionSpinScope const scope(m_itemLock);
     if (attempt.item) {
         FileStoreItem& item = *attempt.item;
-        auto const& failed = attempt.failedStores;
         for (auto const& [link, owner] : m_owners) {
             // All that have the bytes have the same ones. The source has said for itself how it stands.
             if (!owner.valid || link == attempt.source || !link->IsAlive()) continue;
-            if (std::find(failed.begin(), failed.end(), link) != failed.end()) continue;
+            if (attempt.HasFailedAt(link)) continue;
             item.SetDirtyStatePostLoad(link, FileStoreStateObject::DirtyStateClean, false);
         }
         for (Counted<FileStoreLink> const& link : m_forgotten) item.RemoveDirtyState(NonCounted<FileStoreLink>(link));
