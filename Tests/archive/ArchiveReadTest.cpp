@@ -16,10 +16,12 @@
 #include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
+#include <functional>
 #include <future>
 #include <gtest/gtest.h>
 #include <mutex>
 #include <thread>
+#include <utility>
 #include <zlib.h>
 
 // The reading side: revisions, damage, copies that outlive the file, and the background job that makes them all.
@@ -328,6 +330,56 @@ TEST_F(ArchiveReadTest, BucketThatCannotBeMadeOrFilledIsSaid)
     }
     EXPECT_EQ(Load(Copy("a")), "1");
     EXPECT_FALSE(m_archive->HaveAccessCount());
+}
+
+TEST_F(ArchiveReadTest, ReaderOfScratchBytesKeepsThemWhileMasterAndScratchMoveOn)
+{
+    std::string const bytes(2'500'000, 's');
+    Archive::CreateResult result;
+    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    ASSERT_TRUE(Save(*m_archive, {{"a", bytes}}, true));
+    Counted<InStream> in = m_archive->OpenFileInStream(Str("a"));
+    std::string text(bytes.size(), 0);
+    ASSERT_EQ(in->ReadBlock(text.data(), 1), 1u);
+    ASSERT_TRUE(Save(*m_archive, {{"m", "1"}}));
+    for (int i = 0; i < 2; ++i) ASSERT_TRUE(Save(*m_archive, {{"b", std::string(bytes.size(), 'b')}}, true));
+    ASSERT_EQ(in->ReadBlock(text.data() + 1, text.size() - 1), text.size() - 1);
+    EXPECT_TRUE(text == bytes);
+    EXPECT_GT(StateOf(*m_archive, Archive::ChoiceScratch).fileEnd, 3 * bytes.size());
+    // Nobody holds them any more: the room is used again.
+    in = nullptr;
+    ASSERT_TRUE(Save(*m_archive, {{"m", "2"}}));
+    ASSERT_TRUE(Save(*m_archive, {{"b", "3"}}, true));
+    EXPECT_LT(StateOf(*m_archive, Archive::ChoiceScratch).fileEnd, 1000u);
+    EXPECT_FALSE(m_archive->IsBroken());
+    m_archive = nullptr;
+    m_archive = OpenDocument(m_folder / "scratch");
+    EXPECT_EQ(Get(*m_archive, "b"), "3");
+    EXPECT_TRUE(Get(*m_archive, "a") == bytes);
+}
+
+/// Called whenever a load has looked up where the bytes lie and makes the item for them.
+std::function<void()> s_onCreate;
+
+FileStoreItemType const c_watchedType(
+    ClassUID("Wtch"),
+    []() -> Counted<FileStoreItem> {
+        if (s_onCreate) std::exchange(s_onCreate, nullptr)();
+        return MakeCounted<BytesItem>();
+    },
+    FileStoreItemType::NotNestable, FileStoreItemType::NotRecoverable);
+
+TEST_F(ArchiveReadTest, LoadThatASaveOvertakesFindsTheBytesWhereTheyWent)
+{
+    Archive::CreateResult result;
+    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    ASSERT_TRUE(Save(*m_archive, {{"a", "bytes"}}, true));
+    Counted<DelayLoadHolder> const holder = m_archive->CreateDelayLoadHolderDirect(Str("a"), &c_watchedType, nullptr);
+    s_onCreate = [&] { EXPECT_TRUE(Save(*m_archive, {{"m", "rolls down"}})); };
+    JailCounted<FileStoreItem> item;
+    ASSERT_TRUE(holder->GetItemBase(item) && item);
+    EXPECT_EQ(dynamic_cast<BytesItem&>(*item).bytes, "bytes");
+    EXPECT_FALSE(m_archive->HaveScratchRevisions());
 }
 
 /// Waits for what the background job says, without sleeping.

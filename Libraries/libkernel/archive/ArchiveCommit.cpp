@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cassert>
 #include <cstring>
+#include <iterator>
 #include <limits>
 
 // The commit of a save session.
@@ -272,6 +273,7 @@ void ArchiveCommit::ReserveMemory()
     if (paths.size() + fresh > room) paths.reserve(2 * (paths.size() + fresh));
     std::vector<Counted<Archive::Revision>>& revisions = m_impl.m_revisions;
     if (revisions.size() == revisions.capacity()) revisions.reserve(std::max<size_t>(2 * revisions.size(), 8));
+    m_impl.m_staleScratch.reserve(m_impl.m_staleScratch.size() + revisions.size());
 }
 
 void ArchiveCommit::Publish()
@@ -479,6 +481,8 @@ void ArchiveCommit::DropScratchRevisions()
         m_impl.m_revisionsByAddress.erase(revision.Get());
     }
     std::erase_if(m_impl.m_revisions, [](Counted<Archive::Revision> const& r) { return r->IsScratch(); });
+    std::move(m_droppedRevisions.begin(), m_droppedRevisions.end(), std::back_inserter(m_impl.m_staleScratch));
+    m_droppedRevisions.clear();
     // Other bytes may soon stand where their blocks lie: nothing is to be copied from there any more.
     std::erase_if(m_impl.m_offlineQueue, [&](auto const& queued) {
         auto const& [info, revision] = queued;

@@ -55,8 +55,10 @@ Counted<InStream> MakeArchiveUnpacker(Counted<InStream> const& stored, u8 code)
 }
 
 ArchiveInStream::ArchiveInStream(Counted<Archive> archive, ArchiveImpl& impl, Counted<Archive::AccessBlock> access,
-                                 Counted<Archive::ArchiveFile> file, Archive::FileRevision const& entry)
+                                 Counted<Archive::ArchiveFile> file, Counted<Archive::Revision const> revision,
+                                 Archive::FileRevision const& entry)
     : m_archive(std::move(archive)), m_impl(impl), m_access(std::move(access)), m_file(std::move(file)),
+      m_revision(std::move(revision)),
       m_reader(MakeCounted<ArchiveFileStreamReader>(m_file, entry.filePos + c_blockTagSize, entry.fileCompressedSize)),
       m_size(entry.fileSize), m_expectedCRC(entry.crcUncompressed), m_code(entry.compressionCode),
       m_buffer(nullptr, std::free), m_bufferSize(std::min(entry.fileSize, c_copyBufferSize))
@@ -165,9 +167,10 @@ ArchiveReadCounterScope::~ArchiveReadCounterScope()
     m_impl.ResumeOffliningIfNoReader();
 }
 
-Counted<InStream> ArchiveImpl::CreateInStream(Archive::ArchiveFile& file, Archive::FileRevision const& entry,
-                                              InStreamResult& result)
+Counted<InStream> ArchiveImpl::CreateInStream(Counted<Archive::Revision const> const& revision,
+                                              Archive::FileRevision const& entry, InStreamResult& result)
 {
+    Archive::ArchiveFile& file = *revision->m_file;
     result = InStreamResult::Failure;
     Counted<Archive> const archive(&m_self);
     ArchiveReadCounterScope const reading(archive, *this);
@@ -191,8 +194,9 @@ Counted<InStream> ArchiveImpl::CreateInStream(Archive::ArchiveFile& file, Archiv
         CriticalSectionScope const lock(m_stateLock);
         ++m_openInStreams;
     }
-    Counted<ArchiveInStream> const stream(scoped ? new ArchiveInStreamScoped(archive, *this, access, counted, entry)
-                                                 : new ArchiveInStream(archive, *this, access, counted, entry));
+    Counted<ArchiveInStream> const stream(
+        scoped ? new ArchiveInStreamScoped(archive, *this, access, counted, revision, entry)
+               : new ArchiveInStream(archive, *this, access, counted, revision, entry));
     if (!stream->Init()) return nullptr;
     result = InStreamResult::Success;
     return stream;

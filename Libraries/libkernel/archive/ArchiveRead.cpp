@@ -249,7 +249,7 @@ bool ArchiveImpl::LoadFileI(Archive::FileRevision const& entry, Archive::Revisio
         InStreamResult result = InStreamResult::Failure;
         bool corrupt = false;
         try {
-            Counted<InStream> const stream = CreateInStream(*revision.m_file, entry, result);
+            Counted<InStream> const stream = CreateInStream(Counted<Archive::Revision const>(&revision), entry, result);
             corrupt = !stream && result == InStreamResult::Corrupt;
             if (stream) loaded = item.Load(*stream, m_self);
         } catch (ArchiveCorruptionException const& e) {
@@ -299,7 +299,7 @@ Counted<InStream> Archive::OpenFileInStream(String8 const& path)
     Counted<Revision const> revision;
     if (!GetFileRevision(path, entry, revision)) return nullptr;
     ArchiveImpl::InStreamResult result{};
-    Counted<InStream> const stream = m->CreateInStream(*revision->m_file, entry, result);
+    Counted<InStream> const stream = m->CreateInStream(revision, entry, result);
     if (!stream && result == ArchiveImpl::InStreamResult::Corrupt) m->ReportCorruption(false);
     return stream;
 }
@@ -307,7 +307,7 @@ Counted<InStream> Archive::OpenFileInStream(String8 const& path)
 Counted<InStream> Archive::OpenFileInStream(String8 const& path, NonCounted<FileStoreRevision const> revision)
 {
     FileRevision entry;
-    Counted<ArchiveFile> file;
+    Counted<Revision const> holds;
     {
         CriticalSectionScope const lock(m->m_stateLock);
         Revision* const at = m->AsRevisionCS(revision);
@@ -316,10 +316,10 @@ Counted<InStream> Archive::OpenFileInStream(String8 const& path, NonCounted<File
         FileRevision* const found = at && info ? m->FindEntryCS(*info, *at, &where) : nullptr;
         if (!found || found->IsDeletion()) return nullptr;
         entry = *found;
-        file = where->m_file;
+        holds = Counted<Revision const>(where);
     }
     ArchiveImpl::InStreamResult result{};
-    Counted<InStream> const stream = m->CreateInStream(*file, entry, result);
+    Counted<InStream> const stream = m->CreateInStream(holds, entry, result);
     if (!stream && result == ArchiveImpl::InStreamResult::Corrupt) m->ReportCorruption(false);
     return stream;
 }

@@ -2,6 +2,7 @@
 #include "libkernel/core/Endian.h"
 #include "libkernel/streams/FileIOException.h"
 
+#include <algorithm>
 #include <cstring>
 #include <new>
 
@@ -117,11 +118,11 @@ Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle&
                 type == Archive::SessionTypeIncremental ? Archive::RevisionTagIncremental : Archive::RevisionTagFull;
             CriticalSectionScope const lock(file->m_lock);
             revision->m_nextFAT = file->m_firstFAT;
-            revision->m_fileEnd = file->m_fileEnd;
+            revision->m_fileEnd = FindSessionStart(*file);
             revision->m_totalBytes = file->m_totalBytes;
             revision->m_deadBytes = file->m_deadBytes;
             state->revision = revision;
-            state->appender.emplace(*this, file, file->m_fileEnd);
+            state->appender.emplace(*this, file, revision->m_fileEnd);
         }
         {
             CriticalSectionScope const lock(m_stateLock);
@@ -143,6 +144,18 @@ Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle&
     } catch (std::bad_alloc const&) {
         return Archive::SessionNoMemory;
     }
+}
+
+// Behind the newest table; in a scratch file that was emptied also behind what a reader still holds of its old life.
+u64 ArchiveImpl::FindSessionStart(Archive::ArchiveFile const& file)
+{
+    u64 start = file.m_fileEnd;
+    if (!file.m_isScratch) return start;
+    CriticalSectionScope const lock(m_stateLock);
+    std::erase_if(m_staleScratch, [](Counted<Archive::Revision> const& r) { return r->GetReferenceCount() == 1; });
+    for (Counted<Archive::Revision> const& revision : m_staleScratch)
+        if (revision->m_file == &file) start = std::max(start, revision->m_fatEnd);
+    return start;
 }
 
 bool ArchiveImpl::HasHeldInfo(Archive::ArchiveFile& file) const

@@ -140,6 +140,8 @@ struct ArchiveImpl
     u64 m_rewindCount = 0;
     ArchivePathMap m_paths;
     std::vector<Counted<Archive::Revision>> m_revisions; // Oldest first, the master's before the scratch file's.
+    // Dropped by a roll down. As long as a reader holds one, its bytes stay: the scratch file goes on behind them.
+    std::vector<Counted<Archive::Revision>> m_staleScratch;
     ArchivePathCounts m_pathCounts;
     u32 m_nextFreeUID = 1;
     ArchiveSession* m_activeSession = nullptr; // Changes under the session lock and the state lock both.
@@ -235,8 +237,8 @@ struct ArchiveImpl
         Failure = 1,
         Corrupt = 2
     };
-    Counted<InStream> CreateInStream(Archive::ArchiveFile& file, Archive::FileRevision const& entry,
-                                     InStreamResult& result);
+    Counted<InStream> CreateInStream(Counted<Archive::Revision const> const& revision,
+                                     Archive::FileRevision const& entry, InStreamResult& result);
     void CloseInStream();
     using BlockCheck = Archive::BlockCheck;
     BlockCheck CheckBlockTag(Archive::ArchiveFile& file, Archive::FileRevision const& entry) const;
@@ -285,6 +287,8 @@ struct ArchiveImpl
     /// One try. With @p suspended the result means nothing: access is held back, and the caller waits without locks.
     Archive::CreateSessionResult TryCreateSession(ArchiveSessionHandle& handle, Archive::SessionType type,
                                                   Archive::ArchiveChoice choice, bool const* abort, bool& suspended);
+    /// Where a session on the file begins to write.
+    u64 FindSessionStart(Archive::ArchiveFile const& file);
     /// Opens the session's file and passes its write guard; false with the cause in m_lastRestore.
     bool OpenForSession(Archive::ArchiveFile& file);
     /// The info block on disk is the one this archive read or wrote last.

@@ -43,7 +43,8 @@ class ArchiveInStream : public InStream
 {
 public:
     ArchiveInStream(Counted<Archive> archive, ArchiveImpl& impl, Counted<Archive::AccessBlock> access,
-                    Counted<Archive::ArchiveFile> file, Archive::FileRevision const& entry);
+                    Counted<Archive::ArchiveFile> file, Counted<Archive::Revision const> revision,
+                    Archive::FileRevision const& entry);
 
     /// Makes the unpacker and the buffer; false when there is no memory.
     bool Init();
@@ -65,6 +66,7 @@ private:
     ArchiveImpl& m_impl;
     Counted<Archive::AccessBlock> const m_access;
     Counted<Archive::ArchiveFile> const m_file;
+    Counted<Archive::Revision const> const m_revision; // Keeps a scratch file's bytes from being written over.
     Counted<ArchiveFileStreamReader> m_reader;
     Counted<InStream> m_unpacker;
     u64 const m_size;
@@ -84,8 +86,9 @@ class ArchiveInStreamScoped : public ArchiveInStream, public ArchiveReadCounterS
 {
 public:
     ArchiveInStreamScoped(Counted<Archive> archive, ArchiveImpl& impl, Counted<Archive::AccessBlock> access,
-                          Counted<Archive::ArchiveFile> file, Archive::FileRevision const& entry)
-        : ArchiveInStream(archive, impl, std::move(access), std::move(file), entry),
+                          Counted<Archive::ArchiveFile> file, Counted<Archive::Revision const> revision,
+                          Archive::FileRevision const& entry)
+        : ArchiveInStream(archive, impl, std::move(access), std::move(file), std::move(revision), entry),
           ArchiveReadCounterScope(archive, impl)
     {
     }
