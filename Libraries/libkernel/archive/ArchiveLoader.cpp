@@ -259,7 +259,14 @@ Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::Archi
 Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& header, FATKind const& kind,
                                Archive::Revision& revision, ArchiveLoadData& data, u32& highestUID)
 {
-    revision.m_entries.reserve(std::min<u64>(header.recordCount, cursor.GetRemaining() / c_recordFixedSize));
+    // Room for what a usual table has. A count is only a claim, so beyond that memory follows the records.
+    constexpr u64 c_mostAhead = 65536;
+    u64 const ahead = std::min({u64{header.recordCount}, cursor.GetRemaining() / c_recordFixedSize, c_mostAhead});
+    revision.m_entries.reserve(ahead);
+    if (data.files.empty()) {
+        data.files.reserve(ahead);
+        data.paths.reserve(ahead);
+    }
     for (u32 i = 0; i < header.recordCount; ++i) {
         u8 const* const fixed = cursor.Take(c_recordFixedSize);
         if (!fixed) return Archive::OpenCorrupt;
