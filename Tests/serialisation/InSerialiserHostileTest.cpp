@@ -422,7 +422,7 @@ TEST(InSerialiserHostileTest, SharedObjectsOfOneHashLoadInTime)
         Counted<InSerialiserFile> const file = Parse(b.bytes);
         EXPECT_TRUE(file);
     }
-    EXPECT_LT(clock.GetSeconds(), 10.0); // 1 second on a quiet machine without a sanitiser.
+    EXPECT_LT(clock.GetSeconds(), 60.0); // 1 second on a quiet machine; a loaded one with a sanitiser takes its time.
     SharedClassProperties::SweepAll(true);
     ReaderShared::s_hashesAlike = false;
 }
