@@ -125,6 +125,8 @@ Archive::Archive(IDTag tag) : m(std::make_unique<ArchiveImpl>(*this, tag)) {}
 Archive::~Archive()
 {
     ArchiveImpl::Unregister(*m);
+    // From here on nobody may take a reference to the archive, as a callback that is handed one might.
+    SetErrorCallback(nullptr);
     m->WaitForOffliningToAbort();
     // Holders lose this store here and may take back data from it, so the files must still be open.
     PreDestruction();
