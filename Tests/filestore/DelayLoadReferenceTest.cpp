@@ -150,6 +150,19 @@ TEST_F(DelayLoadReferenceTest, ReferenceIsLeftProvenOrLoaded)
     }
 }
 
+TEST_F(DelayLoadReferenceTest, ProofLeavesAnItemInUseWithItsHolder)
+{
+    PutBinder("inner", "opt/missing");
+    PutBinder("outer", "inner");
+    BinderItem::s_behaviour = Behaviour::Prove;
+    Counted<DelayLoadHolder> const inner = Hold("inner");
+    JailCounted<FileStoreItem> used;
+    JailCounted<FileStoreItem> item;
+    ASSERT_TRUE(inner->GetItemBase(used));
+    ASSERT_TRUE(Hold("outer")->GetItemBase(item));
+    EXPECT_EQ(used.Get(), inner->GetItemBaseIfLoaded().Get());
+}
+
 TEST_F(DelayLoadReferenceTest, ItemThatNamesItselfEndsForEveryBehaviour)
 {
     PutBinder("self", "self");

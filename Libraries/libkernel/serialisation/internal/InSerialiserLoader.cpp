@@ -379,11 +379,13 @@ bool InSerialiserLoader::ParseDelayLoad(InSerialiserProperty& property)
 void InSerialiserLoader::ApplyBehaviour(DelayLoadHolder& holder) const
 {
     if (m_behaviour == InSerialiser::DelayLoadsBehaviour::Leave) return;
+    // An item that was in memory before is somebody's: let go, it would come in a second time beside the one in use.
+    bool const wasLoaded = holder.IsLoaded();
     {
         JailCounted<FileStoreItem> item;
         holder.GetItemBase(item);
     }
-    if (m_behaviour == InSerialiser::DelayLoadsBehaviour::Prove) holder.ReleaseItem();
+    if (m_behaviour == InSerialiser::DelayLoadsBehaviour::Prove && !wasLoaded) holder.ReleaseItem();
 }
 
 } // namespace Kernel
