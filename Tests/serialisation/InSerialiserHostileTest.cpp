@@ -283,6 +283,9 @@ PropertyBytes MakeNest(Nest const& nest, u32 levels, bool close)
     PropertyBytes b = Start();
     if (nest.isUnknown) b.Item(0x31, "Unkn").Object(0).RootClass("Xxxx");
     for (u32 i = 0; i < levels; ++i) b.Append(nest.open);
+    // Nulls are no level.
+    b.Item(0x31, "None").U8(0).Item(0x32, "NoCl").U8(0);
+    b.Item(0xB2, "NoCs").U32(1).Code("InRg").U16(1).U8(0);
     if (close) b.Zeros(levels + 1 + nest.isUnknown);
     return b;
 }
@@ -292,7 +295,9 @@ TEST(InSerialiserHostileTest, NestingIsLimited)
     for (Nest const& nest : Nests()) {
         SCOPED_TRACE(nest.what);
         u32 const deepest = c_maxNesting - nest.isUnknown;
-        EXPECT_TRUE(Parse(MakeNest(nest, deepest, true).bytes, false));
+        PropertyBytes const allowed = MakeNest(nest, deepest, true);
+        EXPECT_TRUE(Parse(allowed.bytes, false));
+        EXPECT_TRUE(CheckPropertyStream(*Deliver(allowed.bytes, Delivery::Memory)).IsGood());
         EXPECT_FALSE(Parse(MakeNest(nest, deepest + 1, true).bytes, false));
         EXPECT_FALSE(Parse(MakeNest(nest, 100000, true).bytes, false));
         EXPECT_FALSE(Parse(MakeNest(nest, 100000, false).bytes, false));

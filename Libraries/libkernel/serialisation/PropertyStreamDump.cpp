@@ -299,11 +299,10 @@ private:
     // The keys of an object go into @p item; a null only sets its value.
     bool WalkObject(Json* item)
     {
-        NestingGuard const level;
         u64 const at = m_source.GetTaken();
         u8 first = 0;
         u32 index = 0;
-        if (!IsDeepEnough(level) || !Number(first, "an object")) return false;
+        if (!Number(first, "an object")) return false;
         if (first > static_cast<u8>(ObjectRecord::Back))
             return Damage(at, FormatT<String8>("byte %1 begins no object", first));
         if (first == static_cast<u8>(ObjectRecord::Null)) return SetNull(item);
@@ -316,6 +315,8 @@ private:
         }
         if (!m_objects.insert(index).second)
             return Damage(at, FormatT<String8>("object %1 appears a second time", index));
+        NestingGuard const level;
+        if (!IsDeepEnough(level)) return false;
         Json classes = Json::array();
         Json properties = Json::array();
         if (!WalkClassChain(item ? &classes : nullptr) || !WalkList(item ? &properties : nullptr)) return false;

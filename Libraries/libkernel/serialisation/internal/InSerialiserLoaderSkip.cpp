@@ -73,18 +73,19 @@ bool InSerialiserLoader::SkipDataStream()
 
 bool InSerialiserLoader::SkipObject()
 {
-    NestingGuard const level;
     u8 first = 0;
     u32 index = 0;
-    if (!level.IsAllowed() || !m_source.ReadNumber(first)) return false;
+    if (!m_source.ReadNumber(first)) return false;
     switch (static_cast<Kernel::ObjectRecord>(first)) {
     case Kernel::ObjectRecord::Null: return true;
     case Kernel::ObjectRecord::Back: return m_source.ReadNumber(index);
     case Kernel::ObjectRecord::First: break;
     default: return false;
     }
+    // Only now, as in a parse: nulls and references are no level.
+    NestingGuard const level;
     ClassResult result;
-    if (!m_source.ReadNumber(index)) return false;
+    if (!level.IsAllowed() || !m_source.ReadNumber(index)) return false;
     ++m_objectsBegun;
     if (!ReadClassRecord(result) || (!result.info && !result.isUnknown)) return false;
     m_source.OpenList();
@@ -105,13 +106,13 @@ bool InSerialiserLoader::SkipObjects()
 
 bool InSerialiserLoader::SkipClass()
 {
-    NestingGuard const level;
     u8 isThere = 0;
     u32 uid = 0;
     u16 version = 0;
-    if (!level.IsAllowed() || !m_source.ReadNumber(isThere) || isThere > 1) return false;
+    if (!m_source.ReadNumber(isThere) || isThere > 1) return false;
     if (!isThere) return true;
-    if (!m_source.ReadNumber(uid) || !m_source.ReadNumber(version)) return false;
+    NestingGuard const level;
+    if (!level.IsAllowed() || !m_source.ReadNumber(uid) || !m_source.ReadNumber(version)) return false;
     m_source.OpenList();
     if (!SkipProperties()) return false;
     m_source.CloseList();
@@ -120,19 +121,19 @@ bool InSerialiserLoader::SkipClass()
 
 bool InSerialiserLoader::SkipClasses()
 {
-    NestingGuard const level;
     u32 count = 0;
     u32 uid = 0;
     u16 version = 0;
-    if (!level.IsAllowed() || !m_source.ReadNumber(count) || !m_source.ReadNumber(uid) ||
-        !m_source.ReadNumber(version) || !m_source.Fits(count))
+    if (!m_source.ReadNumber(count) || !m_source.ReadNumber(uid) || !m_source.ReadNumber(version) ||
+        !m_source.Fits(count))
         return false;
     for (; count > 0; --count) {
         u8 isThere = 0;
         if (!m_source.ReadNumber(isThere) || isThere > 1) return false;
         if (!isThere) continue;
+        NestingGuard const level;
         m_source.OpenList();
-        if (!SkipProperties()) return false;
+        if (!level.IsAllowed() || !SkipProperties()) return false;
         m_source.CloseList();
     }
     return true;
