@@ -27,15 +27,15 @@ namespace {
 // The largest block that was asked for since it was last set to 0.
 std::atomic<size_t> s_largest{0};
 
-void Note(size_t size)
+} // namespace
+
+#ifdef KERNEL_TEST_COUNTS_MEMORY
+static void Note(size_t size)
 {
     for (size_t seen = s_largest; size > seen && !s_largest.compare_exchange_weak(seen, size);) {
     }
 }
 
-} // namespace
-
-#ifdef KERNEL_TEST_COUNTS_MEMORY
 extern "C" {
 void* __libc_malloc(size_t);
 void* __libc_calloc(size_t, size_t);
