@@ -4,6 +4,7 @@
 #include "libkernel/serialisation/CompareContext.h"
 #include "libkernel/serialisation/OutSerialiser.h"
 
+#include <cstdlib>
 #include <gtest/gtest.h>
 #include <thread>
 
@@ -112,6 +113,18 @@ TEST(ClassPropertiesDeathTest, SecondRegistrationStopsTheProcess)
     EXPECT_DEATH(ClassPropertiesBase::Init{&same}, "");
     EXPECT_DEATH(ClassPropertiesBase::Init{&Shape::ms_ClassProperties}, "");
     EXPECT_DEATH(ClassPropertiesBase::Init{nullptr}, "");
+}
+
+// In a process of its own, since nothing can be saved afterwards.
+TEST(ClassPropertiesDeathTest, ShutdownLetsGoOfTheDefaults)
+{
+    GTEST_FLAG_SET(death_test_style, "threadsafe");
+    auto const shutDown = [] {
+        ShutdownSerialisation();
+        std::exit(Shape::ms_ClassProperties.GetDefaults().empty() ? 0 : 1);
+    };
+    EXPECT_FALSE(Shape::ms_ClassProperties.GetDefaults().empty());
+    EXPECT_EXIT(shutDown(), testing::ExitedWithCode(0), "");
 }
 
 TEST(ClassProperties, LegacyClassHasNoDefaultsAndNoParent)

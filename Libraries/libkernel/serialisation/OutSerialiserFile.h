@@ -28,7 +28,8 @@ class KERNEL_API OutSerialiserFile : public OutSerialiser
 {
 public:
     /// Writes the header for a file of kind @p tag and version @p version. Streams and stores are borrowed. Throws
-    /// SaveException with code 0 if the stream does not take the header. Delay-load items are not saved.
+    /// SaveException with code 0 if the stream does not take the header. Items that load on demand are not saved, and
+    /// no path is made for them.
     OutSerialiserFile(OutStream& stream, IDTag tag, unsigned short version);
     /// Delay-load items go to @p store, whose strategies are taken over. Nothing reaches @p stream if the store only
     /// enumerates.
