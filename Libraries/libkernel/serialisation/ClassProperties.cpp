@@ -1,7 +1,7 @@
 #include "libkernel/serialisation/ClassProperties.h"
 
 #include "libkernel/concurrency/CriticalSection.h"
-#include "libkernel/platform/Debug.h"
+#include "libkernel/core/Assert.h"
 #include "libkernel/serialisation/OutSerialiser.h"
 #include "libkernel/serialisation/internal/DefaultTable.h"
 
@@ -23,9 +23,9 @@ Registry& GetRegistry()
 ClassPropertiesBase::Init::Init(ClassPropertiesBase const* description)
 {
     // In every build: a program with two classes of one code would read one class's files as the other's.
-    if (!description) Platform::FailAssertion("a class description is registered", __FILE__, __LINE__);
+    if (!description) FailAssertion(__FILE__, "a class description is registered", __LINE__);
     bool const isNew = GetRegistry().emplace(description->GetClassUID(), description).second;
-    if (!isNew) Platform::FailAssertion("a class code is registered once", __FILE__, __LINE__);
+    if (!isNew) FailAssertion(__FILE__, "a class code is registered once", __LINE__);
 }
 
 ClassPropertiesBase::ClassPropertiesBase(ClassUID const& classUID, unsigned short schemaVersion)
