@@ -1,8 +1,10 @@
 #include "support/ArchiveFixture.h"
 #include "support/TempFolder.h"
 
+#include <algorithm>
 #include <gtest/gtest.h>
 #include <random>
+#include <set>
 
 // Random saves against a plain model: what each revision holds, and the figures that a file keeps about itself.
 
@@ -187,7 +189,97 @@ TEST_P(ArchiveModelTest, RandomSavesMatchThePlainModel)
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(Seeds, ArchiveModelTest, testing::Values(1u, 2u, 3u));
+// Items that live on through the saves: which are written, in which state they are then and after reopening, and the
+// counters behind generated paths.
+TEST_P(ArchiveModelTest, RandomSavesKeepStatesAndPathCounts)
+{
+    struct Known
+    {
+        Counted<BytesItem> item;
+        int state = FileStoreStateObject::DirtyStateFull;
+        int tag = 0;            // Of the newest revision that has it.
+        bool inScratch = false; // And that one lies in the scratch file.
+    };
+    std::string const path = m_folder / "doc";
+    std::string const scratchPath = m_folder / "scratch";
+    FileStoreOut::IndexedPathParts const parts[2] = {{Str("a/"), Str("")}, {Str("b/"), Str(".x")}};
+    m_archive = CreateDocument(path);
+    Archive::CreateResult result;
+    ASSERT_TRUE(m_archive->AddScratchFile(Str(scratchPath), result));
+    std::map<std::string, Known> items;
+    for (int i = 0; i < 8; ++i) items["i" + std::to_string(i)].item = MakeCounted<BytesItem>(std::to_string(i));
+    u64 counters[2] = {};
+    bool scratchHasRevisions = false;
+
+    for (int step = 0; step < 120; ++step) {
+        SCOPED_TRACE(step);
+        for (auto& [name, known] : items) {
+            if (m_random() % 5 != 0) continue;
+            known.item->bytes += '+';
+            known.item->MarkAsDirty();
+            known.state = FileStoreStateObject::DirtyStateFull;
+        }
+        bool const scratch = m_random() % 2 == 0;
+        bool const incremental = m_random() % 2 == 0;
+        Archive::SessionType const type = incremental ? Archive::SessionTypeIncremental : Archive::SessionTypeFull;
+        ArchiveSessionHandle handle;
+        ASSERT_TRUE(scratch ? m_archive->CreateScratchSession(handle, type, nullptr)
+                            : m_archive->CreateSession(handle, type, nullptr));
+        u64 next[2] = {counters[0], counters[1]};
+        size_t const pair = m_random() % 2;
+        String8 generated;
+        ASSERT_TRUE(handle->GenerateIndexedPath(parts[pair], items["i0"].item.Get(), nullptr, generated));
+        std::string digits;
+        for (u64 n = ++next[pair]; n != 0; n /= 16) digits += "0123456789abcdef"[n % 16];
+        ASSERT_EQ(generated, parts[pair].prefix + Str(digits) + parts[pair].suffix);
+
+        bool committed = !scratch && scratchHasRevisions;
+        std::set<std::string> written;
+        for (auto& [name, known] : items) {
+            handle->CreateFile(Str(name), known.item);
+            bool const wanted = incremental ? known.state == FileStoreStateObject::DirtyStateFull
+                                            : known.state != FileStoreStateObject::DirtyStateClean;
+            ASSERT_EQ(handle->GetAddedPaths().count(Str(name)) != 0, wanted) << name;
+            if (wanted) written.insert(name);
+        }
+        committed = committed || !written.empty();
+        m_archive->CloseSession(handle, false);
+        if (committed) {
+            std::copy(next, next + 2, counters);
+            scratchHasRevisions = scratch;
+        }
+        for (auto& [name, known] : items) {
+            bool const isWritten = written.count(name) != 0;
+            if (isWritten)
+                known.state =
+                    incremental ? FileStoreStateObject::DirtyStateIncremental : FileStoreStateObject::DirtyStateClean;
+            bool const rolledDown = !scratch && known.inScratch;
+            if (isWritten || rolledDown) known.tag = incremental ? 1 : 0;
+            if (isWritten || rolledDown) known.inScratch = scratch;
+            FileStoreStateObject::DirtyState state{};
+            bool const has = known.item->GetDirtyStateForFileStore(*m_archive, state);
+            ASSERT_TRUE(!has || static_cast<int>(state) == known.state) << name;
+        }
+        if (m_random() % 5 != 0) continue;
+        m_archive = nullptr;
+        m_archive = OpenDocument(scratchPath);
+        ASSERT_TRUE(m_archive);
+        for (auto& [name, known] : items) {
+            bool const saved = m_archive->HasFile(Str(name));
+            known.item = MakeCounted<BytesItem>(known.item->bytes);
+            known.state = FileStoreStateObject::DirtyStateFull;
+            if (!saved) continue;
+            ASSERT_TRUE(m_archive->LoadFile(Str(name), *known.item));
+            FileStoreStateObject::DirtyState state{};
+            ASSERT_TRUE(known.item->GetDirtyStateForFileStore(*m_archive, state));
+            known.state =
+                known.tag == 1 ? FileStoreStateObject::DirtyStateIncremental : FileStoreStateObject::DirtyStateClean;
+            ASSERT_EQ(static_cast<int>(state), known.state) << name;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, ArchiveModelTest, testing::Values(1u, 2u, 3u, 4u));
 
 } // namespace
 } // namespace KernelTest
