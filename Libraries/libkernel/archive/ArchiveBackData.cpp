@@ -392,12 +392,8 @@ Counted<FileStoreBackData const> Archive::CreateBackData(NonCounted<FileStoreRev
         holds = Counted<Revision>(where);
         file = where->m_file;
     }
-    if (!m->GuaranteeFileHandle()) return nullptr;
-    struct Access
-    {
-        ArchiveImpl& impl;
-        ~Access() { impl.DecrementAccessCount(); }
-    } const access{*m};
+    ArchiveAccessScope const access(*m);
+    if (!access.IsOpen()) return nullptr;
 
     ArchiveBackDataBucketStore& store = ArchiveBackDataBucketStore::GetInstance();
     if (store.IsSwitchedOff()) return store.GetVoid();

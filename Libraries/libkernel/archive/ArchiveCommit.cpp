@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cassert>
 #include <cstring>
+#include <exception>
 #include <iterator>
 #include <limits>
 
@@ -53,6 +54,8 @@ private:
     void DropScratchRevisions();
     void QueueForOfflining();
 
+    template <class TStep>
+    void Attempt(TStep const& step);
     void WriteAt(u64 position, void const* data, u64 size);
     void FlushToDevice();
     void PassGuard();
@@ -69,6 +72,7 @@ private:
     std::set<String8> m_deletedPaths;
     std::set<Archive::FileInfo const*> m_rolledDown;
     std::vector<Counted<Archive::Revision>> m_droppedRevisions;
+    std::exception_ptr m_failure; // The first of what went wrong after the save stood.
 };
 
 void ArchiveCommit::Run(bool updateTimestamps)
@@ -98,7 +102,20 @@ void ArchiveCommit::Run(bool updateTimestamps)
     TellObjects();
     if (clearsScratch) DropScratchRevisions();
     QueueForOfflining();
-    if (!m_file.m_finalPath.IsEmpty()) m_impl.MoveTemporary(m_file);
+    if (!m_file.m_finalPath.IsEmpty()) Attempt([this] { m_impl.MoveTemporary(m_file); });
+    if (m_failure) std::rethrow_exception(m_failure);
+}
+
+// The save stands: whatever one step of its aftermath throws, the others are still due, or the archive would go on with
+// revisions that its files no longer hold. The first failure reaches the caller when all is done.
+template <class TStep>
+void ArchiveCommit::Attempt(TStep const& step)
+{
+    try {
+        step();
+    } catch (...) {
+        if (!m_failure) m_failure = std::current_exception();
+    }
 }
 
 void ArchiveCommit::WriteAt(u64 position, void const* data, u64 size)
@@ -432,10 +449,11 @@ void ArchiveCommit::TellObjects()
     auto const state = m.type == Archive::SessionTypeIncremental ? FileStoreStateObject::DirtyStateIncremental
                                                                  : FileStoreStateObject::DirtyStateClean;
     if (!IsExport()) {
-        for (auto const& object : m.objectsToClean) store.ClearObjectDirtyState(*object, state);
+        for (auto const& object : m.objectsToClean) Attempt([&] { store.ClearObjectDirtyState(*object, state); });
         for (auto const& [holder, path] : m.holderPaths) store.SetDelayLoadOwner(holder, &m_revision, path);
-        for (auto const& item : m.savedItems) store.ClearObjectDirtyState(const_cast<FileStoreItem&>(*item), state);
-        for (auto const& object : m.postSaves) object->PostSave();
+        for (auto const& item : m.savedItems)
+            Attempt([&] { store.ClearObjectDirtyState(const_cast<FileStoreItem&>(*item), state); });
+        for (auto const& object : m.postSaves) Attempt([&] { object->PostSave(); });
         store.RemoveDirtyStates(m_deletedPaths);
     }
     // The links move even where no object is told: a holder must not rest on a revision that is about to go.
@@ -443,7 +461,7 @@ void ArchiveCommit::TellObjects()
         std::set<NonCounted<FileStoreRevision const>> dropped;
         for (Counted<Archive::Revision> const& revision : m_droppedRevisions) dropped.insert(revision);
         MoveHolders();
-        store.RemoveDelayLoadLinks(dropped);
+        Attempt([&] { store.RemoveDelayLoadLinks(dropped); });
     }
     if (!IsExport()) store.RelinkFileStoreAssociations();
     CriticalSectionSpinScope const lock(m.lock);
@@ -498,6 +516,8 @@ void ArchiveCommit::QueueForOfflining()
     if (!m.restartOfflining) return;
     CriticalSectionScope const lock(m_impl.m_stateLock);
     for (Archive::FileRevision const& entry : m_revision.GetEntries()) {
+        // What is queued for the file is an older version, and may lie in the scratch file that has just been cleared.
+        m_impl.m_offlineQueue.erase(entry.info.Get());
         if (entry.IsDeletion() || entry.backData) continue;
         m_impl.m_offlineQueue[entry.info.Get()] = Counted<Archive::Revision>(&m_revision);
         m_impl.m_offlineTotal += entry.fileCompressedSize;

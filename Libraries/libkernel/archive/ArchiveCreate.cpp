@@ -272,7 +272,8 @@ Counted<Archive> Archive::CreateReplacementWithTemporary(CreateResult& result, M
 {
     result.Set(Code::Ok);
     String8 const path = GetArchivePath();
-    if (path.IsEmpty() || !m->GuaranteeFileHandle())
+    ArchiveAccessScope const access(*m);
+    if (path.IsEmpty() || !access.IsOpen())
         return Failed(result, Code::CouldNotCreate, String8("Could not access original file"));
 
     Counted<FileInOutStream> handle;
@@ -284,7 +285,6 @@ Counted<Archive> Archive::CreateReplacementWithTemporary(CreateResult& result, M
     else
         archive =
             ArchiveImpl::CreateTemporaryArchiveInner(path, GetArchiveIDTag(), result, &marshalled, adjacent, handle);
-    m->DecrementAccessCount();
     return archive;
 }
 

@@ -64,6 +64,9 @@ ArchiveInStream::ArchiveInStream(Counted<Archive> archive, ArchiveImpl& impl, Co
       m_buffer(nullptr, std::free), m_bufferSize(std::min(entry.fileSize, c_copyBufferSize))
 {
     CRC32::BeginCRC32(m_crc);
+    // Last, so that the destructor takes back exactly what was counted.
+    CriticalSectionScope const lock(m_impl.m_stateLock);
+    ++m_impl.m_openInStreams;
 }
 
 ArchiveInStream::~ArchiveInStream()
@@ -189,11 +192,6 @@ Counted<InStream> ArchiveImpl::CreateInStream(Counted<Archive::Revision const> c
     }
     Counted<Archive::ArchiveFile> const counted(&file);
     bool const scoped = MethodOf(entry.compressionCode) != MethodZStandard;
-    {
-        // The stream's end gives it back.
-        CriticalSectionScope const lock(m_stateLock);
-        ++m_openInStreams;
-    }
     Counted<ArchiveInStream> const stream(
         scoped ? new ArchiveInStreamScoped(archive, *this, access, counted, revision, entry)
                : new ArchiveInStream(archive, *this, access, counted, revision, entry));

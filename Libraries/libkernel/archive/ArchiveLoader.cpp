@@ -196,8 +196,10 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     // and the table it names; a block that only half arrived may still show the link the old numbers over a new table.
     if (data.testLink && data.revisions.size() > before) {
         Archive::Revision const& newest = *data.revisions[data.revisions.size() - before - 1];
-        if (newest.m_fileEnd != front.info.fileEnd || newest.m_timeStamp != front.info.saveTimeStamp)
-            return Archive::OpenLinkMismatch;
+        // A compact file is written whole: its save time need not be that of the revision it keeps.
+        bool const sameTime =
+            newest.m_tag == Archive::RevisionTagStreamlined || newest.m_timeStamp == front.info.saveTimeStamp;
+        if (newest.m_fileEnd != front.info.fileEnd || !sameTime) return Archive::OpenLinkMismatch;
     }
 
     // An info block that a crash left half written can lag behind the table it names, or be rubbish; a save that

@@ -176,12 +176,8 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
     Counted<FileStoreBackData const> copy;
     ArchiveBackDataBucketStore& store = ArchiveBackDataBucketStore::GetInstance();
     try {
-        if (!GuaranteeFileHandle()) return false;
-        struct Access
-        {
-            ArchiveImpl& impl;
-            ~Access() { impl.DecrementAccessCount(); }
-        } const access{*this};
+        ArchiveAccessScope const access(*this);
+        if (!access.IsOpen()) return false;
         // Without a CRC of the stored bytes the only way to test them is to unpack them.
         bool const mustUnpack = entry.crcCompressed == 0 && entry.crcUncompressed != 0;
         if (mustUnpack && CheckUnpacked(*revision->m_file, entry) != Archive::BlockCheck::Ok)

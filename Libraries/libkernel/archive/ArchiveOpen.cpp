@@ -127,6 +127,8 @@ Archive::~Archive()
     ArchiveImpl::Unregister(*m);
     // From here on nobody may take a reference to the archive, as a callback that is handed one might.
     SetErrorCallback(nullptr);
+    // Nobody is left to end a suspension, and what follows may need the files.
+    Unsuspend();
     m->WaitForOffliningToAbort();
     // Holders lose this store here and may take back data from it, so the files must still be open.
     PreDestruction();

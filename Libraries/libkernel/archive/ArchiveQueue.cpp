@@ -6,6 +6,7 @@
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/streams/CRC32.h"
 #include "libkernel/streams/FileIOException.h"
+#include "libkernel/streams/NullOutStream.h"
 
 #include <algorithm>
 #include <limits>
@@ -148,6 +149,11 @@ void ArchiveSession::State::FinaliseFile(Archive::FileRevision& entry, u64 size,
 void ArchiveSession::State::WriteItem(ArchiveSession& session, ArchiveQueueEntry const& queued)
 {
     bool const nestable = queued.item->GetObjectFileStoreItemType()->IsNestable();
+    if (enumerationOnly) {
+        // The save only names what the item holds; items that hold nothing need not run it.
+        if (nestable) queued.item->Save(*MakeCounted<NullOutStream>(), session);
+        return;
+    }
     Archive::FileRevision* entry = nullptr;
     BeginFile(queued.path, entry);
     {
@@ -169,6 +175,16 @@ void ArchiveSession::State::WriteItem(ArchiveSession& session, ArchiveQueueEntry
 
 namespace {
 
+/// A source that cannot be read fails the save in one way, whatever the reason.
+bool ReadAll(FileInOutStream* stream, u64 position, void* to, u64 count)
+{
+    try {
+        return stream && stream->ReadAt(position, to, count) == count;
+    } catch (FileIOException const&) {
+        return false;
+    }
+}
+
 /// Stored bytes of one file, wherever they lie.
 class StoredSource
 {
@@ -180,7 +196,7 @@ public:
     bool Read(u64 offset, void* to, u64 count) const
     {
         if (m_backData) return m_backData->ReadStored(offset, to, count);
-        return m_stream && m_stream->ReadAt(m_position + offset, to, count) == count;
+        return ReadAll(m_stream.Get(), m_position + offset, to, count);
     }
 
 private:
@@ -192,8 +208,7 @@ private:
 bool IsBlockAt(FileInOutStream* stream, u64 position)
 {
     u8 tag[c_blockTagSize];
-    return stream && stream->ReadAt(position, tag, sizeof(tag)) == sizeof(tag) &&
-           LoadLittleEndian<u32>(tag) == c_tagBlock;
+    return ReadAll(stream, position, tag, sizeof(tag)) && LoadLittleEndian<u32>(tag) == c_tagBlock;
 }
 
 } // namespace

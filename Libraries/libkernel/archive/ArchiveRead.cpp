@@ -371,15 +371,14 @@ bool ArchiveImpl::ReadEntry(Archive::ArchiveFile& file, Archive::FileRevision co
 {
     u8 const code = entry.compressionCode;
     if (!SizesArePlausible(code, entry.fileSize, entry.fileCompressedSize)) return false;
-    if (!GuaranteeFileHandle()) return false;
-    bool ok = false;
+    ArchiveAccessScope const access(*this);
+    if (!access.IsOpen()) return false;
     try {
         Counted<FileInOutStream> const stream = file.GetStream();
-        ok = stream && ReadEntryI(*stream, entry, data);
+        return stream && ReadEntryI(*stream, entry, data);
     } catch (FileIOException const&) {
+        return false;
     }
-    DecrementAccessCount();
-    return ok;
 }
 
 bool ArchiveImpl::ReadEntryI(FileInOutStream& stream, Archive::FileRevision const& entry, RawDataBlock& data)
@@ -480,16 +479,14 @@ Archive::BlockCheck ArchiveImpl::CheckUnpacked(Archive::ArchiveFile& file, Archi
 
 Archive::BlockCheck Archive::CheckStoredBlock(Revision const& revision, FileRevision const& entry)
 {
-    if (!m->GuaranteeFileHandle()) return BlockCheck::Unreadable;
-    BlockCheck result = BlockCheck::Unreadable;
+    ArchiveAccessScope const access(*m);
+    if (!access.IsOpen()) return BlockCheck::Unreadable;
     try {
-        result = m->CheckStoredBytes(*revision.m_file, entry);
-        if (result == BlockCheck::Ok) result = m->CheckUnpacked(*revision.m_file, entry);
+        BlockCheck const stored = m->CheckStoredBytes(*revision.m_file, entry);
+        return stored == BlockCheck::Ok ? m->CheckUnpacked(*revision.m_file, entry) : stored;
     } catch (FileIOException const&) {
-        result = BlockCheck::Unreadable;
+        return BlockCheck::Unreadable;
     }
-    m->DecrementAccessCount();
-    return result;
 }
 
 } // namespace Kernel

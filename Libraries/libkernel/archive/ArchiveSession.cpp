@@ -123,7 +123,11 @@ bool ArchiveSession::BeginOffer()
         if (m->writeFinished) return false;
         if (m->failed) throw OutStream::WriteException();
     }
-    TestAbort();
+    // The session stays aborted even if the caller's flag is taken back before it closes.
+    if (IsAbortRequested()) {
+        SetAborted();
+        throw AbortException();
+    }
     return true;
 }
 
@@ -142,11 +146,12 @@ void ArchiveSession::CreateFile(String8 const& path, Counted<FileStoreItem const
 {
     if (!BeginOffer() || path.IsEmpty() || !item) return;
     bool const all = m->type == Archive::SessionTypeRewrite || m->type == Archive::SessionTypeExport;
-    bool const wanted = all || item->RequiresSave(*m->archive, m->type == Archive::SessionTypeIncremental);
+    bool const wanted =
+        all || m->enumerationOnly || item->RequiresSave(*m->archive, m->type == Archive::SessionTypeIncremental);
     {
         CriticalSectionSpinScope const lock(m->lock);
         if (m->enumerateUsed) m->enumeratedPaths.insert(path);
-        if (m->enumerationOnly || !wanted) return;
+        if (!wanted) return;
         if (m->addedPaths.insert(path).second) {
             ArchiveQueueEntry entry;
             entry.path = path;

@@ -134,7 +134,9 @@ Counted<ArchiveThumbnails const> Archive::LoadThumbnails()
         bool const inScratch = m->m_scratch && m->m_scratch->m_thumbnailsPos.load() != 0;
         file = inScratch ? m->m_scratch : m->m_master;
     }
-    if (!file || file->m_thumbnailsPos.load() == 0 || !m->GuaranteeFileHandle()) return nullptr;
+    if (!file || file->m_thumbnailsPos.load() == 0) return nullptr;
+    ArchiveAccessScope const access(*m);
+    if (!access.IsOpen()) return nullptr;
     Counted<ArchiveThumbnails const> result;
     try {
         CriticalSectionScope const lock(file->m_lock);
@@ -146,7 +148,6 @@ Counted<ArchiveThumbnails const> Archive::LoadThumbnails()
         }
     } catch (FileIOException const&) {
     }
-    m->DecrementAccessCount();
     return result;
 }
 

@@ -8,8 +8,10 @@ Archive::ArchiveFile::ArchiveFile(OpenMode mode, IDTag archiveUID) : m_mode(mode
 
 Archive::ArchiveFile::~ArchiveFile()
 {
-    // A temporary that was never moved over its target holds a save that was never made.
-    bool const remove = (m_throwAway || !m_finalPath.IsEmpty()) && !m_path.IsEmpty();
+    // A temporary without a revision holds a save that was never made. One with a revision could not be moved over its
+    // target: it is the only copy of a save that was made, and stays.
+    bool const neverSaved = !m_finalPath.IsEmpty() && m_firstFAT == 0;
+    bool const remove = (m_throwAway || neverSaved) && !m_path.IsEmpty();
     m_stream = nullptr;
     m_targetStream = nullptr;
     if (remove) FileSystem::Delete(m_path, 0);

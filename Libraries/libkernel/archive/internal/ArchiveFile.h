@@ -62,7 +62,7 @@ public:
     Counted<ArchiveReferenceInfo> m_referenceInfo;
 
 private:
-    ~ArchiveFile() override; // Deletes the file if it is throw-away or an unmoved temporary.
+    ~ArchiveFile() override; // Deletes the file if it is throw-away or a temporary never saved into.
 };
 
 } // namespace Kernel

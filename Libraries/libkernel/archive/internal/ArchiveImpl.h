@@ -309,6 +309,24 @@ struct ArchiveImpl
     void DropSession(ArchiveSession* session);
 };
 
+/// Guaranteed access to the files for a scope: one access counted and the handle open, unless IsOpen says no.
+class ArchiveAccessScope
+{
+public:
+    explicit ArchiveAccessScope(ArchiveImpl& impl) : m_impl(impl), m_open(impl.GuaranteeFileHandle()) {}
+    ArchiveAccessScope(ArchiveAccessScope const&) = delete;
+    ArchiveAccessScope& operator=(ArchiveAccessScope const&) = delete;
+    ~ArchiveAccessScope()
+    {
+        if (m_open) m_impl.DecrementAccessCount();
+    }
+    bool IsOpen() const { return m_open; }
+
+private:
+    ArchiveImpl& m_impl;
+    bool const m_open;
+};
+
 /// A reader at work: offlining keeps off the disk while one lives.
 class ArchiveReadCounterScope
 {
