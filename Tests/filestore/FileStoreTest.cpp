@@ -273,6 +273,19 @@ TEST_F(FileStoreTest, BackDataGoesToTheHolderOfThePath)
     EXPECT_EQ("copy", TextOf(holder));
 }
 
+TEST_F(FileStoreTest, BackDataOfARevisionThatTheHolderHasLeftIsRefused)
+{
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    NonCounted<FileStoreRevision const> revision;
+    ASSERT_TRUE(holder->IsBackedBy(*a, revision));
+    Counted<FileStoreBackData const> const data(new MemoryBackData("copy"));
+    a->AddBackData("x", nullptr, data);
+    EXPECT_FALSE(holder->GetBackData());
+    a->AddBackData("x", revision, data);
+    EXPECT_EQ(data, holder->GetBackData());
+}
+
 TEST(FileStoreItemType, LastRegistrationOfAClassWins)
 {
     static FileStoreItemType const s_first(ClassUID("Ts01"), MemoryItem::c_plain.GetCreateFunc(),

@@ -206,7 +206,8 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
         total = m_offlineTotal;
         updater = m_updater;
     }
-    m_self.AddBackData(entry.info->GetPath(), copy);
+    // A save may have moved the file on while its bytes were copied.
+    m_self.AddBackData(entry.info->GetPath(), revision.Get(), copy);
     if (updater) updater->Progress(total, done);
     return true;
 }

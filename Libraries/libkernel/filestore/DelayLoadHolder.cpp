@@ -112,6 +112,17 @@ void DelayLoadHolder::SetBackData(Counted<FileStoreBackData const> const& data)
     SetBackDataCSItem(data);
 }
 
+void DelayLoadHolder::SetBackData(FileStore const& store, NonCounted<FileStoreRevision const> revision,
+                                  Counted<FileStoreBackData const> const& data)
+{
+    // A save moves the owner before it cleans the item: while the owner stands here, an item that was saved elsewhere
+    // still counts as changed and is left alone.
+    CriticalSectionSpinScope const owners(m_ownersLock);
+    CriticalSectionSpinScope const scope(m_itemLock);
+    Owner const* const owner = m_owners.Find(store.GetFileStoreLink().Get());
+    if (owner && owner->valid && owner->revision.Get() == revision.Get()) SetBackDataCSItem(data);
+}
+
 void DelayLoadHolder::SetBackDataCSItem(Counted<FileStoreBackData const> const& data)
 {
     if (m_backData || m_type->IsNestable()) return;

@@ -82,6 +82,10 @@ public:
     /// Keeps the first back data: changes nothing for null, for a holder that has some, for a nestable type, and while
     /// the item in memory differs from what a store holds.
     void SetBackData(Counted<FileStoreBackData const> const& data);
+    /// The same, only while the item still stands at @p revision of @p store: what was copied from there is outdated
+    /// once a save has moved the item on.
+    void SetBackData(FileStore const& store, NonCounted<FileStoreRevision const> revision,
+                     Counted<FileStoreBackData const> const& data);
     /// Makes sure that the item can be had after its stores have gone: true if it is in memory, or has or gets back
     /// data. Throws BackstoreException if copying failed. Slow.
     bool EnsureItemIsBacked();

@@ -269,19 +269,26 @@ bool DelayLoadHolder::EnsureItemIsBacked()
     LoadScope const scope(*this);
     if (isSafe()) return true;
 
-    OwnerMap owners;
-    {
-        CriticalSectionSpinScope const ownersScope(m_ownersLock);
-        owners = m_owners;
-    }
-    for (auto const& [link, owner] : owners) {
-        if (!owner.valid) continue;
-        Counted<FileStore> const store = link->GetFileStore();
-        Counted<FileStoreBackData const> const data =
-            store ? store->CreateBackData(owner.revision, owner.path) : nullptr;
-        if (!data) continue;
-        SetBackData(data);
-        return true;
+    // A commit may move the bytes on while they are copied; what came too late is not taken, and the second round finds
+    // them where they lie then.
+    bool cameTooLate = true;
+    for (int round = 0; round < 2 && cameTooLate; ++round) {
+        cameTooLate = false;
+        OwnerMap owners;
+        {
+            CriticalSectionSpinScope const ownersScope(m_ownersLock);
+            owners = m_owners;
+        }
+        for (auto const& [link, owner] : owners) {
+            if (!owner.valid) continue;
+            Counted<FileStore> const store = link->GetFileStore();
+            Counted<FileStoreBackData const> const data =
+                store ? store->CreateBackData(owner.revision, owner.path) : nullptr;
+            if (!data) continue;
+            SetBackData(*store, owner.revision, data);
+            if (isSafe()) return true;
+            cameTooLate = true;
+        }
     }
     return false;
 }

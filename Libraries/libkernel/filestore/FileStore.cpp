@@ -76,6 +76,19 @@ void FileStore::AddBackData(String8 const& path, Counted<FileStoreBackData const
     if (holder) holder->SetBackData(backData);
 }
 
+void FileStore::AddBackData(String8 const& path, NonCounted<FileStoreRevision const> revision,
+                            Counted<FileStoreBackData const> const& backData)
+{
+    if (!backData) return;
+    PathKey const key(path);
+    Counted<DelayLoadHolder> holder;
+    {
+        CriticalSectionSpinScope const scope(m_storeLock);
+        holder = FindCS(key);
+    }
+    if (holder) holder->SetBackData(*this, revision, backData);
+}
+
 void FileStore::SetDelayLoadOwner(Counted<DelayLoadHolder> const& holder, NonCounted<FileStoreRevision const> revision,
                                   String8 const& path)
 {

@@ -69,6 +69,9 @@ protected:
 
     /// Gives the holder of @p path the back data. Does nothing for null, or without such a holder.
     void AddBackData(String8 const& path, Counted<FileStoreBackData const> const& backData);
+    /// The same for back data copied from @p revision: does nothing if the holder no longer stands there.
+    void AddBackData(String8 const& path, NonCounted<FileStoreRevision const> revision,
+                     Counted<FileStoreBackData const> const& backData);
     /// Records that this store holds the holder's item at @p path and @p revision; an earlier path of it is forgotten.
     void SetDelayLoadOwner(Counted<DelayLoadHolder> const& holder, NonCounted<FileStoreRevision const> revision,
                            String8 const& path);
