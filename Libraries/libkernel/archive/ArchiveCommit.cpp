@@ -91,7 +91,7 @@ void ArchiveCommit::Run(bool updateTimestamps)
         WriteTable();
         FlushToDevice();
         Publish();
-        RaiseVersion();
+        Attempt([this] { RaiseVersion(); });
         WriteThumbnails();
         bool const touches = m.type == Archive::SessionTypeFull || m.type == Archive::SessionTypeRewrite;
         if (updateTimestamps && touches && m_file.m_stream) m_file.m_stream->UpdateTimestamps();

@@ -1,0 +1,142 @@
+#include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/filestore/FileStoreItemType.h"
+#include "libkernel/filestore/FileStorePostSaveInterface.h"
+#include "support/ArchiveFixture.h"
+#include "support/TempFolder.h"
+
+#include <atomic>
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <set>
+#include <stdexcept>
+#include <thread>
+
+namespace KernelTest {
+namespace {
+
+using namespace Kernel;
+
+class ArchiveAftermathTest : public testing::Test
+{
+protected:
+    TestSupport::TempFolder m_folder;
+    std::string const m_path = m_folder / "doc";
+};
+
+class FailingPostSave : public FileStorePostSaveInterface
+{
+public:
+    void PostSave() override { throw std::runtime_error("post save"); }
+
+private:
+    ~FailingPostSave() override = default;
+};
+
+TEST_F(ArchiveAftermathTest, FailureOfAPostSaveObjectLeavesTheArchiveAtTheNewState)
+{
+    Counted<Archive> archive = CreateDocument(m_path);
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+    Archive::CreateResult result;
+    ASSERT_TRUE(archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    ASSERT_TRUE(Save(*archive, {{"a", "2"}, {"b", "2"}}, true));
+
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("c"), MakeCounted<BytesItem>("3"));
+    handle->AddPostSaveObject(MakeCounted<FailingPostSave>());
+    EXPECT_THROW(archive->CloseSession(handle, false), std::runtime_error);
+
+    EXPECT_FALSE(archive->HaveScratchRevisions());
+    ASSERT_TRUE(Save(*archive, {{"d", std::string(1000, 'd')}}, true));
+    std::map<std::string, std::string> const expected = {
+        {"a", "2"}, {"b", "2"}, {"c", "3"}, {"d", std::string(1000, 'd')}};
+    EXPECT_EQ(GetAll(*archive), expected);
+    archive = nullptr;
+    archive = OpenDocument(m_folder / "scratch");
+    ASSERT_TRUE(archive);
+    EXPECT_EQ(GetAll(*archive), expected);
+}
+
+TEST_F(ArchiveAftermathTest, TemporaryThatHoldsASaveOutlivesAFailedMove)
+{
+    std::string const temporary = m_folder / "temporary";
+    std::filesystem::create_directory(m_folder / "gone");
+    Archive::MarshalledFileAccess marshalled;
+    marshalled.path = Str(temporary);
+    Archive::CreateResult result;
+    Counted<Archive> archive =
+        Archive::CreateWithAdjacentTemporary(Str(m_folder / "gone/doc"), c_documentTag, result, marshalled);
+    ASSERT_TRUE(archive);
+    std::filesystem::remove_all(m_folder / "gone");
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("1"));
+    EXPECT_THROW(archive->CloseSession(handle, false), ArchiveFileException);
+    archive = nullptr;
+    archive = OpenDocument(temporary);
+    ASSERT_TRUE(archive);
+    EXPECT_EQ(Get(*archive, "a"), "1");
+}
+
+TEST_F(ArchiveAftermathTest, AbortFlagTakenBackStillCommitsNothing)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    bool abort = false;
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, &abort));
+    handle->CreateFile(Str("half"), MakeCounted<BytesItem>("1"));
+    abort = true;
+    EXPECT_THROW(handle->CreateFile(Str("other half"), MakeCounted<BytesItem>("2")), AbortException);
+    abort = false;
+    archive->CloseSession(handle, false);
+    EXPECT_TRUE(archive->IsEmpty());
+}
+
+TEST_F(ArchiveAftermathTest, SessionWaitsForASuspensionToEnd)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    ASSERT_TRUE(archive->Suspend());
+    std::atomic<bool> ended{false};
+    bool early = false;
+    std::thread saver([&] {
+        ArchiveSessionHandle handle;
+        ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        early = !ended;
+        handle->CreateFile(Str("a"), MakeCounted<BytesItem>("1"));
+        archive->CloseSession(handle, false);
+    });
+    for (int i = 0; i < 1000; ++i) std::this_thread::yield();
+    ended = true;
+    archive->Unsuspend();
+    saver.join();
+    EXPECT_FALSE(early);
+    EXPECT_EQ(Get(*archive, "a"), "1");
+}
+
+TEST_F(ArchiveAftermathTest, EnumerationSessionNamesWhatItemsNameAndWritesNothing)
+{
+    class Folder : public BytesItem
+    {
+    public:
+        FileStoreItemType const* GetObjectFileStoreItemType() const override
+        {
+            static FileStoreItemType const s_type(ClassUID("Fold"), BytesItem::c_type.GetCreateFunc(),
+                                                  FileStoreItemType::IsNestableType, FileStoreItemType::NotRecoverable);
+            return &s_type;
+        }
+    };
+    Counted<Archive> const archive = CreateDocument(m_path);
+    std::string const before = ReadWhole(m_path);
+    auto const root = MakeCounted<Folder>();
+    root->onSave = [](FileStoreOut& out) { out.CreateFile(Str("root/part"), MakeCounted<BytesItem>("1")); };
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateFileEnumerationSession(handle, nullptr));
+    handle->SetEnumerateUsedFiles(true);
+    handle->CreateFile(Str("root"), root);
+    EXPECT_EQ(handle->GetEnumeratedPaths(), (std::set<String8>{Str("root"), Str("root/part")}));
+    archive->CloseSession(handle, false);
+    EXPECT_EQ(ReadWhole(m_path), before);
+}
+
+} // namespace
+} // namespace KernelTest
