@@ -25,7 +25,8 @@ bool FragmentedRawData::Expand(u64 size)
     if (size <= m_size) return true;
     u64 const needed = BlocksFor(size);
     if (needed > m_blocks.size()) {
-        if (needed > c_maxAllocation / sizeof(u8*)) return false;
+        // Asked for block by block, such a range would take all memory before it failed.
+        if (needed > c_maxAllocation / m_blockSize) return false;
         std::vector<u8*> blocks;
         try {
             blocks.reserve(needed);

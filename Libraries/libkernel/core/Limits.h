@@ -11,7 +11,8 @@ namespace Kernel {
 constexpr u32 c_maxNesting = 1024;
 
 /// No block is asked for above this size: no machine that runs this has it, and refusing early gives one answer, "no
-/// memory", on systems that would promise the pages and on tools that end the process over such a request.
+/// memory", on systems that would promise the pages and on tools that end the process over such a request. Nor is a
+/// range of blocks that is larger in all.
 constexpr u64 c_maxAllocation = u64{1} << 39;
 
 /// The most that memory may run ahead of the bytes delivered by a source that does not know its size.
