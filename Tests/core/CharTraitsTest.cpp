@@ -63,10 +63,10 @@ TEST(CharTraitsTest, ValidLengthAgreesWithTheByteRuleOnDamagedText)
 {
     std::mt19937 random(11);
     for (int round = 0; round < 20000; ++round) {
-        char room[4 * 64];
+        char room[4 * 128];
         char* end = room;
         u32 const limit = round % 3 == 0 ? 0x7F : round % 3 == 1 ? 0x7FF : 0x10FFFF;
-        for (u32 i = random() % 40; i > 0; --i)
+        for (u32 i = random() % 120; i > 0; --i)
             end = Utf8::AppendCodePoint(end, random() % 4 ? random() % 0x7F + 1 : random() % limit);
         std::string text(room, end);
         if (!text.empty() && round % 5) text[random() % text.size()] = static_cast<char>(random());

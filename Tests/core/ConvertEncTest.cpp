@@ -96,7 +96,7 @@ void ConvertExact(std::vector<u8> const& bytes)
     using Unit = typename From::Unit;
     size_t const units = bytes.size() / sizeof(Unit);
     std::unique_ptr<Unit[]> const exact(new Unit[units]);
-    std::memcpy(exact.get(), bytes.data(), units * sizeof(Unit));
+    if (units) std::memcpy(exact.get(), bytes.data(), units * sizeof(Unit));
     StringT<To> text;
     ConvertEnc<To, From>(text, exact.get(), static_cast<int>(units));
     EXPECT_EQ(text.GetData()[text.GetLength()], 0u);
@@ -122,6 +122,18 @@ TEST(ConvertEncTest, LastCodePointCutShortIsDropped)
 {
     EXPECT_EQ(ConvertedTo<TEncUtf16>(String8("ab\xF0")), u"ab");
     EXPECT_EQ(ConvertedTo<TEncUtf8>(String16(u"ab\xD83D")), "ab");
+}
+
+TEST(ConvertEncTest, LongTextGrowsItsTargetOnceAndExactly)
+{
+    for (u32 codePoint : {0x41u, 0xE9u, 0x20ACu, 0x1F600u}) {
+        SCOPED_TRACE(codePoint);
+        std::vector<u32> const text(70001, codePoint);
+        ExpectConverts<TEncUtf16, TEncUtf8>(text);
+        ExpectConverts<TEncUtf8, TEncUtf16>(text);
+        ExpectConverts<TEncUtf32, TEncUtf16>(text);
+        ExpectConverts<TEncUtf32, TEncUtf8>(text);
+    }
 }
 
 TEST(ConvertEncTest, ZeroUnitsPassThroughByLength)

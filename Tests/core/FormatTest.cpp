@@ -67,6 +67,21 @@ TEST(FormatTest, FormatAndArgumentsMayLieInTheTarget)
     }
 }
 
+TEST(FormatTest, FormatOfManyPiecesIsWrittenWhole)
+{
+    String8 format;
+    String8 expected("<");
+    for (int i = 0; i < 100; ++i) {
+        format += "%1,%%%2";
+        expected += "a,%7";
+    }
+    String8 out("<");
+    EXPECT_EQ(AppendFormat(out, format, "a", 7), 400);
+    EXPECT_EQ(out, expected);
+    EXPECT_EQ(String8("<") + Format(format, "a", 7), expected);
+    EXPECT_TRUE(Format(static_cast<char const*>(nullptr), 1).IsEmpty());
+}
+
 TEST(FormatTest, TextBeyondTheLargestLengthLeavesTheTarget)
 {
     String8 format;
@@ -76,6 +91,7 @@ TEST(FormatTest, TextBeyondTheLargestLengthLeavesTheTarget)
     String8 out("abc");
     EXPECT_EQ(AppendFormat(out, format, big), 0);
     EXPECT_EQ(out, "abc");
+    EXPECT_TRUE(Format(format, big).IsEmpty());
 }
 
 } // namespace

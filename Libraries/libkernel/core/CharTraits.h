@@ -38,16 +38,19 @@ struct KERNEL_API CharTraits<TEncUtf8> : BaseCharTraits<char>
     /// Writes @p codePoint, 1 to 4 bytes; gives the position behind it.
     static char* AppendCodePoint(char* to, u32 codePoint)
     {
-        switch (GetCodePointLength(codePoint)) {
-        case 1: *to++ = static_cast<char>(codePoint); return to;
-        case 2: *to++ = static_cast<char>(0xC0 | codePoint >> 6); break;
-        case 3:
-            *to++ = static_cast<char>(0xE0 | codePoint >> 12);
-            *to++ = static_cast<char>(0x80 | (codePoint >> 6 & 0x3F));
-            break;
-        default:
-            *to++ = static_cast<char>(0xF0 | (codePoint >> 18 & 0x07));
-            *to++ = static_cast<char>(0x80 | (codePoint >> 12 & 0x3F));
+        if (codePoint <= 0x7F) {
+            *to++ = static_cast<char>(codePoint);
+            return to;
+        }
+        if (codePoint <= 0x7FF)
+            *to++ = static_cast<char>(0xC0 | codePoint >> 6);
+        else {
+            if (codePoint <= 0xFFFF)
+                *to++ = static_cast<char>(0xE0 | codePoint >> 12);
+            else {
+                *to++ = static_cast<char>(0xF0 | (codePoint >> 18 & 0x07));
+                *to++ = static_cast<char>(0x80 | (codePoint >> 12 & 0x3F));
+            }
             *to++ = static_cast<char>(0x80 | (codePoint >> 6 & 0x3F));
         }
         *to++ = static_cast<char>(0x80 | (codePoint & 0x3F));

@@ -1,22 +1,25 @@
 #include "libkernel/core/ConvertEnc.h"
 
 #include "libkernel/core/CharTraits.h"
+#include "libkernel/core/Endian.h"
 
 #include <algorithm>
+#include <bit>
 #include <limits>
 #include <new>
 #if defined(__SSE2__)
 #include <emmintrin.h>
 #endif
 
-// Two passes. The first counts what each unit adds to the target, with no look at its neighbours, so that the compiler
-// can turn it into vector code; for well-formed text that is the exact length. The second walks code points and is held
+// Two passes. The first counts what each unit adds to the target, with no look at its neighbours, so that sixteen units
+// can be counted at once; for well-formed text that is the exact length. The second walks code points and is held
 // to that length, which keeps ill-formed text inside the block as well. Runs of ASCII go sixteen units at a time.
 
 namespace Kernel {
 namespace {
 
 constexpr int c_run = 16;
+constexpr int c_longest = 4; // Units of the longest code point.
 
 // Units that one source unit adds to the target. The lead byte of a code point pays for the whole of it in UTF-16 and
 // UTF-32; in UTF-8 each half of a surrogate pair pays for two of its four bytes.
@@ -39,17 +42,10 @@ int TargetLength(typename From::Unit unit)
 }
 
 template <class To, class From>
-u64 TargetLength(typename From::Unit const* src, int n)
+u64 SumLengths(typename From::Unit const* src, int n)
 {
     u64 total = 0;
-    constexpr int stretch = 1 << 20; // An inner sum in 32 bits is what vectorises well.
-    for (int begin = 0; begin < n;) {
-        int const end = begin + std::min(stretch, n - begin);
-        u32 sum = 0;
-        for (int i = begin; i < end; ++i) sum += static_cast<u32>(TargetLength<To, From>(src[i]));
-        total += sum;
-        begin = end;
-    }
+    for (int i = 0; i < n; ++i) total += static_cast<u32>(TargetLength<To, From>(src[i]));
     return total;
 }
 
@@ -65,62 +61,193 @@ void Store(void* p, __m128i v)
     _mm_storeu_si128(static_cast<__m128i*>(p), v);
 }
 
-// Each CopyRun copies c_run ASCII units, or gives false and may have scribbled on the target, which has room for them.
-bool CopyRun(char16_t* to, char const* from)
+// Each CopyAscii copies c_run units, whatever they are, and gives how many of the first are ASCII: the rest of what it
+// wrote is to be written over. Both sides have room for c_run units.
+int CopyAscii(char16_t* to, char const* from)
 {
     __m128i const v = Load(from);
-    if (_mm_movemask_epi8(v)) return false;
     __m128i const zero = _mm_setzero_si128();
     Store(to, _mm_unpacklo_epi8(v, zero));
     Store(to + 8, _mm_unpackhi_epi8(v, zero));
-    return true;
+    return std::countr_zero(static_cast<u32>(_mm_movemask_epi8(v)) | 1u << c_run);
 }
 
-bool CopyRun(char* to, char16_t const* from)
+int CopyAscii(char* to, char16_t const* from)
 {
     __m128i const a = Load(from);
     __m128i const b = Load(from + 8);
-    __m128i const beyond = _mm_and_si128(_mm_or_si128(a, b), _mm_set1_epi16(static_cast<short>(0xFF80)));
-    if (_mm_movemask_epi8(_mm_cmpeq_epi16(beyond, _mm_setzero_si128())) != 0xFFFF) return false;
+    __m128i const beyond = _mm_set1_epi16(static_cast<short>(0xFF80));
+    __m128i const zero = _mm_setzero_si128();
+    __m128i const plain = _mm_packs_epi16(_mm_cmpeq_epi16(_mm_and_si128(a, beyond), zero),
+                                          _mm_cmpeq_epi16(_mm_and_si128(b, beyond), zero));
     Store(to, _mm_packus_epi16(a, b));
-    return true;
+    return std::countr_one(static_cast<u32>(_mm_movemask_epi8(plain)));
+}
+
+// Sum of the sixteen bytes.
+u64 SumBytes(__m128i v)
+{
+    __m128i const halves = _mm_sad_epu8(v, _mm_setzero_si128());
+    return static_cast<u64>(_mm_cvtsi128_si64(halves)) + static_cast<u64>(_mm_cvtsi128_si64(_mm_srli_si128(halves, 8)));
+}
+
+// Target lengths of the stretches of sixteen units that @p n holds; the rest is left to the caller. A comparison that
+// holds is -1 in its lane, so subtracting it counts; the sums are emptied before a byte can overflow.
+template <class To>
+u64 SumRuns(char const* src, int runs)
+{
+    u64 total = 0;
+    __m128i const fourByteLead = _mm_set1_epi8(static_cast<char>(0xF0));
+    while (runs > 0) {
+        int const stretch = std::min(runs, 127);
+        __m128i sum = _mm_setzero_si128();
+        for (int i = 0; i < stretch; ++i, src += c_run) {
+            __m128i const v = Load(src);
+            sum = _mm_sub_epi8(sum, _mm_cmpgt_epi8(v, _mm_set1_epi8(static_cast<char>(0xBF))));
+            if constexpr (std::is_same_v<To, TEncUtf16>)
+                sum = _mm_sub_epi8(sum, _mm_cmpeq_epi8(_mm_max_epu8(v, fourByteLead), v));
+        }
+        total += SumBytes(sum);
+        runs -= stretch;
+    }
+    return total;
+}
+
+template <class To>
+u64 SumRuns(char16_t const* src, int runs)
+{
+    u64 total = 0;
+    __m128i const zero = _mm_setzero_si128();
+    auto const atMost = [&](__m128i v, short bound) {
+        return _mm_cmpeq_epi16(_mm_subs_epu16(v, _mm_set1_epi16(bound)), zero);
+    };
+    while (runs > 0) {
+        int const stretch = std::min(runs, 32);
+        __m128i sum = zero; // Of what each unit stays below three bytes, or of trail surrogates.
+        for (int i = 0; i < 2 * stretch; ++i, src += c_run / 2) {
+            __m128i const v = Load(src);
+            if constexpr (std::is_same_v<To, TEncUtf8>) {
+                __m128i const surrogate = _mm_cmpeq_epi16(_mm_and_si128(v, _mm_set1_epi16(static_cast<short>(0xF800))),
+                                                          _mm_set1_epi16(static_cast<short>(0xD800)));
+                sum = _mm_sub_epi16(sum, _mm_add_epi16(_mm_add_epi16(atMost(v, 0x7F), atMost(v, 0x7FF)), surrogate));
+            } else {
+                sum = _mm_sub_epi16(sum, _mm_cmpeq_epi16(_mm_and_si128(v, _mm_set1_epi16(static_cast<short>(0xFC00))),
+                                                         _mm_set1_epi16(static_cast<short>(0xDC00))));
+            }
+        }
+        u64 const most = (std::is_same_v<To, TEncUtf8> ? 3u : 1u) * static_cast<u64>(c_run) * static_cast<u64>(stretch);
+        total += most - SumBytes(sum); // No lane passes 3 times 64, so its high byte is zero.
+        runs -= stretch;
+    }
+    return total;
 }
 
 #endif
 
 template <class To, class From>
-bool CopyRun(To* to, From const* from)
+u64 TargetLength(typename From::Unit const* src, int n)
 {
-    u32 all = 0;
-    for (int i = 0; i < c_run; ++i) all |= static_cast<u32>(static_cast<std::make_unsigned_t<From>>(from[i]));
-    if (all > 0x7F) return false;
-    for (int i = 0; i < c_run; ++i) to[i] = static_cast<To>(from[i]);
-    return true;
+#if defined(__SSE2__)
+    if constexpr (!std::is_same_v<From, TEncUtf32>) {
+        int const wide = n / c_run * c_run;
+        return SumRuns<To>(src, n / c_run) + SumLengths<To, From>(src + wide, n - wide);
+    }
+#endif
+    return SumLengths<To, From>(src, n);
+}
+
+template <class Unit>
+bool IsAscii(Unit unit)
+{
+    return static_cast<std::make_unsigned_t<Unit>>(unit) <= 0x7F;
+}
+
+template <class To, class From>
+int CopyAscii(To* to, From const* from)
+{
+    int n = 0;
+    for (; n < c_run && IsAscii(from[n]); ++n) to[n] = static_cast<To>(from[n]);
+    return n;
+}
+
+// Writes a code point beyond ASCII where there is room for c_longest units, all of which may be written.
+template <class To>
+[[gnu::always_inline]] inline typename To::Unit* AppendFar(typename To::Unit* to, u32 codePoint)
+{
+    if constexpr (std::is_same_v<To, TEncUtf8>) {
+        u32 const last = 0x80 | (codePoint & 0x3F);
+        if (codePoint <= 0x7FF) {
+            StoreLittleEndian<u32>(to, 0xC0 | codePoint >> 6 | last << 8);
+            return to + 2;
+        }
+        u32 const middle = 0x80 | (codePoint >> 6 & 0x3F);
+        if (codePoint <= 0xFFFF) {
+            StoreLittleEndian<u32>(to, 0xE0 | codePoint >> 12 | middle << 8 | last << 16);
+            return to + 3;
+        }
+    }
+    return CharTraits<To>::AppendCodePoint(to, codePoint);
+}
+
+// One code point beyond ASCII from one side to the other, with room for c_longest units on both. Each length has a road
+// of its own, on which the compiler knows what the target needs.
+template <class To, class From>
+[[gnu::always_inline]] inline void ConvertFar(typename To::Unit*& to, typename From::Unit const*& from)
+{
+    if constexpr (std::is_same_v<From, TEncUtf8>) {
+        auto const byte = [&](int i) { return static_cast<u32>(static_cast<u8>(from[i])); };
+        u32 const lead = byte(0);
+        if (lead <= 0xDF) {
+            to = AppendFar<To>(to, (lead & 0x1F) << 6 | (byte(1) & 0x3F));
+            from += 2;
+        } else if (lead <= 0xEF) {
+            to = AppendFar<To>(to, (lead & 0x0F) << 12 | (byte(1) & 0x3F) << 6 | (byte(2) & 0x3F));
+            from += 3;
+        } else
+            to = AppendFar<To>(to, CharTraits<From>::NextCodePoint(from));
+    } else if constexpr (std::is_same_v<From, TEncUtf16>) {
+        u32 const unit = *from;
+        if (!CharTraits<From>::IsLeadSurrogate(unit)) {
+            to = AppendFar<To>(to, unit);
+            ++from;
+        } else
+            to = AppendFar<To>(to, CharTraits<From>::NextCodePoint(from));
+    } else
+        to = AppendFar<To>(to, *from++);
 }
 
 template <class To, class From>
 typename To::Unit* Convert(typename To::Unit* to, typename To::Unit const* const toEnd, typename From::Unit const* from,
                            typename From::Unit const* const fromEnd)
 {
-    while (from < fromEnd) {
-        while (fromEnd - from >= c_run && toEnd - to >= c_run && CopyRun(to, from)) {
+    using Source = CharTraits<From>;
+    using Target = CharTraits<To>;
+    auto const room = [&] { return std::min(fromEnd - from, toEnd - to); };
+    while (room() >= c_run) {
+        int const plain = CopyAscii(to, from);
+        if (plain == c_run) { // A step of known length lets the next copy begin before this one is looked at.
             from += c_run;
             to += c_run;
+            continue;
         }
-        // Text beyond ASCII comes in runs: the wide copy is worth trying again only where plain units stand.
-        for (int plain = 0; from < fromEnd && plain < c_run / 2;) {
-            if (static_cast<u32>(static_cast<std::make_unsigned_t<typename From::Unit>>(*from)) <= 0x7F) {
-                if (to == toEnd) return to;
-                *to++ = static_cast<typename To::Unit>(*from++);
-                ++plain;
+        from += plain;
+        to += plain;
+        // Words of other scripts stand between single spaces, which are not worth a wide copy.
+        int plainRun = 0;
+        for (auto safe = room() / c_longest; safe > 0; --safe) {
+            if (!IsAscii(*from)) {
+                ConvertFar<To, From>(to, from);
+                plainRun = 0;
                 continue;
             }
-            plain = 0;
-            if (CharTraits<From>::GetCodePointLength(*from) > fromEnd - from) return to;
-            u32 const codePoint = CharTraits<From>::NextCodePoint(from);
-            if (CharTraits<To>::GetCodePointLength(codePoint) > toEnd - to) return to;
-            to = CharTraits<To>::AppendCodePoint(to, codePoint);
+            *to++ = static_cast<typename To::Unit>(*from++);
+            if (++plainRun == c_run / 2) break;
         }
+    }
+    while (from < fromEnd && Source::GetCodePointLength(*from) <= fromEnd - from) {
+        u32 const codePoint = Source::NextCodePoint(from);
+        if (Target::GetCodePointLength(codePoint) > toEnd - to) break;
+        to = Target::AppendCodePoint(to, codePoint);
     }
     return to;
 }

@@ -81,11 +81,19 @@ private:
 template <class S>
 int AppendFormatVT(S& out, typename S::Unit const* format, FormatHolderT<S> const* args, u64 count);
 
+/// The formatted text as a new string; the empty string for a null format and for a text that is too long.
+template <class S>
+S FormatVT(typename S::Unit const* format, FormatHolderT<S> const* args, u64 count);
+
 extern template KERNEL_API int AppendFormatVT<String8>(String8&, char const*, FormatHolderT<String8> const*, u64);
 extern template KERNEL_API int AppendFormatVT<String16>(String16&, char16_t const*, FormatHolderT<String16> const*,
                                                         u64);
 extern template KERNEL_API int AppendFormatVT<String32>(String32&, unsigned int const*, FormatHolderT<String32> const*,
                                                         u64);
+
+extern template KERNEL_API String8 FormatVT(char const*, FormatHolderT<String8> const*, u64);
+extern template KERNEL_API String16 FormatVT(char16_t const*, FormatHolderT<String16> const*, u64);
+extern template KERNEL_API String32 FormatVT(unsigned int const*, FormatHolderT<String32> const*, u64);
 
 /// AppendFormatVT with the arguments given one by one.
 template <class S, class... Args>
@@ -101,9 +109,12 @@ int AppendFormatT(S& out, typename S::Unit const* format, Args const&... args)
 template <class S, class... Args>
 S FormatT(typename S::Unit const* format, Args const&... args)
 {
-    S result;
-    AppendFormatT<S>(result, format, args...);
-    return result;
+    if constexpr (sizeof...(Args) == 0)
+        return FormatVT<S>(format, nullptr, 0);
+    else {
+        FormatHolderT<S> const holders[] = {FormatHolderT<S>(args)...};
+        return FormatVT<S>(format, holders, sizeof...(Args));
+    }
 }
 
 template <class... Args>

@@ -126,8 +126,8 @@ S Decimal(Magnitude number, SignStyle style, CharacterGrouping const* grouping, 
     int const text = digits + separators + (sign != 0);
     int const total = std::max(text, width);
 
-    S result;
-    Unit* begin = result.SetLength(total);
+    Unit* begin;
+    S result(total, begin);
     Unit* end = begin + total;
     if (pad == PadStyle::SpacesRight) {
         std::fill(begin + text, end, Unit{' '});
@@ -151,8 +151,7 @@ template <class S>
 S InBase(u64 value, u32 base, int width, PadStyle pad, bool upper)
 {
     using Unit = typename S::Unit;
-    S result;
-    if (base < 2 || base > 36) return result;
+    if (base < 2 || base > 36) return S();
     char const* const table = upper ? c_upperDigits : c_lowerDigits;
     char digits[64];
     char* const last = digits + sizeof digits;
@@ -162,7 +161,8 @@ S InBase(u64 value, u32 base, int width, PadStyle pad, bool upper)
 
     int const text = static_cast<int>(last - first);
     int const total = std::max(text, width);
-    Unit* to = result.SetLength(total);
+    Unit* to;
+    S result(total, to);
     Unit* const end = to + total;
     if (pad != PadStyle::SpacesRight)
         to = std::fill_n(to, total - text, pad == PadStyle::ZerosLeft ? Unit{'0'} : Unit{' '});

@@ -54,17 +54,26 @@ StringT<Enc>::StringT(Unit const* text) : StringT(text, Measure(text))
 }
 
 template <class Enc>
-StringT<Enc>::StringT(Unit const* text, int length)
+StringT<Enc>::StringT(int length, Unit*& units)
 {
-    if (!text || length <= 0) {
+    if (length > 0) {
+        m_block = Allocate(length);
+        m_block->length = length;
+        UnitsOf(m_block)[length] = 0;
+    } else {
         m_block = &s_empty.header;
         Retain();
-        return;
     }
-    m_block = Allocate(length);
-    m_block->length = length;
-    BaseCharTraits<Unit>::Copy(UnitsOf(m_block), text, length);
-    UnitsOf(m_block)[length] = 0;
+    units = UnitsOf(m_block);
+}
+
+template <class Enc>
+StringT<Enc>::StringT(Unit const* text, int length)
+{
+    Unit* units;
+    StringT copy(text ? length : 0, units);
+    BaseCharTraits<Unit>::Copy(units, text, copy.GetLength());
+    m_block = std::exchange(copy.m_block, nullptr);
 }
 
 template <class Enc>
@@ -188,8 +197,8 @@ void ConcatString(StringT<Enc>& out, typename Enc::Unit const* a, int n, typenam
     m = std::max(m, 0);
     if (n > std::numeric_limits<i32>::max() - m) throw std::bad_alloc();
     // Built aside, so that the parts may lie in the target.
-    StringT<Enc> joined;
-    auto* const to = joined.SetLength(n + m);
+    typename Enc::Unit* to;
+    StringT<Enc> joined(n + m, to);
     Traits::Copy(to, a, n);
     Traits::Copy(to + n, b, m);
     out = std::move(joined);

@@ -48,6 +48,9 @@ public:
         : StringT(text.data(), CheckedLength(text.size()))
     {
     }
+    /// @p length units that the caller writes at @p units, terminated; empty for a length below 1. The cheapest way to
+    /// build a text whose length is known.
+    StringT(int length, Unit*& units);
     StringT(StringT const& o) : m_block(o.m_block)
     {
         if (m_block) Retain();
@@ -168,9 +171,12 @@ private:
     static StringT Joined(Unit const* a, int n, Unit const* b, int m);
     bool IsEqual(Unit const* text, int length) const;
     void Retain() { m_block->references.fetch_add(1, std::memory_order_relaxed); }
+    // The only owner needs no atomic exchange: nobody is left who could take a reference meanwhile.
     void Release()
     {
-        if (m_block && m_block->references.fetch_sub(1, std::memory_order_acq_rel) == 1) Free(m_block);
+        if (m_block && (m_block->references.load(std::memory_order_acquire) == 1 ||
+                        m_block->references.fetch_sub(1, std::memory_order_acq_rel) == 1))
+            Free(m_block);
     }
     static void Free(Header* block);
 
