@@ -189,7 +189,7 @@ TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
             "| 2F [A012] 'tnoF' | A9 [A011] 02 00 00 00 01 | 31 [A009] 00 | 00 | 00")));
 }
 
-TEST(OutSerialiserObjects, DefaultsOfParentsAreAskedToo)
+TEST(OutSerialiserObjects, NearestDefaultOfTheChainLeavesAValueOut)
 {
     auto const rootDefaults = Defaults::Make(Defaults::Value("Size", u8{7}), Defaults::Value("Only", u8{1}));
     ClassProperties const root = MakeClass("Root", rootDefaults);
@@ -214,7 +214,8 @@ TEST(OutSerialiserObjects, DefaultsOfParentsAreAskedToo)
         return Show(saved.substr(saved.find(Bytes("31 [Item]")) + 15));
     };
     EXPECT_EQ(list(save(8, 1)), Show(Bytes("00 00")));
-    EXPECT_EQ(list(save(7, 1)), Show(Bytes("00 00")));
+    // The leaf replaces this one: left out, it would come back as 8.
+    EXPECT_EQ(list(save(7, 1)), Show(Bytes("01 [Size] 07 | 00 00")));
     EXPECT_EQ(list(save(9, 2)), Show(Bytes("01 [Size] 09 | 01 [Only] 02 | 00 00")));
 }
 

@@ -77,7 +77,7 @@ int OutSerialiser::CheckLengthI(u64 length) const
 template <class Test>
 bool OutSerialiser::IsDefaultI(IDTag tag, Test const& test) const
 {
-    return m_defaults && m_defaults->Any(tag, test);
+    return m_defaults && m_defaults->Matches(tag, test);
 }
 
 void OutSerialiser::AbortI()

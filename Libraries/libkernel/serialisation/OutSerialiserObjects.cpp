@@ -38,7 +38,7 @@ void OutSerialiser::SaveSharedObject(IDTag tag, Consolidated<SharedSerialisable>
         auto const* const item = row.As<Defaults::DefaultSharedObject>();
         return item && item->Compare(object);
     };
-    if (m_defaults && m_defaults->Any(tag, equals)) return;
+    if (m_defaults && m_defaults->Matches(tag, equals)) return;
     if (m_isFullSave) PutHeaderI(tag, c_objectType, 0);
     SaveSharedObjectI(object);
 }
@@ -49,7 +49,7 @@ bool OutSerialiser::TestDefaultObjectsI(IDTag tag, std::vector<Consolidated<Shar
         auto const* const item = row.As<Defaults::DefaultSharedObjectArray>();
         return item && item->Compare(objects);
     };
-    return m_defaults && m_defaults->Any(tag, equals);
+    return m_defaults && m_defaults->Matches(tag, equals);
 }
 
 void OutSerialiser::StartObjectArrayTestI(IDTag tag)

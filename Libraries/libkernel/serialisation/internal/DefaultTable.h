@@ -11,8 +11,9 @@ namespace Kernel {
 
 class ClassPropertiesBase;
 
-/// The defaults of a class and all its parents in one table, sorted by tag, and for one tag from the class up to its
-/// root: a save asks this once for each property instead of walking a map for each class. Never changes.
+/// The defaults of a class and all its parents in one table, sorted by tag: for each tag the one that a reader will
+/// find, which is the nearest. A save asks this once for each property instead of walking a map for each class. Never
+/// changes.
 class DefaultTable
 {
 public:
@@ -40,9 +41,9 @@ public:
     explicit DefaultTable(ClassPropertiesBase const& description);
 
     bool IsEmpty() const { return m_rows.empty(); }
-    /// True if @p test is true of one of the tag's rows; asked from the class upwards.
+    /// True if the tag has a row and @p test is true of it.
     template <class Test>
-    bool Any(IDTag tag, Test const& test) const
+    bool Matches(IDTag tag, Test const& test) const
     {
         auto row = m_rows.begin();
         auto const end = m_rows.end();
@@ -50,9 +51,7 @@ public:
             row = std::lower_bound(row, end, tag.value, IsBefore);
         else
             while (row != end && row->tag < tag.value) ++row;
-        for (; row != end && row->tag == tag.value; ++row)
-            if (test(*row)) return true;
-        return false;
+        return row != end && row->tag == tag.value && test(*row);
     }
 
 private:
