@@ -99,5 +99,20 @@ TYPED_TEST(RawDataTest, SwapExchangesTheBlocksThemselves)
     EXPECT_EQ(a.GetSize(), 20u);
 }
 
+TEST(RawDataBlockTest, ValueBlocksMoveAndKeepTheirBytesWhenMovedToThemselves)
+{
+    RawDataBlock a(10);
+    void const* const bytes = a.GetData();
+    RawDataBlock& same = a;
+    a = std::move(same);
+    EXPECT_EQ(a.GetData(), bytes);
+    RawDataBlock b(20);
+    b = std::move(a);
+    EXPECT_EQ(b.GetData(), bytes);
+    EXPECT_EQ(b.GetSize(), 10u);
+    EXPECT_EQ(a.GetSize(), 0u);
+    EXPECT_EQ(a.GetData(), nullptr);
+}
+
 } // namespace
 } // namespace Kernel

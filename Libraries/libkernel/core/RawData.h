@@ -71,7 +71,8 @@ public:
     RawDataT(RawDataT&& o) noexcept requires(!std::is_base_of_v<Countable, Base>) { this->Swap(o); }
     RawDataT& operator=(RawDataT&& o) noexcept requires(!std::is_base_of_v<Countable, Base>)
     {
-        RawDataT taken(std::move(o));
+        RawDataBaseT<Allocator> taken; // A third block, so that moving to itself keeps the bytes.
+        taken.Swap(o);
         this->Swap(taken);
         return *this;
     }
