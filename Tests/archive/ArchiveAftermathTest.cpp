@@ -2,6 +2,7 @@
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/FileStorePostSaveInterface.h"
 #include "support/ArchiveFixture.h"
+#include "support/FaultyFiles.h"
 #include "support/TempFolder.h"
 
 #include <atomic>
@@ -136,6 +137,26 @@ TEST_F(ArchiveAftermathTest, EnumerationSessionNamesWhatItemsNameAndWritesNothin
     EXPECT_EQ(handle->GetEnumeratedPaths(), (std::set<String8>{Str("root"), Str("root/part")}));
     archive->CloseSession(handle, false);
     EXPECT_EQ(ReadWhole(m_path), before);
+}
+
+TEST(ArchiveMoveTest, SaveThatIsInPlaceStaysThereWhenItsFolderCannotBeFlushed)
+{
+    TestSupport::TempFolder const folder;
+    std::string const path = folder / "target";
+    ASSERT_TRUE(Save(*CreateDocument(path), {{"a", "old"}}));
+    Archive::CreateResult result;
+    Counted<Archive> archive = Archive::CreateWithAdjacentTemporary(Str(path), c_documentTag, result, {});
+    ASSERT_TRUE(archive);
+    {
+        TestSupport::FaultyFiles files;
+        files.Plan({.call = TestSupport::FileCall::FlushFolder, .forEver = true, .error = EIO});
+        EXPECT_THROW(Save(*archive, {{"a", "new"}}), ArchiveFileException);
+    }
+    EXPECT_EQ(Get(*archive, "a"), "new");
+    archive = nullptr;
+    Counted<Archive> const again = OpenDocument(path);
+    ASSERT_TRUE(again);
+    EXPECT_EQ(Get(*again, "a"), "new");
 }
 
 } // namespace

@@ -52,10 +52,13 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
         backup = file.m_backupPath;
     else if (file.m_keepBackup && FileSystem::Exists(final))
         backup = FindBackupName(final);
-    if (!backup.IsEmpty() && !FileSystem::RenameFile(final, backup, c_renameRetries)) backup = String8();
+    // A rename can be refused after it was made, when its folder cannot be flushed: what lies where is what counts.
+    if (!backup.IsEmpty() && !FileSystem::RenameFile(final, backup, c_renameRetries) && FileSystem::Exists(final))
+        backup = String8();
 
     FileSystem::SafeMoveFileResult const moved = FileSystem::SafeMoveFileAdv(file.m_path, final, 0);
-    if (static_cast<int>(moved) != 0) {
+    bool const isThere = FileSystem::Exists(final) && !FileSystem::Exists(file.m_path);
+    if (static_cast<int>(moved) != 0 && !isThere) {
         if (!backup.IsEmpty()) FileSystem::RenameFile(backup, final, c_renameRetries);
         // The temporary holds the save and stays usable where it is.
         File::OpenUnmanagedResult result{};
@@ -67,12 +70,15 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
         file.m_path = final;
         file.m_finalPath = String8();
     }
-    if (!backup.IsEmpty()) FileSystem::Delete(backup, 0);
+    // A save that is in place but may not last keeps the replaced file beside it.
+    bool const isLasting = static_cast<int>(moved) == 0;
+    if (!backup.IsEmpty() && isLasting) FileSystem::Delete(backup, 0);
     FileSystem::SetFileHidden(final, false);
 
     File::OpenUnmanagedResult result{};
     file.m_stream = FileInOutStream::Open(final.GetData(), File::ShareMode::DenyWrite, result, nullptr);
     if (!file.m_stream) ThrowFileException(file, ArchiveFileException::Reason::FileError);
+    if (!isLasting) ThrowFileException(file, ReasonOf(moved));
 }
 
 } // namespace Kernel
