@@ -27,14 +27,18 @@ enum class Outcome
 
 Outcome TryParse(std::vector<u8> const& bytes, bool checks, Delivery delivery = Delivery::Memory)
 {
+    Outcome outcome = Outcome::Null;
     try {
         Counted<InSerialiserFile> const file = Parse(bytes, checks, delivery);
-        if (!file) return Outcome::Null;
-        LoadEverything(*file);
-        return Outcome::Parsed;
+        if (file) {
+            LoadEverything(*file);
+            outcome = Outcome::Parsed;
+        }
     } catch (FutureVersionException const&) {
-        return Outcome::Thrown;
+        outcome = Outcome::Thrown;
     }
+    ReaderNode::DropAll();
+    return outcome;
 }
 
 PropertyBytes Start()

@@ -27,6 +27,7 @@ ClassProperties const s_making_null("RdNu", &MakeNull, 1, nullptr, nullptr);
 ClassProperties const ReaderNode::ms_ClassProperties("RdNo", &ClassProperties::CreateNew<ReaderNode>, 1, nullptr,
                                                      nullptr);
 int ReaderNode::s_alive = 0;
+std::set<ReaderNode*> ReaderNode::s_all;
 ClassProperties const ReaderDerived::ms_ClassProperties("RdDv", &ClassProperties::CreateNew<ReaderDerived>, 1, nullptr,
                                                         &ReaderNode::ms_ClassProperties);
 ClassProperties const ReaderLegacy::ms_ClassProperties("RdLg", &MakeLegacy, 1);
@@ -68,6 +69,24 @@ bool ReaderNode::Load(InSerialiser const& in, FileStore&, unsigned short v)
     if (auto const* const node = dynamic_cast<ReaderNode const*>(reference.Get())) sawUnloaded = !node->isLoaded;
     isLoaded = true;
     return !in.HasProperty("Refu") && !tookWrongClass;
+}
+
+ReaderNode::ReaderNode()
+{
+    ++s_alive;
+    s_all.insert(this);
+}
+
+ReaderNode::~ReaderNode()
+{
+    --s_alive;
+    s_all.erase(this);
+}
+
+void ReaderNode::DropAll()
+{
+    std::vector<Counted<ReaderNode>> const all(s_all.begin(), s_all.end());
+    for (Counted<ReaderNode> const& node : all) node->Drop();
 }
 
 void ReaderNode::Drop()

@@ -8,6 +8,7 @@
 #include "libkernel/streams/InStream.h"
 #include "support/PropertyBytes.h"
 
+#include <set>
 #include <vector>
 
 namespace Kernel::Test {
@@ -18,12 +19,14 @@ namespace Kernel::Test {
 class ReaderNode : public Serialisable
 {
 public:
-    ReaderNode() { ++s_alive; }
+    ReaderNode();
     void Save(OutSerialiser& out) const override;
     bool Load(InSerialiser const& in, FileStore& store, unsigned short version) override;
     ClassProperties const* GetObjectClassProperties() const override { return &ms_ClassProperties; }
     /// Lets go of everything it holds, so that a circle ends.
     void Drop();
+    /// The same for all that are left over: damaged streams make circles.
+    static void DropAll();
 
     u32 number = 0;
     String8 name;
@@ -40,7 +43,10 @@ public:
     static int s_alive;
 
 protected:
-    ~ReaderNode() override { --s_alive; }
+    ~ReaderNode() override;
+
+private:
+    static std::set<ReaderNode*> s_all;
 };
 
 /// RdDv, with the parent RdNo: its own class and the parent's properties.

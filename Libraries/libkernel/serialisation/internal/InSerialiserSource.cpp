@@ -46,7 +46,7 @@ bool InSerialiserSource::FillSlow(u64 count, u64 sure)
     if (m_inPlace) return false;
     if (!m_buffer) m_buffer = std::make_unique_for_overwrite<u8[]>(c_blockSize);
     u64 have = static_cast<u64>(m_end - m_at);
-    std::memmove(m_buffer.get(), m_at, have);
+    if (have) std::memmove(m_buffer.get(), m_at, have);
     m_at = m_buffer.get();
     u64 const wanted = m_seekable ? c_blockSize : std::min<u64>(count + sure, c_blockSize);
     while (have < count) {
