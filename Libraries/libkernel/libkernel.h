@@ -137,3 +137,4 @@
 #include "libkernel/streams/ZStandardOutStream.h"
 #include "libkernel/streams/ZipInStream.h"
 #include "libkernel/streams/ZipOutStream.h"
+#include "libkernel/text/Locale.h"
