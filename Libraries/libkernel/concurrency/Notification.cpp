@@ -11,12 +11,12 @@ namespace Kernel {
 namespace {
 
 // The wide character of this system is one code point.
-String16 FromWide(wchar_t const* text, u64 length)
+String16 FromWide(wchar_t const* text, int length)
 {
     String16 result;
     if (!text) return result;
-    result.Reserve(static_cast<int>(length));
-    for (u64 i = 0; i < length; ++i) {
+    result.Reserve(length);
+    for (int i = 0; i < length; ++i) {
         u32 const c = static_cast<u32>(text[i]);
         if (c < 0x10000)
             result.Append(static_cast<char16_t>(c >= 0xD800 && c < 0xE000 ? 0xFFFD : c));
@@ -30,9 +30,10 @@ String16 FromWide(wchar_t const* text, u64 length)
     return result;
 }
 
-bool MeansToTerminator(u64 length)
+// Callers pass int lengths through the u64, so only its low half counts.
+int GetIntLength(u64 length)
 {
-    return static_cast<i32>(static_cast<u32>(length)) < 0;
+    return static_cast<i32>(static_cast<u32>(length));
 }
 
 } // namespace
@@ -41,13 +42,14 @@ Reporter::~Reporter() = default;
 
 void Reporter::Report(Type type, wchar_t const* text, u64 length)
 {
-    if (MeansToTerminator(length)) length = text ? std::wcslen(text) : 0;
-    Report(type, FromWide(text, length));
+    int const given = GetIntLength(length);
+    Report(type, FromWide(text, given >= 0 || !text ? given : static_cast<int>(std::wcslen(text))));
 }
 
 void Reporter::Report(Type type, char const* text, u64 length)
 {
-    Report(type, MeansToTerminator(length) ? String8(text) : String8(text, static_cast<int>(length)));
+    int const given = GetIntLength(length);
+    Report(type, given < 0 ? String8(text) : String8(text, given));
 }
 
 void Reporter::Report(Type type, wchar_t const* text)

@@ -109,6 +109,7 @@ public:
     void Stop(u64 slot);
     void Restart();
     void IncrementCount(u64 slot, char const* description = nullptr);
+    /// Drops all figures and ends at slot 0, stopped: Restart, Start or Next goes on.
     void Clear();
 
 private:
