@@ -62,7 +62,6 @@ StringT<Enc>::StringT(int length, Unit*& units)
         UnitsOf(m_block)[length] = 0;
     } else {
         m_block = &s_empty.header;
-        Retain();
     }
     units = UnitsOf(m_block);
 }

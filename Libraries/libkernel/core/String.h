@@ -39,7 +39,7 @@ public:
     using EncodingType = Enc;
 
     /// Empty; takes no memory.
-    StringT() : m_block(&s_empty.header) { Retain(); }
+    StringT() : m_block(&s_empty.header) {}
     /// Copies up to the terminator; null gives the empty string.
     StringT(Unit const* text);
     /// Copies @p length units; null or a length below 1 gives the empty string.
@@ -170,17 +170,23 @@ private:
     static int Measure(Unit const* text);
     static StringT Joined(Unit const* a, int n, Unit const* b, int m);
     bool IsEqual(Unit const* text, int length) const;
-    void Retain() { m_block->references.fetch_add(1, std::memory_order_relaxed); }
+    // The empty block is nobody's to free. Counting it would make every thread write the same line of memory.
+    bool IsCounted() const { return m_block != &s_empty.header; }
+    void Retain()
+    {
+        if (IsCounted()) m_block->references.fetch_add(1, std::memory_order_relaxed);
+    }
     // The only owner needs no atomic exchange: nobody is left who could take a reference meanwhile.
     void Release()
     {
-        if (m_block && (m_block->references.load(std::memory_order_acquire) == 1 ||
-                        m_block->references.fetch_sub(1, std::memory_order_acq_rel) == 1))
+        if (m_block && IsCounted() &&
+            (m_block->references.load(std::memory_order_acquire) == 1 ||
+             m_block->references.fetch_sub(1, std::memory_order_acq_rel) == 1))
             Free(m_block);
     }
     static void Free(Header* block);
 
-    // Holds one reference of its own, so it is never freed.
+    // Never counted and never freed.
     KERNEL_API static EmptyBlock s_empty;
 
     Header* m_block; // Null only after a move.
