@@ -89,6 +89,7 @@
 #include "libkernel/serialisation/FutureVersionException.h"
 #include "libkernel/serialisation/InSerialiser.h"
 #include "libkernel/serialisation/InSerialiserFile.h"
+#include "libkernel/serialisation/InSerialiserProperty.h"
 #include "libkernel/serialisation/InSerialiserPropertyDataStream.h"
 #include "libkernel/serialisation/OutSerialiser.h"
 #include "libkernel/serialisation/OutSerialiserFile.h"

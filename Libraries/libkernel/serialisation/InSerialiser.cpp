@@ -87,6 +87,13 @@ InSerialiser::~InSerialiser()
     TearDownAllProperties();
 }
 
+// For a list that outlives its parse, whose references it had borrowed.
+void InSerialiser::OwnObjectsI() const
+{
+    for (u32 i = 0; i < m_count; ++i) m_properties[i].OwnObjects();
+    m_holdsSomething = true;
+}
+
 // Finding.
 
 InSerialiserProperty* InSerialiser::FindPropertyI(IDTag tag) const
@@ -142,7 +149,7 @@ bool InSerialiser::GetPropertyParams(IDTag tag, PropertyTypeParams& params) cons
 {
     Property const* const property = FindKindI(tag, Type::Value);
     if (!property) return false;
-    params = {property->GetType(), property->IsArray(), property->IsArray() ? property->GetArrayCount() : 0};
+    params = {property->GetType(), property->IsArray(), property->IsArray() ? property->value->count : 0};
     return true;
 }
 
@@ -161,6 +168,9 @@ void InSerialiser::TearDown(IDTag tag) const
     Property removed = *found;
     std::copy(found + 1, m_properties + m_count, found);
     --m_count;
+    // Whoever owns the place must not find a second copy there.
+    m_properties[m_count] = {};
+    m_next = 0;
     removed.Release();
 }
 
@@ -171,6 +181,7 @@ void InSerialiser::TearDownAllProperties() const
     u32 const count = std::exchange(m_count, 0);
     m_tagBits = 0;
     m_next = 0;
+    if (!m_holdsSomething) return;
     for (u32 i = 0; i < count; ++i) {
         if (properties[i].HoldsSomething()) properties[i].Release();
     }

@@ -5,6 +5,7 @@
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/RawData.h"
 #include "libkernel/core/String.h"
+#include "libkernel/serialisation/InSerialiserProperty.h"
 #include "libkernel/serialisation/PropType.h"
 
 #include <array>
@@ -26,7 +27,6 @@ class InSerialiserObjectMarkers;
 class InSerialiserPropertyDataStream;
 class Serialisable;
 class SharedSerialisable;
-struct InSerialiserProperty;
 
 /// One parsed property list: what an object's Load reads from, by tag and in any order.
 ///
@@ -42,23 +42,7 @@ class KERNEL_API InSerialiser : public Countable
 {
 public:
     /// What stands under a tag.
-    enum class PropertyType : u8
-    {
-        None = 0,  ///< Nothing.
-        Value = 1, ///< A typed value: numbers, bool, enum, strings, custom blocks, tags, raw structs, flag sets.
-        RawData = 2,
-        FragmentedRawData = 3,
-        DataStream = 4,
-        Object = 5,
-        ObjectArray = 6,
-        SharedObject = 7,
-        SharedObjectArray = 8,
-        NullObject = 9,
-        NullArray = 10, ///< An array of nothing but nulls, which answers as plain or shared.
-        Class = 11,
-        ClassArray = 12,
-        DelayLoad = 13
-    };
+    using PropertyType = InSerialiserPropertyType;
 
     /// What a parse does with each reference to an item that is loaded on demand.
     enum class DelayLoadsBehaviour : int
@@ -107,7 +91,10 @@ public:
     template <PropValue T>
     bool LoadType(IDTag tag, T& value) const
     {
-        return LoadTypeI(tag, PropTypeOf<T>(), &value, sizeof(T));
+        InSerialiserProperty const* const next = TakeNextI(tag, PropTypeOf<T>());
+        if (!next) return LoadTypeI(tag, PropTypeOf<T>(), &value, sizeof(T));
+        std::memcpy(static_cast<void*>(&value), &next->number, sizeof(T));
+        return true;
     }
     bool LoadType(IDTag tag, bool& value) const;
     /// The text, converted from UTF-8. False too for a text longer than a string can be.
@@ -234,7 +221,17 @@ protected:
 
 private:
     friend class InSerialiserLoader;
+    friend struct InSerialiserProperty;
 
+    /// The next property in line if it is this scalar of at most 8 bytes, or null: whoever loads in the order in which
+    /// the file was written needs no search.
+    InSerialiserProperty const* TakeNextI(IDTag tag, PropType type) const
+    {
+        if (m_next >= m_count || m_properties[m_next].tag != tag || !m_properties[m_next].IsNumber(type))
+            return nullptr;
+        return &m_properties[m_next++];
+    }
+    void OwnObjectsI() const;
     inline InSerialiserProperty* FindPropertyI(IDTag tag) const;
     inline InSerialiserProperty const* FindPropertyOrDefaultI(IDTag tag) const;
     inline InSerialiserProperty const* FindValueI(IDTag tag, u8 typeByte) const;
@@ -257,7 +254,8 @@ private:
     mutable InSerialiserProperty* m_properties = nullptr;
     mutable u64 m_tagBits = 0; // A tag whose bit is not there is not there.
     mutable u32 m_count = 0;
-    mutable u32 m_next = 0; // Behind the property found last, where the next one asked for mostly lies.
+    mutable bool m_holdsSomething = false; // Otherwise tearing down need not look at the properties.
+    mutable u32 m_next = 0;                // Behind the property found last, where the next one asked for mostly lies.
     u32 m_buildIndex = 0;
     InSerialiserClassInfoBase const* m_classInfo = nullptr; // Not owned; null at file level and in inline classes.
     Counted<InSerialiserObjectMarkers> m_markers;           // Null unless somebody wants the report.

@@ -47,34 +47,28 @@ void InSerialiserClassInfoBase::Close(InSerialiserClassInfoBase const* parent)
         m_joined = std::move(joined);
         m_next = parent->m_next;
     }
-    MakeTable();
+    m_followers.resize(m_joined.size());
 }
 
-void InSerialiserClassInfoBase::MakeTable()
+InSerialiserProperty const* InSerialiserClassInfoBase::FindSlow(IDTag tag) const
 {
-    if (m_joined.size() > c_maxJoined) return;
-    u32 bits = 1;
-    while ((size_t(1) << bits) < 2 * m_joined.size()) ++bits;
-    m_places.assign(size_t(1) << bits, 0);
-    m_shift = 32 - bits;
-    u32 const mask = static_cast<u32>(m_places.size()) - 1;
-    for (size_t i = 0; i < m_joined.size(); ++i) {
-        u32 at = Mix(m_joined[i].tag, m_shift);
-        while (m_places[at] != 0) at = (at + 1) & mask;
-        m_places[at] = static_cast<u16>(i + 1);
+    if (m_isOpen) {
+        // A default object of this very class sees what has been stated so far.
+        auto const at = m_own.find(tag);
+        return at == m_own.end() ? nullptr : &at->second;
     }
-}
-
-InSerialiserProperty const* InSerialiserClassInfoBase::FindAmongMany(IDTag tag) const
-{
-    return FindSorted(const_cast<InSerialiserProperty*>(m_joined.data()), static_cast<u32>(m_joined.size()), tag);
-}
-
-// A default object of this very class sees what has been stated so far.
-InSerialiserProperty const* InSerialiserClassInfoBase::FindWhileOpen(IDTag tag) const
-{
-    auto const at = m_own.find(tag);
-    return at == m_own.end() ? nullptr : &at->second;
+    for (InSerialiserClassInfoBase const* info = this; info; info = info->m_next) {
+        auto const at = std::lower_bound(info->m_joined.begin(), info->m_joined.end(), tag,
+                                         [](InSerialiserProperty const& a, IDTag wanted) { return a.tag < wanted; });
+        if (at == info->m_joined.end() || at->tag != tag) continue;
+        if (info == this) {
+            u32 const found = static_cast<u32>(at - m_joined.begin());
+            m_followers[m_last] = found;
+            m_last = found;
+        }
+        return &*at;
+    }
+    return nullptr;
 }
 
 } // namespace Kernel

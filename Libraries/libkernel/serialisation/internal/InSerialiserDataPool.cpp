@@ -105,9 +105,9 @@ bool InSerialiserDataPool::Tail::Read(InSerialiserSource& source, u64 count)
     return true;
 }
 
-void InSerialiserDataPool::GiveBack(Mark const& mark)
+void InSerialiserDataPool::DropBuckets(size_t kept)
 {
-    while (m_buckets.size() > mark.buckets) {
+    while (m_buckets.size() > kept) {
         Counted<InSerialiserDataPoolBucket> bucket = std::move(m_buckets.back());
         m_buckets.pop_back();
         bucket->m_left += static_cast<u64>(bucket->m_free - bucket->m_block);
@@ -115,10 +115,6 @@ void InSerialiserDataPool::GiveBack(Mark const& mark)
         if (!m_spare && bucket->m_left == c_bucketSize) m_spare = std::move(bucket);
     }
     m_last = m_buckets.empty() ? nullptr : m_buckets.back().Get();
-    if (!m_last) return;
-    u8* const free = m_last->m_block + mark.used;
-    m_last->m_left += static_cast<u64>(m_last->m_free - free);
-    m_last->m_free = free;
 }
 
 } // namespace Kernel

@@ -80,11 +80,19 @@ public:
     Mark GetMark() const { return {m_buckets.size(), m_last ? static_cast<u64>(m_last->m_free - m_last->m_block) : 0}; }
     /// Gives everything back that was allocated since the mark; blocks that become empty are dropped, but one is kept
     /// at hand.
-    void GiveBack(Mark const& mark);
+    void GiveBack(Mark const& mark)
+    {
+        if (mark.buckets != m_buckets.size()) DropBuckets(mark.buckets);
+        if (!m_last) return;
+        u8* const free = m_last->m_block + mark.used;
+        m_last->m_left += static_cast<u64>(m_last->m_free - free);
+        m_last->m_free = free;
+    }
 
 private:
     u8* AllocateSlow(u64 size);
     bool Push(u64 size);
+    void DropBuckets(size_t kept);
 
     std::vector<Counted<InSerialiserDataPoolBucket>> m_buckets;
     InSerialiserDataPoolBucket* m_last = nullptr; // The one in use: the last of m_buckets, or null.

@@ -18,6 +18,13 @@ namespace {
 // Longer texts are read straight into a string of their own, which those who ask for them share.
 constexpr u32 c_ownTextLength = 1024;
 
+// The ends of an object of some 100 bytes: the table pointer in front, and the count, which a virtual base has behind.
+void Prefetch(void const* object)
+{
+    __builtin_prefetch(object);
+    __builtin_prefetch(static_cast<u8 const*>(object) + 64);
+}
+
 template <class T>
 T* MakeInPool(InSerialiserDataPool& pool)
 {
@@ -42,7 +49,12 @@ InSerialiserLoader::~InSerialiserLoader()
         m_stack.back().Release();
         m_stack.pop_back();
     }
-    for (ObjectRecord& record : m_objects) record.Release();
+    // Every object's count lies in memory that has grown cold: the next ones are fetched ahead.
+    constexpr size_t c_ahead = 12;
+    for (size_t i = 0; i < m_objects.size(); ++i) {
+        if (i + c_ahead < m_objects.size()) Prefetch(m_objects[i + c_ahead].object);
+        m_objects[i].Release();
+    }
     for (auto& [index, record] : m_strayObjects) record.Release();
 }
 
@@ -66,6 +78,7 @@ Counted<InSerialiserFile> InSerialiserLoader::ReadHeader()
 bool InSerialiserLoader::ParseFile(InSerialiserFile& file)
 {
     if (!ParseList(file) || !m_source.Release()) return false;
+    file.OwnObjectsI();
     file.m_pool = std::move(m_pool);
     file.m_defaultsPool = std::move(m_defaultsPool);
     file.m_foundMissingFiles = m_missingFiles;
@@ -80,49 +93,66 @@ void InSerialiserLoader::ReportProblem(String8 const& text)
 
 // Lists.
 
-bool InSerialiserLoader::ParseList(InSerialiser& list)
+// The list then lies on top of the stack and owns what is there.
+bool InSerialiserLoader::ParseOnStack(InSerialiser& list)
 {
     size_t const base = m_stack.size();
+    TagBits tags;
     m_source.OpenList();
-    if (!ParseProperties()) return false;
+    if (!ParseProperties(tags)) return false;
     m_source.CloseList();
-
-    InSerialiserProperty* const first = m_stack.data() + base;
-    u32 const count = ArrangeProperties(first, static_cast<u32>(m_stack.size() - base), list.m_tagBits);
+    u32 const count = ArrangeProperties(m_stack.data() + base, static_cast<u32>(m_stack.size() - base), tags);
     m_stack.resize(base + count);
-    if (count > 0) {
-        u8* const at = GetPool().Allocate(count * sizeof(InSerialiserProperty));
-        if (!at) return false;
-        std::memcpy(at, m_stack.data() + base, count * sizeof(InSerialiserProperty));
-        list.m_properties = reinterpret_cast<InSerialiserProperty*>(at);
-        list.m_count = count;
-        m_stack.resize(base);
-    }
+    list.m_properties = m_stack.data() + base;
+    list.m_count = count;
+    list.m_tagBits = tags.bits;
+    list.m_holdsSomething = tags.holdsSomething;
     return true;
 }
 
-bool InSerialiserLoader::ParseProperties()
+bool InSerialiserLoader::ParseList(InSerialiser& list)
+{
+    size_t const base = m_stack.size();
+    if (!ParseOnStack(list)) return false;
+    u64 const size = list.m_count * sizeof(InSerialiserProperty);
+    u8* const at = GetPool().Allocate(size);
+    if (at && size) std::memcpy(at, list.m_properties, size);
+    list.m_properties = reinterpret_cast<InSerialiserProperty*>(at);
+    if (!at) {
+        // They stay the stack's.
+        list.m_count = 0;
+        return false;
+    }
+    m_stack.resize(base);
+    return true;
+}
+
+bool InSerialiserLoader::ParseProperties(TagBits& tags)
 {
     for (;;) {
         u8 typeByte = 0;
         if (!m_source.ReadItemByte(typeByte)) return false;
         if (typeByte == 0) return true;
         // Most properties are numbers, which own nothing.
-        if (IsKnownWireType(typeByte) && InSerialiserProperty::GetInlineSize(typeByte)) {
-            if (!ParseNumber(typeByte, m_stack.emplace_back())) return false;
+        if (c_inlineSizes[typeByte] != 0) {
+            InSerialiserProperty& number = m_stack.emplace_back();
+            if (!ParseNumber(typeByte, number)) return false;
+            tags.Add(number.tag);
             continue;
         }
         OwnedProperty owned;
         owned.property.typeByte = typeByte;
         if (!ParseProperty(owned.property)) return false;
         m_stack.push_back(owned.property);
+        tags.Add(owned.property.tag);
+        tags.holdsSomething |= owned.property.HoldsSomething();
         owned.Disown();
     }
 }
 
 bool InSerialiserLoader::ParseNumber(u8 typeByte, InSerialiserProperty& property)
 {
-    u32 const size = InSerialiserProperty::GetInlineSize(typeByte);
+    u32 const size = c_inlineSizes[typeByte];
     if (!m_source.Fill(sizeof(u32) + size)) return false;
     u8 const* const at = m_source.GetAt();
     property.typeByte = typeByte;
@@ -144,7 +174,7 @@ bool InSerialiserLoader::ParseProperty(InSerialiserProperty& property)
         Trace(FormatT<String8>(">>> Use of unknown prop type: %1\n", GetWireType(typeByte)));
         throw FutureVersionException(false);
     }
-    if (InSerialiserProperty::GetInlineSize(typeByte)) return ParseNumber(typeByte, property);
+    if (c_inlineSizes[typeByte] != 0) return ParseNumber(typeByte, property);
     if (!IsLegalWireType(typeByte) || !m_source.ReadNumber(property.tag.value)) return false;
     switch (c_wireTypes[GetWireType(typeByte)].form) {
     case WireForm::DataStream: return ParseDataStream(property);
@@ -171,7 +201,17 @@ bool InSerialiserLoader::ParseFlat(InSerialiserProperty& property)
     u8 const typeByte = property.typeByte;
     if (typeByte == static_cast<u8>(PropType::String)) {
         u32 length = 0;
-        return m_source.ReadNumber(length) && m_source.Fits(length) && ParseText(property, length);
+        if (!m_source.ReadNumber(length)) return false;
+        if (length < c_ownTextLength && length <= m_source.GetBuffered() && m_defaultsNesting == 0) {
+            u8* const at = m_pool->Allocate(sizeof(StoredValue) + length);
+            if (!at) return false;
+            property.value = new (at) StoredValue{length, 0};
+            std::memcpy(at + sizeof(StoredValue), m_source.GetAt(), length);
+            m_source.Take(length);
+            property.kind = InSerialiserProperty::Type::Value;
+            return true;
+        }
+        return m_source.Fits(length) && ParseText(property, length);
     }
     WireForm const form = c_wireTypes[GetWireType(typeByte)].form;
     WireHeader header;

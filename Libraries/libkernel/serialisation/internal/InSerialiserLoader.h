@@ -7,9 +7,9 @@
 #include "libkernel/serialisation/SharedSerialisable.h"
 #include "libkernel/serialisation/internal/InSerialiserClassInfo.h"
 #include "libkernel/serialisation/internal/InSerialiserDataPool.h"
-#include "libkernel/serialisation/internal/InSerialiserProperty.h"
 #include "libkernel/serialisation/internal/InSerialiserSource.h"
 #include "libkernel/serialisation/internal/PropertyWire.h"
+#include "libkernel/serialisation/internal/StoredProperty.h"
 
 #include <map>
 #include <memory>
@@ -52,10 +52,11 @@ private:
 /// One parse: turns the bytes of a stream into property lists and objects.
 ///
 /// A list is read to its end before anybody sees it. Its properties collect on one stack shared by all lists that are
-/// being read, each list its own stretch on top of its owner's; at the end of the list they are sorted into the pool.
-/// What properties point to lies in the pool too, and the pool goes back to where it stood when the object they were
-/// read for has loaded. The defaults of classes go to a pool of their own, which never goes back during the parse,
-/// since a class described inside a default object stays in use.
+/// being read, each list its own stretch on top of its owner's. An object's list stays there until its Load has run;
+/// those that last longer, of inline classes and the root, move into the pool. What properties point to lies in the
+/// pool too, and the pool goes back to where it stood when the object they were read for has loaded. The defaults of
+/// classes go to a pool of their own, which never goes back during the parse, since a class described inside a default
+/// object stays in use.
 ///
 /// Every operation that reads answers false for a stream that is damaged or ends, all the way out. Exceptions pass
 /// through; the destructor lets go of whatever was half read.
@@ -100,7 +101,8 @@ private:
     };
 
     // Lists and values.
-    bool ParseProperties();
+    bool ParseProperties(TagBits& tags);
+    bool ParseOnStack(InSerialiser& list);
     bool ParseList(InSerialiser& list);
     bool ParseProperty(InSerialiserProperty& property);
     bool ParseNumber(u8 typeByte, InSerialiserProperty& property);
@@ -126,7 +128,8 @@ private:
     bool CreatePlain(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property);
     bool CreateShared(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property);
     ObjectRecord const* FindObject(u32 index) const;
-    bool AddObject(u32 index, InSerialiserProperty const& property);
+    bool AddObject(u32 index, InSerialiserProperty& property, Counted<Serialisable> object);
+    ObjectRecord* AddRecord(u32 index);
     bool ReadClassRecord(ClassResult& result);
     bool ReadKnownClass(ClassResult& result);
     bool ReadClassDescription(ClassResult& result);
@@ -168,8 +171,8 @@ private:
     std::vector<ObjectRecord> m_objects;
     std::map<u32, ObjectRecord> m_strayObjects; // A tree: the stream chooses the keys.
     u32 m_objectsBegun = 0;
-    std::vector<Counted<InSerialiser>> m_spareLists;
-    size_t m_listsMade = 0;                    // Lists of objects; one for each level that was reached.
+    std::vector<Counted<InSerialiser>> m_lists; // Of objects, one for each level that was reached.
+    size_t m_listsInUse = 0;
     std::vector<InSerialiserProperty> m_stack; // Owns what its properties hold.
 };
 

@@ -38,36 +38,38 @@ void TraceParent(ClassPropertiesBase const& properties, ClassPropertiesBase cons
 } // namespace
 
 // The list of one object, for as long as its Load runs. What it holds goes when the scope ends, so that nobody who kept
-// the list can follow it into the pool; the list itself serves the next object unless somebody did.
+// the list can follow it onto the stack; the list itself serves the next object of this depth unless somebody did.
 class InSerialiserLoader::ObjectList
 {
 public:
-    ObjectList(InSerialiserLoader& loader, InSerialiserClassInfoBase const& info) : m_loader(loader)
+    ObjectList(InSerialiserLoader& loader, InSerialiserClassInfoBase const& info)
+        : m_loader(loader), m_base(loader.m_stack.size())
     {
-        if (loader.m_spareLists.empty()) {
-            // So that giving the list back needs no memory.
-            loader.m_spareLists.reserve(++loader.m_listsMade);
-            m_list = loader.MakeList();
-        } else {
-            m_list = std::move(loader.m_spareLists.back());
-            loader.m_spareLists.pop_back();
-        }
+        if (loader.m_listsInUse == loader.m_lists.size()) loader.m_lists.emplace_back();
+        Counted<InSerialiser>& list = loader.m_lists[loader.m_listsInUse];
+        if (!list || list->GetReferenceCount() > 1) list = loader.MakeList();
+        m_list = list.Get();
         m_list->m_classInfo = &info;
+        ++loader.m_listsInUse;
     }
     ~ObjectList()
     {
         m_list->TearDownAllProperties();
         m_list->m_classInfo = nullptr;
-        if (m_list->GetReferenceCount() == 1) m_loader.m_spareLists.push_back(std::move(m_list));
+        if (m_isParsed) m_loader.m_stack.resize(m_base);
+        --m_loader.m_listsInUse;
     }
     ObjectList(ObjectList const&) = delete;
     ObjectList& operator=(ObjectList const&) = delete;
 
+    bool Parse() { return m_isParsed = m_loader.ParseOnStack(*m_list); }
     InSerialiser& operator*() const { return *m_list; }
 
 private:
     InSerialiserLoader& m_loader;
-    Counted<InSerialiser> m_list;
+    InSerialiser* m_list; // Held by the loader.
+    size_t const m_base;
+    bool m_isParsed = false; // The stretch of the stack from m_base on is the list's.
 };
 
 bool InSerialiserLoader::ReportProgress()
@@ -101,22 +103,31 @@ InSerialiserLoader::ObjectRecord const* InSerialiserLoader::FindObject(u32 index
     return at == m_strayObjects.end() ? nullptr : &at->second;
 }
 
-// Takes a reference of its own.
-bool InSerialiserLoader::AddObject(u32 index, InSerialiserProperty const& property)
+// From here on the parse owns the object, and every property that it stands in only borrows it.
+bool InSerialiserLoader::AddObject(u32 index, InSerialiserProperty& property, Counted<Serialisable> object)
 {
-    if (FindObject(index)) return false;
+    ObjectRecord* const record = AddRecord(index);
+    if (!record) return false;
+    record->kind = property.kind = InSerialiserProperty::Type::Object;
+    record->object = property.object = object.Detach();
+    return true;
+}
+
+InSerialiserLoader::ObjectRecord* InSerialiserLoader::AddRecord(u32 index)
+{
     ObjectRecord* record = nullptr;
-    if (index >= m_objectsBegun)
+    if (index == m_objects.size() && index < m_objectsBegun && m_strayObjects.empty())
+        record = &m_objects.emplace_back(); // The usual case.
+    else if (FindObject(index))
+        return nullptr;
+    else if (index >= m_objectsBegun)
         record = &m_strayObjects[index];
-    else if (index == m_objects.size())
-        record = &m_objects.emplace_back();
     else {
-        if (index > m_objects.size()) m_objects.resize(index + size_t(1));
+        if (index >= m_objects.size()) m_objects.resize(index + size_t(1));
         record = &m_objects[index];
     }
-    *record = property;
-    property.Retain();
-    return true;
+    record->ownsObjects = true;
+    return record;
 }
 
 bool InSerialiserLoader::ParseObject(InSerialiserProperty& property)
@@ -140,7 +151,6 @@ bool InSerialiserLoader::ReadObject(InSerialiserProperty& property)
     if (!record) return false;
     property.kind = record->kind;
     property.object = record->object;
-    property.Retain();
     return true;
 }
 
@@ -174,18 +184,21 @@ bool InSerialiserLoader::CreatePlain(u32 index, InSerialiserClassInfoBase const&
     auto const& properties = static_cast<ClassProperties const&>(info.GetProperties());
     if (auto const create = properties.GetCreateFunc()) {
         // In the map before its properties are read, so that they can refer to it.
-        if (!property.SetObject(create()) || !AddObject(index, property)) return false;
-        ObjectList const list(*this, info);
-        if (!ParseList(*list)) return false;
+        Counted<Serialisable> object = create();
+        if (!object || !AddObject(index, property, std::move(object))) return false;
+        ObjectList list(*this, info);
+        if (!list.Parse()) return false;
         if (!property.object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
         return true;
     }
     auto const createLegacy = properties.GetCreateLegacyFunc();
     if (!createLegacy) return false;
-    ObjectList const list(*this, info);
-    if (!ParseList(*list) || !property.SetObject(createLegacy(*list, info.GetVersion()))) return false;
-    if (!property.object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
-    return AddObject(index, property);
+    ObjectList list(*this, info);
+    if (!list.Parse()) return false;
+    Counted<Serialisable> object = createLegacy(*list, info.GetVersion());
+    if (!object) return false;
+    if (!object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
+    return AddObject(index, property, std::move(object));
 }
 
 bool InSerialiserLoader::CreateShared(u32 index, InSerialiserClassInfoBase const& info, InSerialiserProperty& property)
@@ -193,8 +206,8 @@ bool InSerialiserLoader::CreateShared(u32 index, InSerialiserClassInfoBase const
     auto const& properties = static_cast<SharedClassProperties const&>(info.GetProperties());
     Counted<SharedSerialisable> object;
     {
-        ObjectList const list(*this, info);
-        if (!ParseList(*list)) return false;
+        ObjectList list(*this, info);
+        if (!list.Parse()) return false;
         if (auto const create = properties.GetCreateFunc())
             object = create();
         else if (auto const createLegacy = properties.GetCreateLegacyFunc())
@@ -202,8 +215,12 @@ bool InSerialiserLoader::CreateShared(u32 index, InSerialiserClassInfoBase const
         if (!object) return false;
         if (!object->Load(*list, m_store, info.GetVersion())) RefuseObject(properties.GetClassUID());
     }
-    property.SetShared(properties.ConsolidateObjectSacrifice(object).GetCounted());
-    return AddObject(index, property);
+    Consolidated<SharedSerialisable> const canonical = properties.ConsolidateObjectSacrifice(object);
+    ObjectRecord* const record = AddRecord(index);
+    if (!record) return false;
+    record->kind = property.kind = InSerialiserProperty::Type::SharedObject;
+    record->shared = property.shared = Counted<SharedSerialisable>(canonical.GetCounted()).Detach();
+    return true;
 }
 
 bool InSerialiserLoader::StoreObjects(InSerialiserProperty& property, InSerialiserProperty::Type kind, u32 count,
@@ -212,7 +229,7 @@ bool InSerialiserLoader::StoreObjects(InSerialiserProperty& property, InSerialis
     u8* const at = GetPool().Allocate(sizeof(StoredObjects) + count * sizeof(void*));
     if (!at) return false;
     property.objects = new (at) StoredObjects{count};
-    // The stack begins at the first object that is not null. What its elements own passes to the array.
+    // The stack begins at the first object that is not null.
     size_t const nulls = count - (m_stack.size() - base);
     auto const fill = [&](auto** objects, auto pointer) {
         std::fill_n(objects, nulls, nullptr);

@@ -1,8 +1,9 @@
-#include "libkernel/serialisation/internal/InSerialiserProperty.h"
+#include "libkernel/serialisation/InSerialiserProperty.h"
 
 #include "libkernel/filestore/DelayLoadHolder.h"
 #include "libkernel/serialisation/Serialisable.h"
 #include "libkernel/serialisation/SharedSerialisable.h"
+#include "libkernel/serialisation/internal/StoredProperty.h"
 
 #include <algorithm>
 #include <memory>
@@ -15,36 +16,26 @@ std::string_view InSerialiserProperty::GetText() const
     return {reinterpret_cast<char const*>(value->GetPayload()), value->count};
 }
 
-bool InSerialiserProperty::SetObject(Counted<Serialisable> taken)
-{
-    if (!taken) return false;
-    object = taken.Detach();
-    kind = Type::Object;
-    return true;
-}
-
-void InSerialiserProperty::SetShared(Counted<SharedSerialisable> taken)
-{
-    shared = taken.Detach();
-    kind = Type::SharedObject;
-}
-
-void InSerialiserProperty::Retain() const
-{
-    if (kind == Type::Object)
-        object->Retain();
-    else
-        shared->Retain();
-}
-
 namespace {
 
-template <class T>
-void ReleaseObjects(StoredObjects& objects)
+template <class T, class Step>
+void ForObjects(StoredObjects& objects, Step step)
 {
     T** const first = objects.GetObjects<T>();
     for (u64 i = 0; i < objects.count; ++i) {
-        if (first[i]) first[i]->Release();
+        if (first[i]) step(*first[i]);
+    }
+}
+
+template <class Step>
+void ForObjectsOf(InSerialiserProperty const& property, Step step)
+{
+    switch (property.kind) {
+    case InSerialiserPropertyType::Object: step(*property.object); break;
+    case InSerialiserPropertyType::SharedObject: step(*property.shared); break;
+    case InSerialiserPropertyType::ObjectArray: ForObjects<Serialisable>(*property.objects, step); break;
+    case InSerialiserPropertyType::SharedObjectArray: ForObjects<SharedSerialisable>(*property.objects, step); break;
+    default: break;
     }
 }
 
@@ -77,6 +68,43 @@ u32 DropDuplicates(InSerialiserProperty* properties, u32 count)
 
 } // namespace
 
+void InSerialiserProperty::OwnObjects()
+{
+    switch (kind) {
+    case Type::Object:
+    case Type::ObjectArray:
+    case Type::SharedObject:
+    case Type::SharedObjectArray:
+        ForObjectsOf(*this, [](Countable const& object) { object.Retain(); });
+        ownsObjects = true;
+        break;
+    case Type::Class:
+        if (inlineClass->list) inlineClass->list->OwnObjectsI();
+        break;
+    case Type::ClassArray:
+        for (Counted<InSerialiser const> const& list : classes->lists)
+            if (list) list->OwnObjectsI();
+        break;
+    default: break;
+    }
+}
+
+bool InSerialiserProperty::HoldsSomething() const
+{
+    switch (kind) {
+    case Type::Value: return isOwnString;
+    case Type::Object:
+    case Type::ObjectArray:
+    case Type::SharedObject:
+    case Type::SharedObjectArray: return ownsObjects;
+    case Type::None:
+    case Type::DataStream:
+    case Type::NullObject:
+    case Type::NullArray: return false;
+    default: return true;
+    }
+}
+
 void InSerialiserProperty::Release()
 {
     switch (kind) {
@@ -85,10 +113,12 @@ void InSerialiserProperty::Release()
         break;
     case Type::RawData: std::destroy_at(rawData); break;
     case Type::FragmentedRawData: std::destroy_at(fragments); break;
-    case Type::Object: object->Release(); break;
-    case Type::ObjectArray: ReleaseObjects<Serialisable>(*objects); break;
-    case Type::SharedObject: shared->Release(); break;
-    case Type::SharedObjectArray: ReleaseObjects<SharedSerialisable>(*objects); break;
+    case Type::Object:
+    case Type::ObjectArray:
+    case Type::SharedObject:
+    case Type::SharedObjectArray:
+        if (ownsObjects) ForObjectsOf(*this, [](Countable const& o) { o.Release(); });
+        break;
     case Type::Class:
         if (inlineClass->list) inlineClass->list->TearDownAllProperties();
         std::destroy_at(inlineClass);
@@ -107,27 +137,16 @@ void InSerialiserProperty::Release()
     case Type::NullArray: break;
     }
     kind = Type::None;
-    isOwnString = false;
+    isOwnString = ownsObjects = false;
     number = 0;
 }
 
-u32 ArrangeProperties(InSerialiserProperty* properties, u32 count, u64& tagBits)
+u32 ArrangeProperties(InSerialiserProperty* properties, u32 count, TagBits const& tags)
 {
+    if (count <= c_unsortedList) return tags.mayRepeat ? DropDuplicates(properties, count) : count;
     auto const less = [](InSerialiserProperty const& a, InSerialiserProperty const& b) { return a.tag < b.tag; };
-    tagBits = 0;
-    if (count > c_unsortedList) {
-        tagBits = ~u64(0);
-        if (!std::is_sorted(properties, properties + count, less))
-            std::stable_sort(properties, properties + count, less);
-        return DropDuplicatesOfSorted(properties, count);
-    }
-    bool mayRepeat = false;
-    for (u32 i = 0; i < count; ++i) {
-        u64 const bit = GetTagBit(properties[i].tag);
-        mayRepeat |= (tagBits & bit) != 0;
-        tagBits |= bit;
-    }
-    return mayRepeat ? DropDuplicates(properties, count) : count;
+    if (!std::is_sorted(properties, properties + count, less)) std::stable_sort(properties, properties + count, less);
+    return DropDuplicatesOfSorted(properties, count);
 }
 
 InSerialiserProperty* FindSorted(InSerialiserProperty* properties, u32 count, IDTag tag)
