@@ -1,13 +1,14 @@
 #pragma once
 
 #include "libkernel/core/BaseCharTraits.h"
+#include "libkernel/core/CodePointTraits.h"
 #include "libkernel/core/String.h"
 
 namespace Kernel {
 
-// Operations on raw units that depend on the encoding, beside those of BaseCharTraits. Lengths and indices are in
-// units. All but GetValidLength and IsValid trust their input: text from outside is cut by GetValidLength first, since
-// a text that ends inside a code point would be read past its end.
+// Operations on raw units that depend on the encoding, beside those of BaseCharTraits and CodePointTraits. Lengths and
+// indices are in units. All but GetValidLength and IsValid trust their input: text from outside is cut by
+// GetValidLength first, since a text that ends inside a code point would be read past its end.
 
 template <class TEnc>
 struct CharTraits;
@@ -15,7 +16,7 @@ struct CharTraits;
 /// UTF-8, RFC 3629, but in the wider form that goes by lead bytes alone: overlong forms, surrogates and code points up
 /// to 0x1FFFFF pass through.
 template <>
-struct KERNEL_API CharTraits<TEncUtf8> : BaseCharTraits<char>
+struct KERNEL_API CharTraits<TEncUtf8> : BaseCharTraits<char>, CodePointTraits<TEncUtf8>
 {
     static constexpr TEncUtf8 Enc{}; ///< Tag value.
 
@@ -103,7 +104,7 @@ private:
 
 /// UTF-16, RFC 2781, in the machine's byte order.
 template <>
-struct KERNEL_API CharTraits<TEncUtf16> : BaseCharTraits<char16_t>
+struct KERNEL_API CharTraits<TEncUtf16> : BaseCharTraits<char16_t>, CodePointTraits<TEncUtf16>
 {
     static constexpr TEncUtf16 Enc{}; ///< Tag value.
 
@@ -157,7 +158,7 @@ struct KERNEL_API CharTraits<TEncUtf16> : BaseCharTraits<char16_t>
 
 /// UTF-32, in the machine's byte order: each unit is a code point.
 template <>
-struct KERNEL_API CharTraits<TEncUtf32> : BaseCharTraits<unsigned int>
+struct KERNEL_API CharTraits<TEncUtf32> : BaseCharTraits<unsigned int>, CodePointTraits<TEncUtf32>
 {
     static constexpr TEncUtf32 Enc{}; ///< Tag value.
 
