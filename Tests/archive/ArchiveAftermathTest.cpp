@@ -1,6 +1,7 @@
 #include "libkernel/archive/ArchiveExceptions.h"
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/FileStorePostSaveInterface.h"
+#include "libkernel/filesystem/TempFile.h"
 #include "support/ArchiveFixture.h"
 #include "support/FaultyFiles.h"
 #include "support/TempFolder.h"
@@ -137,6 +138,53 @@ TEST_F(ArchiveAftermathTest, EnumerationSessionNamesWhatItemsNameAndWritesNothin
     EXPECT_EQ(handle->GetEnumeratedPaths(), (std::set<String8>{Str("root"), Str("root/part")}));
     archive->CloseSession(handle, false);
     EXPECT_EQ(ReadWhole(m_path), before);
+}
+
+TEST_F(ArchiveAftermathTest, GuardWhoseStepOnlySeemedToFailIsStillOurs)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    ArchiveSessionHandle handle;
+    {
+        // All bytes that matter arrive, each time.
+        TestSupport::FaultyFiles files;
+        files.Plan({.call = TestSupport::FileCall::Write,
+                    .forEver = true,
+                    .error = EIO,
+                    .part = TestSupport::Fault::Part::AllButOne});
+        EXPECT_EQ(archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
+                  Archive::SessionFileUnusable);
+    }
+    EXPECT_EQ(archive->GetLastRestoreResult(), Archive::RestoreGuardUnwritable);
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+    // A step that is not ours is still seen.
+    WriteWhole(m_path, ReadWhole(m_path).replace(68, 1, "\x7F"));
+    EXPECT_EQ(archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
+              Archive::SessionFileUnusable);
+    EXPECT_EQ(archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
+}
+
+TEST(ArchiveMoveTest, FileThatHasMovedIsUsedWhereItIsThoughItsFolderCannotBeFlushed)
+{
+    TestSupport::TempFolder const folder;
+    std::filesystem::create_directory(folder / "temp");
+    TempFile::SetTempPath(Str(folder / "temp"));
+    ASSERT_TRUE(Save(*CreateDocument(folder / "from"), {{"a", "1"}}));
+    TestSupport::FaultyFiles files;
+    files.Plan({.call = TestSupport::FileCall::FlushFolder, .forEver = true, .error = EIO});
+    Archive::OpenResult opened{};
+    Counted<Archive> archive = Archive::OpenMigrate(Str(folder / "from"), Str(folder / "to"), c_documentTag, opened);
+    ASSERT_TRUE(archive);
+    Archive::CreateResult created;
+    ASSERT_TRUE(archive->AddScratchFile(Str(folder / "scratch"), created));
+    EXPECT_EQ(archive->MigratePrepare(Str(folder / "moved")), Archive::MigrateDone);
+    EXPECT_EQ(archive->MigrateRestore(Str(folder / "moved")), Archive::OpenOk);
+    EXPECT_EQ(Get(*archive, "a"), "1");
+    archive = nullptr;
+    archive = OpenDocument(folder / "to");
+    EXPECT_EQ(archive->CaptureToThrowaway(), Archive::CaptureDone);
+    EXPECT_EQ(Get(*archive, "a"), "1");
+    archive = nullptr;
+    TempFile::SetTempPath(String8());
 }
 
 TEST(ArchiveMoveTest, SaveThatIsInPlaceStaysThereWhenItsFolderCannotBeFlushed)

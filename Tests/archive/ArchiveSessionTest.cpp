@@ -1,6 +1,8 @@
 #include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/filesystem/TempFile.h"
 #include "libkernel/streams/FileInOutStream.h"
 #include "libkernel/streams/OutStream.h"
+#include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
 #include "support/TempFolder.h"
 
@@ -345,6 +347,43 @@ TEST_F(ArchiveSessionTest, HolderRestingOnAScratchRevisionMovesWithItsBytes)
     JailCounted<FileStoreItem> item;
     ASSERT_TRUE(old->GetItemBase(item) && item);
     EXPECT_EQ(dynamic_cast<BytesItem&>(*item).bytes, "old bytes");
+}
+
+TEST_F(ArchiveSessionTest, HolderOfAnOlderVersionOutlivesAScratchFrontThatGrows)
+{
+    TestSupport::TempFolder const copies;
+    TempFile::SetTempPath(Str(copies.GetPath()));
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"img", "old bytes"}}, true));
+    Counted<DelayLoadHolder> old = m_archive->CreateDelayLoadHolderDirect(Str("img"), &BytesItem::c_type, nullptr);
+    ASSERT_TRUE(Save(*m_archive, {{"img", "new bytes"}}, true));
+    m_archive->SetReferenceInfo(MakeCounted<ArchiveReferenceInfo>(Str(std::string(100, 'r'))));
+    ASSERT_TRUE(Save(*m_archive, {{"other", "1"}}));
+    EXPECT_FALSE(m_archive->IsBroken());
+    JailCounted<FileStoreItem> item;
+    ASSERT_TRUE(old->GetItemBase(item) && item);
+    EXPECT_EQ(dynamic_cast<BytesItem&>(*item).bytes, "old bytes");
+    EXPECT_EQ(Get(*m_archive, "img"), "new bytes");
+    Reopen(m_scratchPath);
+    old = nullptr;
+    Archive::PostShutdown();
+    TempFile::SetTempPath(String8());
+}
+
+TEST_F(ArchiveSessionTest, ScratchEntryThatNoRecordNamesIsNotRolledDown)
+{
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    Archive::FileState const state = StateOf(*m_archive);
+    m_archive = nullptr;
+    TestSupport::ArchiveBuilder scratch;
+    scratch.link = {state.saveTimeStamp.GetValue(), state.saveCount, m_path};
+    auto const details = scratch.AddBlock("nameless");
+    scratch.AddTable({.records = {{.uid = 77, .kind = 1, .details = details}}});
+    WriteWhole(m_scratchPath, scratch.Build());
+    Reopen(m_scratchPath);
+    ASSERT_TRUE(Save(*m_archive, {{"b", "2"}}));
+    Reopen(m_path);
+    EXPECT_EQ(GetAll(*m_archive), (std::map<std::string, std::string>{{"a", "1"}, {"b", "2"}}));
 }
 
 TEST_F(ArchiveSessionTest, ManyThreadsMayOfferFiles)

@@ -304,6 +304,26 @@ TEST_F(FileSystemMovesTest, PowerCutDuringAMoveLeavesOldOrNewContent)
     }
 }
 
+TEST_F(FileSystemMovesTest, MoveThatMayNotLastFailsButTellsThatItWasMade)
+{
+    FaultyFiles faults;
+    faults.Plan({.call = FileCall::FlushFolder, .forEver = true, .error = EIO});
+    bool isMade = false;
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0, &isMade), MoveResult::Failed);
+    EXPECT_TRUE(isMade);
+    EXPECT_FALSE(FileSystem::RenameFile(At("target"), At("third"), 0, &isMade));
+    EXPECT_TRUE(isMade);
+    EXPECT_EQ(Read("third"), "new content");
+    String8 out;
+    EXPECT_EQ(FileSystem::RenameFileForBackup(At("third"), out), FileSystem::RenameFileForBackupResult::Failed);
+    EXPECT_EQ(out, At("third_backup1"));
+    faults.Clear();
+    faults.Plan({.call = FileCall::Rename, .forEver = true, .error = EIO});
+    EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("third_backup1"), At("old"), 0, &isMade), MoveResult::Failed);
+    EXPECT_FALSE(isMade);
+    EXPECT_EQ(Read("third_backup1"), "new content");
+}
+
 TEST_F(FileSystemMovesTest, BackupTakesTheFirstFreeNumber)
 {
     String8 out;

@@ -499,6 +499,7 @@ private:
     Counted<AccessBlockAdorner> const m_adorner;
     bool const m_wasBroken;
     bool m_silent = false;
+    bool m_wantsWriteAccess = false; // As the adorner said when the block began. Guarded by the access lock.
 };
 
 /// Told how copying data out of the file goes. Calls come on a background thread, one at a time.

@@ -47,7 +47,7 @@ void ArchiveImpl::EndAccessBlock(Archive::AccessBlock const& block)
             exclusive = m_exclusiveWait;
             m_exclusiveWait = nullptr;
         }
-        if (block.GetAdorner() && block.GetAdorner()->WantsWriteAccess() && m_writeBlocks > 0) --m_writeBlocks;
+        if (block.m_wantsWriteAccess) --m_writeBlocks;
         m_wantsWriteAccess = m_writeBlocks > 0;
     }
     if (exclusive) exclusive->Signal();
@@ -68,6 +68,7 @@ Counted<Archive::AccessBlock> Archive::CreateAccessBlock(Counted<AccessBlockAdor
     if (!block) return nullptr;
     ++m->m_accessCount;
     if (adorner && adorner->WantsWriteAccess()) {
+        block->m_wantsWriteAccess = true;
         ++m->m_writeBlocks;
         m->m_wantsWriteAccess = true;
     }
@@ -374,7 +375,8 @@ bool ArchiveImpl::FitsWhatIsHeld(Archive::ArchiveFile& file)
     u32 const tag = LoadLittleEndian<u32>(guard);
     u32 const counter = LoadLittleEndian<u32>(guard + 4);
     if (tag != c_tagGuard && tag != c_tagBlock) return false;
-    if (m_keepOpen ? counter != file.m_writeCounter : counter < file.m_writeCounter) return false;
+    if (file.AdoptOwnCounter(counter)) return true;
+    if (m_keepOpen || counter < file.m_writeCounter) return false;
     file.m_writeCounter = counter;
     return true;
 }

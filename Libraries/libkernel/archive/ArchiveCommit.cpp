@@ -42,6 +42,7 @@ private:
     Archive::FileRevision const* FindEarlier(Archive::FileInfo const& info) const;
     void WriteTable();
     void ReserveMemory();
+    bool WillDrop(Archive::Revision const& revision) const { return !m_file.m_isScratch && revision.IsScratch(); }
     void Publish();
     void RaiseVersion();
     void WriteThumbnails();
@@ -68,7 +69,9 @@ private:
 
     u64 m_fatPos = 0;
     Archive::ArchiveInfo m_info;
-    ArchivePathMap m_nodes; // New paths, to be merged in without a failure being possible.
+    // New paths and the new revision, to be merged in without a failure being possible.
+    ArchivePathMap m_nodes;
+    ArchiveRevisionMap m_revisionNode;
     std::set<String8> m_deletedPaths;
     std::set<Archive::FileInfo const*> m_rolledDown;
     std::vector<Counted<Archive::Revision>> m_droppedRevisions;
@@ -97,11 +100,15 @@ void ArchiveCommit::Run(bool updateTimestamps)
         if (updateTimestamps && touches && m_file.m_stream) m_file.m_stream->UpdateTimestamps();
         CopyFields();
     }
-    if (clearsScratch) ClearScratch();
     AddRevision();
     TellObjects();
-    if (clearsScratch) DropScratchRevisions();
-    QueueForOfflining();
+    // Behind the holders, which take what they need from the scratch file's old blocks: a front that has grown, by the
+    // master's path or by a reference path, writes over the first of them.
+    if (clearsScratch) {
+        ClearScratch();
+        DropScratchRevisions();
+    }
+    Attempt([this] { QueueForOfflining(); });
     if (!m_file.m_finalPath.IsEmpty()) Attempt([this] { m_impl.MoveTemporary(m_file); });
     if (m_failure) std::rethrow_exception(m_failure);
 }
@@ -157,7 +164,10 @@ void ArchiveCommit::RollDownScratch()
         std::set<Archive::FileInfo const*> seen;
         for (size_t i = m_impl.m_revisions.size(); i-- > 0 && m_impl.m_revisions[i]->IsScratch();)
             for (Archive::FileRevision const& entry : m_impl.m_revisions[i]->GetEntries())
-                if (!m_revision.Find(*entry.info) && seen.insert(entry.info.Get()).second) sources.push_back({entry});
+                // A file that no record names can't be found in the master either.
+                if (!entry.info->GetPath().IsEmpty() && !m_revision.Find(*entry.info) &&
+                    seen.insert(entry.info.Get()).second)
+                    sources.push_back({entry});
     }
     Counted<FileInOutStream> const from = m_impl.m_scratch->GetStream();
     try {
@@ -290,7 +300,13 @@ void ArchiveCommit::ReserveMemory()
     if (paths.size() + fresh > room) paths.reserve(2 * (paths.size() + fresh));
     std::vector<Counted<Archive::Revision>>& revisions = m_impl.m_revisions;
     if (revisions.size() == revisions.capacity()) revisions.reserve(std::max<size_t>(2 * revisions.size(), 8));
-    m_impl.m_staleScratch.reserve(m_impl.m_staleScratch.size() + revisions.size());
+    m_impl.m_revisionsByAddress.reserve(revisions.size() + 1);
+    m_revisionNode.emplace(&m_revision, &m_revision);
+    // Those of the scratch file stand last.
+    size_t dropped = 0;
+    while (dropped < revisions.size() && WillDrop(*revisions[revisions.size() - 1 - dropped])) ++dropped;
+    m_droppedRevisions.reserve(dropped);
+    m_impl.m_staleScratch.reserve(m_impl.m_staleScratch.size() + dropped);
 }
 
 void ArchiveCommit::Publish()
@@ -334,6 +350,7 @@ void ArchiveCommit::WriteThumbnails()
     try {
         written = TryWriteThumbnails();
     } catch (Exception const&) {
+    } catch (std::bad_alloc const&) {
     }
     if (!written) return;
     m_file.m_thumbnailsPos = m_revision.m_fileEnd;
@@ -416,6 +433,7 @@ bool ArchiveCommit::ClearScratch()
                   scratch.m_stream->ForceFlush() && !scratch.m_stream->IsBroken();
         if (cleared) m_impl.SetFreshFields(scratch, fresh);
     } catch (Exception const&) {
+    } catch (std::bad_alloc const&) {
     }
     if (!cleared) {
         CriticalSectionScope const lock(m_impl.m_stateLock);
@@ -436,10 +454,8 @@ void ArchiveCommit::AddRevision()
     for (Archive::FileRevision const& entry : m_revision.GetEntries())
         const_cast<Archive::FileInfo&>(*entry.info).m_history.push_back(&m_revision);
     m_impl.m_revisions.emplace_back(&m_revision);
-    m_impl.m_revisionsByAddress.emplace(&m_revision, &m_revision);
-    if (m_file.m_isScratch) return;
-    // Those of the scratch file stand last, before the new one.
-    for (size_t i = m_impl.m_revisions.size() - 1; i-- > 0 && m_impl.m_revisions[i]->IsScratch();)
+    m_impl.m_revisionsByAddress.merge(m_revisionNode);
+    for (size_t i = m_impl.m_revisions.size() - 1; i-- > 0 && WillDrop(*m_impl.m_revisions[i]);)
         m_droppedRevisions.push_back(m_impl.m_revisions[i]);
 }
 
@@ -450,18 +466,21 @@ void ArchiveCommit::TellObjects()
                                                                  : FileStoreStateObject::DirtyStateClean;
     if (!IsExport()) {
         for (auto const& object : m.objectsToClean) Attempt([&] { store.ClearObjectDirtyState(*object, state); });
-        for (auto const& [holder, path] : m.holderPaths) store.SetDelayLoadOwner(holder, &m_revision, path);
+        for (auto const& [holder, path] : m.holderPaths)
+            Attempt([&, &to = holder, &at = path] { store.SetDelayLoadOwner(to, &m_revision, at); });
         for (auto const& item : m.savedItems)
             Attempt([&] { store.ClearObjectDirtyState(const_cast<FileStoreItem&>(*item), state); });
         for (auto const& object : m.postSaves) Attempt([&] { object->PostSave(); });
-        store.RemoveDirtyStates(m_deletedPaths);
+        Attempt([&] { store.RemoveDirtyStates(m_deletedPaths); });
     }
     // The links move even where no object is told: a holder must not rest on a revision that is about to go.
     if (!m_droppedRevisions.empty()) {
-        std::set<NonCounted<FileStoreRevision const>> dropped;
-        for (Counted<Archive::Revision> const& revision : m_droppedRevisions) dropped.insert(revision);
-        MoveHolders();
-        Attempt([&] { store.RemoveDelayLoadLinks(dropped); });
+        Attempt([this] { MoveHolders(); });
+        Attempt([&] {
+            std::set<NonCounted<FileStoreRevision const>> dropped;
+            for (Counted<Archive::Revision> const& revision : m_droppedRevisions) dropped.insert(revision);
+            store.RemoveDelayLoadLinks(dropped);
+        });
     }
     if (!IsExport()) store.RelinkFileStoreAssociations();
     CriticalSectionSpinScope const lock(m.lock);

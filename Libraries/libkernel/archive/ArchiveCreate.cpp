@@ -209,7 +209,8 @@ Counted<Archive> ArchiveImpl::CreateWithTemporaryInner(String8 const& path, IDTa
     Counted<FileInOutStream> target =
         FileInOutStream::Open(path.GetData(), File::ShareMode::DenyWrite, unmanaged, &text);
     int value = static_cast<int>(unmanaged);
-    if (!target && value == 2) {
+    bool const makesTarget = !target && value == 2;
+    if (makesTarget) {
         target = CreateStream(path, true, unmanaged, &text);
         value = static_cast<int>(unmanaged);
     }
@@ -222,7 +223,12 @@ Counted<Archive> ArchiveImpl::CreateWithTemporaryInner(String8 const& path, IDTa
         Code const code = MapCreateResult(unmanaged);
         return Failed(result, code, code == Code::CouldNotCreate ? text : String8());
     }
-    return CreateTemporaryArchiveInner(path, tag, result, marshalled, adjacent, target);
+    Counted<Archive> const archive = CreateTemporaryArchiveInner(path, tag, result, marshalled, adjacent, target);
+    if (archive)
+        archive->m->m_master->m_madeTarget = makesTarget;
+    else if (makesTarget)
+        FileSystem::Delete(path, 0);
+    return archive;
 }
 
 Counted<Archive> ArchiveImpl::CreateTemporaryArchiveInner(String8 const& target, IDTag tag,

@@ -37,7 +37,10 @@ Archive::MigrateResult Archive::MigratePrepare(String8 const& newPath)
         CriticalSectionScope const lock(m->m_stateLock);
         scratch = m->m_scratch;
     }
-    if (!FileSystem::SafeMoveFile(scratch->m_path, newPath)) {
+    // Moved is moved, even if a power cut may take it back: under either name the file is whole.
+    bool isMoved = false;
+    (void)FileSystem::SafeMoveFileAdv(scratch->m_path, newPath, 0, &isMoved);
+    if (!isMoved) {
         bool reopened = false;
         return m->OpenFileHandleCS(reopened, true, true) == RestoreOk ? MigrateMoveFailed : MigrateLost;
     }
@@ -56,28 +59,20 @@ Archive::OpenResult Archive::MigrateRestore(String8 const& path)
 {
     CriticalSectionScope const sessionLock(m->m_sessionLock);
     if (m->IsBusyCSSession()) return OpenInUse;
-    Counted<ArchiveFile> oldMaster;
-    Counted<ArchiveFile> oldScratch;
+    OpenMode mode = OpenModeReadWrite;
+    bool hadMaster = false;
     {
-        CriticalSectionScope const accessLock(m->m_accessLock);
-        m->CloseFilesCS();
-        m->m_lastRestore = RestoreOk;
         CriticalSectionScope const lock(m->m_stateLock);
-        oldMaster = m->m_master;
-        oldScratch = m->m_scratch;
-        m->m_master = nullptr;
-        m->m_scratch = nullptr;
+        // Only an archive that holds nothing can load it all again: revisions that are in use must not be replaced.
+        if (!m->m_scratch || !m->m_scratch->m_moved) return OpenInUse;
+        hadMaster = static_cast<bool>(m->m_master);
+        if (hadMaster) mode = m->m_master->m_mode;
     }
-    OpenMode const mode = oldMaster ? oldMaster->m_mode : OpenModeReadWrite;
-    OpenResult const result = m->InitArchive(path, mode, nullptr, nullptr);
-    CriticalSectionScope const lock(m->m_stateLock);
-    if (result != OpenOk) {
-        // Still moved away, as before the call.
-        m->m_master = oldMaster;
-        m->m_scratch = oldScratch;
-        return result;
-    }
-    if (!oldMaster) m->MakeJustScratch();
+    // After a failure the archive is moved away as before.
+    OpenResult const result = m->InitArchive(path, mode, nullptr, nullptr, !hadMaster);
+    if (result != OpenOk) return result;
+    CriticalSectionScope const accessLock(m->m_accessLock);
+    m->m_lastRestore = RestoreOk;
     return OpenOk;
 }
 
@@ -167,7 +162,8 @@ Archive::CaptureResult Archive::CaptureToThrowaway()
         CriticalSectionScope const lock(m->m_stateLock);
         master = m->m_master;
     }
-    bool const moved = master && FileSystem::SafeMoveFile(master->m_path, path);
+    bool moved = false;
+    if (master) (void)FileSystem::SafeMoveFileAdv(master->m_path, path, 0, &moved);
     if (moved) {
         CriticalSectionScope const lock(m->m_stateLock);
         master->m_path = path;

@@ -52,13 +52,14 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
         backup = file.m_backupPath;
     else if (file.m_keepBackup && FileSystem::Exists(final))
         backup = FindBackupName(final);
-    // A rename can be refused after it was made, when its folder cannot be flushed: what lies where is what counts.
-    if (!backup.IsEmpty() && !FileSystem::RenameFile(final, backup, c_renameRetries) && FileSystem::Exists(final))
-        backup = String8();
+    // What lies where is what counts here, whether or not it is known to last.
+    bool isBackup = false;
+    if (!backup.IsEmpty()) FileSystem::RenameFile(final, backup, c_renameRetries, &isBackup);
+    if (!isBackup) backup = String8();
 
-    FileSystem::SafeMoveFileResult const moved = FileSystem::SafeMoveFileAdv(file.m_path, final, 0);
-    bool const isThere = FileSystem::Exists(final) && !FileSystem::Exists(file.m_path);
-    if (static_cast<int>(moved) != 0 && !isThere) {
+    bool isThere = false;
+    FileSystem::SafeMoveFileResult const moved = FileSystem::SafeMoveFileAdv(file.m_path, final, 0, &isThere);
+    if (!isThere) {
         if (!backup.IsEmpty()) FileSystem::RenameFile(backup, final, c_renameRetries);
         // The temporary holds the save and stays usable where it is.
         File::OpenUnmanagedResult result{};

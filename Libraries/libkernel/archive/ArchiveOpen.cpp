@@ -175,14 +175,16 @@ Archive::OpenResult ArchiveImpl::TestForReadOnlyArchive(String8 const& path, IDT
 // Follows the chain of links from the file that was asked for to its master. Each file that names a further one moves
 // to the scratch slot, so the chain can have two files at most.
 Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mode, Counted<FileInOutStream> stream,
-                                             Counted<ArchiveReferenceInfo> const& referenceInfo)
+                                             Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch)
 {
     if (path.IsEmpty()) return Archive::OpenBadPath;
     ArchiveLoadData data;
+    Counted<Archive::ArchiveFile> master;
+    Counted<Archive::ArchiveFile> scratch;
     bool linked = false;
     try {
         while (!path.IsEmpty()) {
-            if (m_scratch) return Archive::OpenNotArchive;
+            if (scratch) return Archive::OpenNotArchive;
             bool fallback = false;
             if (!stream) {
                 Unmanaged unmanaged{};
@@ -203,16 +205,16 @@ Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mod
             file->m_readOnly = mode == Archive::OpenModeReadOnly;
             file->m_readOnlyFallback = fallback;
             stream = nullptr;
-            if (m_master) {
-                m_master->BecomeScratch();
-                m_scratch = m_master;
+            if (master) {
+                master->BecomeScratch();
+                scratch = master;
             }
-            m_master = file;
+            master = file;
             if (Archive::OpenResult const result = ArchiveLoader::LoadArchiveFile(*file, m_archiveUID, data))
                 return result;
             if (!linked) m_archiveUID = file->m_archiveUID;
 
-            if (!m_scratch && referenceInfo) {
+            if (!scratch && referenceInfo) {
                 file->m_referenceInfo = referenceInfo;
                 path = referenceInfo->GetPath();
                 data.testLink = false;
@@ -224,7 +226,11 @@ Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mod
             }
             linked = true;
         }
-        TakeOver(data);
+        if (asScratch && !scratch) {
+            master->BecomeScratch();
+            std::swap(master, scratch);
+        }
+        TakeOver(data, std::move(master), std::move(scratch));
         return Archive::OpenOk;
     } catch (FileIOException const& e) {
         return e.GetReason() == FileIOException::Reason::AccessDenied ? Archive::OpenAccessDenied
@@ -234,10 +240,13 @@ Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mod
     }
 }
 
-void ArchiveImpl::TakeOver(ArchiveLoadData& data)
+void ArchiveImpl::TakeOver(ArchiveLoadData& data, Counted<Archive::ArchiveFile> master,
+                           Counted<Archive::ArchiveFile> scratch)
 {
     ArchiveLoader::LinkHistories(data);
     CriticalSectionScope const lock(m_stateLock);
+    std::swap(m_master, master); // The old ones end outside the lock.
+    std::swap(m_scratch, scratch);
     m_paths = std::move(data.paths);
     m_revisions = std::move(data.revisions);
     m_pathCounts = std::move(data.pathCounts);
@@ -275,8 +284,7 @@ Counted<Archive> Archive::Open(String8 const& path, OpenMode mode, IDTag tag, Op
 Counted<Archive> Archive::OpenAsScratch(String8 const& path, IDTag tag, OpenResult& result)
 {
     Counted<Archive> const archive = ArchiveImpl::MakeArchive(tag);
-    OpenResult const opened = archive->m->InitArchive(path, OpenModeReadWrite, nullptr, nullptr);
-    if (opened == OpenOk) archive->m->MakeJustScratch();
+    OpenResult const opened = archive->m->InitArchive(path, OpenModeReadWrite, nullptr, nullptr, true);
     return Finish(archive, opened, result);
 }
 
@@ -337,7 +345,7 @@ Counted<Archive> Archive::OpenAsThrowaway(FragmentedRawData const& data, IDTag t
         }
         Counted<Archive> const archive = ArchiveImpl::MakeArchive(tag);
         OpenResult const opened = archive->m->InitArchive(path, OpenModeReadWrite, stream, nullptr);
-        if (archive->m->m_master)
+        if (opened == OpenOk)
             archive->m->m_master->m_throwAway = true;
         else
             FileSystem::Delete(path, 0);
@@ -367,12 +375,20 @@ bool WriteWholeFile(String8 const& path, void const* data, u64 size)
     return false;
 }
 
+/// A file that has gone to its new place is opened there, whether or not a power cut may take it back.
+bool MoveToOpen(String8 const& from, String8 const& to)
+{
+    bool isMoved = false;
+    (void)FileSystem::SafeMoveFileAdv(from, to, 0, &isMoved);
+    return isMoved;
+}
+
 } // namespace
 
 Counted<Archive> Archive::OpenMigrate(String8 const& from, String8 const& to, IDTag tag, OpenResult& result)
 {
     result = OpenMoveFailed;
-    if (!FileSystem::SafeMoveFile(from, to)) return nullptr;
+    if (!MoveToOpen(from, to)) return nullptr;
     return Open(to, OpenModeReadWrite, tag, result);
 }
 
@@ -387,7 +403,7 @@ Counted<Archive> Archive::OpenMigrateAsScratch(String8 const& from, String8 cons
                                                Counted<ArchiveReferenceInfo> const& referenceInfo, OpenResult& result)
 {
     result = OpenMoveFailed;
-    if (!FileSystem::SafeMoveFile(from, to)) return nullptr;
+    if (!MoveToOpen(from, to)) return nullptr;
     Counted<Archive> const archive = OpenAsScratch(to, tag, result);
     if (archive && referenceInfo) archive->SetReferenceInfo(referenceInfo);
     return archive;

@@ -45,8 +45,9 @@ ArchiveImpl::GuardResult ArchiveImpl::PassWriteGuard(Archive::ArchiveFile& file,
     }
     u32 const tag = LoadLittleEndian<u32>(guard);
     if (tag != c_tagGuard && !(acceptBlockTag && tag == c_tagBlock)) return GuardResult::WrongTag;
-    if (LoadLittleEndian<u32>(guard + 4) != file.m_writeCounter) return GuardResult::WrongCounter;
+    if (!file.AdoptOwnCounter(LoadLittleEndian<u32>(guard + 4))) return GuardResult::WrongCounter;
     StoreLittleEndian(guard + 4, file.m_writeCounter + 1);
+    file.m_guardMayBeAhead = true;
     try {
         if (file.m_stream->WriteAt(c_guardPos, guard, sizeof(guard)) != sizeof(guard) || !file.m_stream->Flush())
             return GuardResult::Unwritable;
@@ -54,6 +55,7 @@ ArchiveImpl::GuardResult ArchiveImpl::PassWriteGuard(Archive::ArchiveFile& file,
         return GuardResult::Unwritable;
     }
     ++file.m_writeCounter;
+    file.m_guardMayBeAhead = false;
     return GuardResult::Ok;
 }
 
@@ -61,23 +63,24 @@ Archive::CreateSessionResult ArchiveImpl::CreateSessionI(ArchiveSessionHandle& h
                                                          Archive::ArchiveChoice choice, bool const* abort,
                                                          bool skipExclusiveWait)
 {
-    Counted<MultiSemaphore> exclusive;
-    if (!skipExclusiveWait) {
-        CriticalSectionScope const lock(m_accessLock);
-        exclusive = m_exclusiveWait;
-    }
-    if (exclusive) exclusive->Wait(0);
     for (;;) {
-        bool suspended = false;
-        Archive::CreateSessionResult const result = TryCreateSession(handle, type, choice, abort, suspended);
-        if (!suspended) return result;
+        bool mustWait = false;
+        Archive::CreateSessionResult const result =
+            TryCreateSession(handle, type, choice, abort, skipExclusiveWait, mustWait);
+        if (!mustWait) return result;
         WaitWhileSuspended();
+        Counted<MultiSemaphore> exclusive;
+        if (!skipExclusiveWait) {
+            CriticalSectionScope const lock(m_accessLock);
+            exclusive = m_exclusiveWait;
+        }
+        if (exclusive) exclusive->Wait(0);
     }
 }
 
 Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle& handle, Archive::SessionType type,
                                                            Archive::ArchiveChoice choice, bool const* abort,
-                                                           bool& suspended)
+                                                           bool ignoreExclusive, bool& mustWait)
 {
     CriticalSectionScope const sessionLock(m_sessionLock);
     if (handle.IsValid()) return Archive::SessionHandleInUse;
@@ -104,8 +107,9 @@ Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle&
         if (file) {
             {
                 CriticalSectionScope const lock(m_accessLock);
-                suspended = m_suspended;
-                if (suspended) return Archive::SessionNoMemory;
+                // Asked where the block is taken: an exclusive one may have begun since the last wait.
+                mustWait = m_suspended || (m_exclusiveWait && !ignoreExclusive);
+                if (mustWait) return Archive::SessionNoMemory;
                 state->access = m_self.CreateAccessBlock(m_self.CreateUpgradeableAccessBlockAdorner());
             }
             if (!state->access) return Archive::SessionNoMemory;

@@ -176,10 +176,11 @@ bool FileSystem::DeleteFilesFromFolder(String8 const& path)
     return true;
 }
 
-bool FileSystem::RenameFile(String8 const& from, String8 const& to, int retries)
+bool FileSystem::RenameFile(String8 const& from, String8 const& to, int retries, bool* isRenamed)
 {
     int const error = Try(
         retries, [&] { return GetFileCalls().rename(ToSystem(from), ToSystem(to)); }, MayPassOrIsInUse);
+    if (isRenamed) *isRenamed = error == 0;
     return error == 0 && FlushNames(from, to) == 0;
 }
 
@@ -188,8 +189,9 @@ FileSystem::RenameFileForBackupResult FileSystem::RenameFileForBackup(String8 co
     for (u32 n = 1;; ++n) {
         String8 const candidate = Format("%1_backup%2", path, n);
         if (FileDetail::IsTaken(candidate)) continue;
-        SafeMoveFileResult const result = SafeMoveFileAdv(path, candidate, 0);
-        if (result == SafeMoveFileResult::Moved) out = candidate;
+        bool isMoved = false;
+        SafeMoveFileResult const result = SafeMoveFileAdv(path, candidate, 0, &isMoved);
+        if (isMoved) out = candidate;
         return result <= SafeMoveFileResult::DiskFull ? static_cast<RenameFileForBackupResult>(result)
                                                       : RenameFileForBackupResult::Failed;
     }
@@ -200,8 +202,12 @@ bool FileSystem::SafeMoveFile(String8 const& from, String8 const& to)
     return SafeMoveFileAdv(from, to, 0) == SafeMoveFileResult::Moved;
 }
 
-FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, String8 const& to, int retries)
+FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, String8 const& to, int retries,
+                                                           bool* isMoved)
 {
+    bool unused;
+    bool& moved = isMoved ? *isMoved : unused;
+    moved = false;
     auto const logMoveError = [&](int error) {
         WriteToLog(c_logLevel, Format("SafeMoveFile error: MoveFileExW failed with code %1!\n\tOld: %2\n\tNew: %3",
                                       error, from, to));
@@ -213,7 +219,8 @@ FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, 
     }
     int error = Try(
         retries, [&] { return GetFileCalls().rename(ToSystem(from), ToSystem(to)); }, MayPass);
-    if (error == 0) {
+    moved = error == 0;
+    if (moved) {
         error = FlushNames(from, to);
         if (error == 0) return SafeMoveFileResult::Moved;
         logMoveError(error); // The source has gone: there is nothing to copy.
@@ -230,6 +237,7 @@ FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, 
                                       error, from, to));
         return ToMoveResult(error);
     }
+    moved = true;
     error = GetFileCalls().unlink(ToSystem(from));
     if (error != 0)
         WriteToLog(c_logLevel,

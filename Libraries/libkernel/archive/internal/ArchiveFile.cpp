@@ -12,9 +12,21 @@ Archive::ArchiveFile::~ArchiveFile()
     // target: it is the only copy of a save that was made, and stays.
     bool const neverSaved = !m_finalPath.IsEmpty() && m_firstFAT == 0;
     bool const remove = (m_throwAway || neverSaved) && !m_path.IsEmpty();
+    // The empty file that kept the target's name goes too, unless somebody has put something there.
+    bool const removeTarget = neverSaved && m_madeTarget && m_targetStream && FileSystem::GetFileSize(m_finalPath) == 0;
+    if (removeTarget) FileSystem::Delete(m_finalPath, 0);
     m_stream = nullptr;
     m_targetStream = nullptr;
     if (remove) FileSystem::Delete(m_path, 0);
+}
+
+bool Archive::ArchiveFile::AdoptOwnCounter(u32 found)
+{
+    bool const isOwn = found == m_writeCounter || (m_guardMayBeAhead && found == m_writeCounter + 1);
+    if (!isOwn) return false;
+    m_writeCounter = found;
+    m_guardMayBeAhead = false;
+    return true;
 }
 
 Counted<FileInOutStream> Archive::ArchiveFile::GetStream() const

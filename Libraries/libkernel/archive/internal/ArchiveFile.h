@@ -23,6 +23,9 @@ public:
     Counted<FileInOutStream> GetStream() const;
     /// Makes it the scratch file. Only while no other thread knows the object.
     void BecomeScratch();
+    /// True if the guard's counter on disk is the one this archive left there; m_writeCounter then is @p found. The
+    /// caller holds m_lock.
+    bool AdoptOwnCounter(u32 found);
 
     OpenMode m_mode;
     bool m_readOnly = false;
@@ -40,6 +43,7 @@ public:
     String8 m_finalPath;                     // Where the first commit moves a temporary; empty otherwise.
     String8 m_backupPath;                    // Where the replaced file goes; empty: a name of our own, if at all.
     bool m_keepBackup = false;
+    bool m_madeTarget = false; // The target was not there before it was reserved.
 
     u16 m_fileVersion = 0;
     u16 m_flags = 0;
@@ -52,6 +56,7 @@ public:
     u32 m_saveCount = 0;
     u32 m_nextFreeUID = 0;
     u32 m_writeCounter = 0;
+    bool m_guardMayBeAhead = false;      // The last step of the guard failed, yet its bytes may have arrived.
     std::atomic<u64> m_thumbnailsPos{0}; // 0: there are none.
     Archive::ArchiveInfo m_rawInfo;      // As the info block has it, for the comparison when the handle is reopened.
     bool m_hasLink = false;

@@ -25,6 +25,7 @@ struct ArchivePathCount
 };
 using ArchivePathCounts = std::map<std::pair<String8, String8>, ArchivePathCount>;
 using ArchivePathMap = std::unordered_map<String8, Counted<Archive::FileInfo>>;
+using ArchiveRevisionMap = std::unordered_map<FileStoreRevision const*, Archive::Revision*>;
 
 /// What is built up while the files of an archive are read; ArchiveLoader.cpp fills it.
 struct ArchiveLoadData
@@ -154,7 +155,7 @@ struct ArchiveImpl
     u64 m_offlineDone = 0;
     Counted<Semaphore> m_offlineWake;
     u64 m_nextRevisionOrder = 1;
-    std::unordered_map<FileStoreRevision const*, Archive::Revision*> m_revisionsByAddress; // Those of m_revisions.
+    ArchiveRevisionMap m_revisionsByAddress; // Those of m_revisions.
 
     std::atomic<bool> m_offlineAbort{false}; // Asks the offlining job to end.
 
@@ -169,10 +170,12 @@ struct ArchiveImpl
     static void Register(ArchiveImpl& impl);
     static void Unregister(ArchiveImpl& impl);
     static std::vector<Counted<Archive>> GetAll();
+    /// With @p asScratch a file that turns out to have no master goes to the scratch slot. After a failure the archive
+    /// is as it was.
     Archive::OpenResult InitArchive(String8 path, Archive::OpenMode mode, Counted<FileInOutStream> stream,
-                                    Counted<ArchiveReferenceInfo> const& referenceInfo);
-    void TakeOver(ArchiveLoadData& data);
-    /// A file that turned out to have no master moves to the scratch slot.
+                                    Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch = false);
+    void TakeOver(ArchiveLoadData& data, Counted<Archive::ArchiveFile> master, Counted<Archive::ArchiveFile> scratch);
+    /// Moves the only file of an archive that nobody else knows yet to the scratch slot.
     void MakeJustScratch();
     static Archive::OpenResult MapOpenResult(File::OpenUnmanagedResult result, bool linked);
     static Archive::OpenResult TestForReadOnlyArchive(String8 const& path, IDTag tag);
@@ -284,9 +287,11 @@ struct ArchiveImpl
     Archive::CreateSessionResult CreateSessionI(ArchiveSessionHandle& handle, Archive::SessionType type,
                                                 Archive::ArchiveChoice choice, bool const* abort,
                                                 bool skipExclusiveWait);
-    /// One try. With @p suspended the result means nothing: access is held back, and the caller waits without locks.
+    /// One try. With @p mustWait the result means nothing: access is held back, by a suspension or by an exclusive
+    /// block unless @p ignoreExclusive, and the caller waits without locks.
     Archive::CreateSessionResult TryCreateSession(ArchiveSessionHandle& handle, Archive::SessionType type,
-                                                  Archive::ArchiveChoice choice, bool const* abort, bool& suspended);
+                                                  Archive::ArchiveChoice choice, bool const* abort,
+                                                  bool ignoreExclusive, bool& mustWait);
     /// Where a session on the file begins to write.
     u64 FindSessionStart(Archive::ArchiveFile const& file);
     /// Opens the session's file and passes its write guard; false with the cause in m_lastRestore.
