@@ -47,6 +47,7 @@
 #include "libkernel/core/NumberText.h"
 #include "libkernel/core/RawData.h"
 #include "libkernel/core/SimpleParser.h"
+#include "libkernel/core/SourceLocation.h"
 #include "libkernel/core/String.h"
 #include "libkernel/core/TextTools.h"
 #include "libkernel/core/Trace.h"

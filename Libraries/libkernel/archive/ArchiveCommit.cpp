@@ -25,8 +25,8 @@ using namespace ArchiveFormat;
 class ArchiveCommit
 {
 public:
-    ArchiveCommit(ArchiveImpl& impl, ArchiveSession& session, ArchiveSession::State& state)
-        : m_impl(impl), m_session(session), m(state), m_file(*state.file), m_revision(*state.revision)
+    ArchiveCommit(ArchiveImpl& impl, ArchiveSession::State& state)
+        : m_impl(impl), m(state), m_file(*state.file), m_revision(*state.revision)
     {
     }
 
@@ -62,7 +62,6 @@ private:
     void PassGuard();
 
     ArchiveImpl& m_impl;
-    ArchiveSession& m_session;
     ArchiveSession::State& m;
     Archive::ArchiveFile& m_file;
     Archive::Revision& m_revision;
@@ -550,7 +549,7 @@ void ArchiveImpl::FinaliseActiveSessionCS(ArchiveSession& session, bool updateTi
     if (state.enumerationOnly || session.WasAborted() || !state.file) return;
     if (!state.file->GetStream()) return;
     try {
-        ArchiveCommit(*this, session, state).Run(updateTimestamps);
+        ArchiveCommit(*this, state).Run(updateTimestamps);
     } catch (FileIOException const& e) {
         ThrowFileException(*state.file, ArchiveFileException::FromFileIOReason(static_cast<int>(e.GetReason())));
     }

@@ -246,8 +246,9 @@ private:
     bool LoadTextsI(IDTag tag, std::vector<StringT<Enc>>& texts) const;
     template <class Enc>
     bool LoadTextsI(IDTag tag, StringT<Enc>* texts, u64 capacity, u64* stored) const;
-    template <class T>
-    static Counted<T> CastI(Serialisable* object);
+    // Object is Serialisable, which is complete only where this is used.
+    template <class T, class Object>
+    static Counted<T> CastI(Object* object);
     static bool IsJsonTextSafe(std::string_view text);
 
     // In a pool that outlives them. Const operations tear properties down.
@@ -354,8 +355,8 @@ bool InSerialiser::LoadFlagSet(IDTag tag, FlagSerialiser const& serialiser, F& f
     return true;
 }
 
-template <class T>
-Counted<T> InSerialiser::CastI(Serialisable* object)
+template <class T, class Object>
+Counted<T> InSerialiser::CastI(Object* object)
 {
     // The most derived class is what is asked for nearly always, and comparing that is far cheaper than the search.
     if constexpr (requires { static_cast<T*>(object); }) {

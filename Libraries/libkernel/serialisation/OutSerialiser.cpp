@@ -62,10 +62,10 @@ OutSerialiser::OutSerialiser(OutSerialiser& parent, ClassPropertiesBase const* d
 
 OutSerialiser::~OutSerialiser() = default;
 
-void OutSerialiser::Fail(int code, std::source_location where) const
+void OutSerialiser::Fail(int code, SourceLocation where) const
 {
     if (code == SaveException::ShortWrite) m_objects.MarkAsHandlingException();
-    throw SaveException(where.file_name(), static_cast<int>(where.line()), code);
+    throw SaveException(where.file, where.line, code);
 }
 
 int OutSerialiser::CheckLengthI(u64 length) const

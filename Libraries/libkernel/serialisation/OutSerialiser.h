@@ -3,6 +3,7 @@
 #include "libkernel/core/Countable.h"
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/NestingGuard.h"
+#include "libkernel/core/SourceLocation.h"
 #include "libkernel/core/String.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
 #include "libkernel/serialisation/FlagSerialiser.h"
@@ -17,7 +18,6 @@
 #include <memory>
 #include <optional>
 #include <ranges>
-#include <source_location>
 #include <type_traits>
 #include <vector>
 
@@ -369,7 +369,7 @@ private:
     static Advice const s_noAdvice;
     Advice& GetOwnAdvice();
 
-    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current()) const;
+    [[noreturn]] void Fail(int code, SourceLocation where = SourceLocation::Current()) const;
     u8* ClaimI(u64 count);
     void PutI(void const* bytes, u64 count);
     u8* PutHeaderI(IDTag tag, u8 type, u64 more);

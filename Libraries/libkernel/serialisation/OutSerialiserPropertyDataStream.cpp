@@ -36,7 +36,7 @@ OutSerialiserPropertyDataStream::~OutSerialiserPropertyDataStream()
     m_out.m_isChildActive = false;
 }
 
-void OutSerialiserPropertyDataStream::Fail(int code, std::source_location where) const
+void OutSerialiserPropertyDataStream::Fail(int code, SourceLocation where) const
 {
     m_out.Fail(code, where);
 }

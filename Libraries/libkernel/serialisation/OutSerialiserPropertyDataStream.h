@@ -1,6 +1,7 @@
 #pragma once
 
 #include "libkernel/core/IDTag.h"
+#include "libkernel/core/SourceLocation.h"
 #include "libkernel/core/String.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
 #include "libkernel/serialisation/OutSerialiser.h"
@@ -8,7 +9,6 @@
 
 #include <deque>
 #include <ranges>
-#include <source_location>
 #include <vector>
 
 namespace Kernel {
@@ -106,7 +106,7 @@ public:
     void AppendI(void const* bytes, u64 size);
 
 private:
-    [[noreturn]] void Fail(int code, std::source_location where = std::source_location::current()) const;
+    [[noreturn]] void Fail(int code, SourceLocation where = SourceLocation::Current()) const;
     bool StartValueI() const;
     void CheckTypeI(PropType type, u64 size) const;
     void SaveBoolI(bool value);

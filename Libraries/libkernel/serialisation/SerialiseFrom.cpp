@@ -1,6 +1,7 @@
 #include "libkernel/serialisation/SerialiseFrom.h"
 
 #include "libkernel/serialisation/InSerialiserFile.h"
+#include "libkernel/serialisation/SharedSerialisable.h"
 #include "libkernel/streams/FastFileInStream.h"
 #include "libkernel/streams/FileInStream.h"
 #include "libkernel/streams/ZipInStream.h"

@@ -25,11 +25,11 @@ DefaultTable::DefaultTable(ClassPropertiesBase const& description)
 {
     for (auto const* level = &description; level; level = level->GetParentClassProperties())
         for (auto const& [tag, item] : level->GetDefaults()) m_rows.push_back(MakeRow(*item));
-    std::ranges::stable_sort(m_rows, {}, &Row::tag);
+    std::stable_sort(m_rows.begin(), m_rows.end(), [](Row const& a, Row const& b) { return a.tag < b.tag; });
     // A reader takes the nearest default of a tag. A value that only equals one further up, which a class on the way
     // replaces, would come back as another if it were left out.
-    auto const further = std::ranges::unique(m_rows, {}, &Row::tag);
-    m_rows.erase(further.begin(), further.end());
+    auto const isFurther = [](Row const& a, Row const& b) { return a.tag == b.tag; };
+    m_rows.erase(std::unique(m_rows.begin(), m_rows.end(), isFurther), m_rows.end());
 }
 
 } // namespace Kernel
