@@ -1,0 +1,143 @@
+#include "libkernel/text/LocalisedString.h"
+
+#include "libkernel/serialisation/FutureVersionException.h"
+#include "libkernel/serialisation/InSerialiserFile.h"
+#include "libkernel/text/StringLocaliser.h"
+#include "text/TextSaving.h"
+
+namespace Kernel::Test {
+namespace {
+
+/// Answers "sail" with "voile", "hull" with an empty text and anything else with context, bar and base.
+String8 Translate(String8 const& base, String8 const& context)
+{
+    if (base == "sail") return "voile";
+    return base == "hull" ? String8() : context + "|" + base;
+}
+
+class LocalisedStringTest : public testing::Test
+{
+protected:
+    LocalisedStringTest() { StringLocaliser::GetInstance().SetLocalisationSink(&Translate); }
+    ~LocalisedStringTest() override { StringLocaliser::GetInstance().SetLocalisationSink(nullptr); }
+
+    static LocalisedString Make(char const* base, char const* context = "Boat")
+    {
+        return LocalisedString::RecreateFromString(base, context);
+    }
+    static LocalisedString Fake(char const* text) { return LocalisedString::CreateFakeFromString(text); }
+};
+
+TEST_F(LocalisedStringTest, TextIsTranslatedOnceUntilItIsUntranslated)
+{
+    LocalisedString text = Make("mast");
+    EXPECT_EQ(text.ToString(), "Boat|mast");
+    StringLocaliser::GetInstance().SetLocalisationSink(nullptr);
+    EXPECT_EQ(text.ToString(), "Boat|mast");
+    text.Untranslate();
+    EXPECT_EQ(String8(text), "mast");
+}
+
+TEST_F(LocalisedStringTest, FakeAndEmptyAskNobody)
+{
+    LocalisedString fake = Fake("mast");
+    EXPECT_TRUE(fake.IsFake());
+    EXPECT_FALSE(fake.IsEmpty());
+    fake.Untranslate();
+    EXPECT_EQ(fake.ToString(), "mast");
+    EXPECT_TRUE(LocalisedString::Empty.IsEmpty());
+    EXPECT_FALSE(LocalisedString::Empty.IsFake());
+    EXPECT_EQ(LocalisedString::Empty.ToString(), "");
+    EXPECT_EQ(Make("", "Boat").ToString(), "");
+    EXPECT_FALSE(Make("mast").IsFake());
+}
+
+TEST_F(LocalisedStringTest, ShownTextCountsOnlyWithoutAContext)
+{
+    LocalisedString const shown = Make("mast"), bare = Make("mast", "");
+    shown.ToString();
+    EXPECT_EQ(shown, Make("mast"));
+    EXPECT_EQ(bare, Make("mast", ""));
+    bare.ToString();
+    EXPECT_NE(bare, Make("mast", ""));
+    EXPECT_NE(Make("mast"), Make("mast", "Circus"));
+    EXPECT_NE(Make("mast"), Make("sail"));
+    EXPECT_EQ(Fake("a"), Fake("a"));
+    EXPECT_NE(Fake("a"), Fake("b"));
+}
+
+TEST_F(LocalisedStringTest, SavedPropertiesFollowTheKindOfText)
+{
+    LocalisedString const shown = Make("sail"), same = Make("keel");
+    shown.ToString();
+    StringLocaliser::GetInstance().SetLocalisationSink(nullptr);
+    same.ToString();
+    struct
+    {
+        char const* what;
+        LocalisedString text;
+        char const* list;
+    } const cases[] = {
+        {"fake", Fake("oar"), "2B [LStr] 03000000 'oar' 00"},
+        {"not shown", Make("sail"), "2B [Str_] 04000000 'sail' 2B [Ctxt] 04000000 'Boat' 00"},
+        {"shown", shown, "2B [Str_] 04000000 'sail' 2B [Ctxt] 04000000 'Boat' 2B [LStr] 05000000 'voile' 00"},
+        {"shown as it is", same, "2B [Str_] 04000000 'keel' 2B [Ctxt] 04000000 'Boat' 00"},
+        {"empty", LocalisedString(), "2B [Str_] 00000000 2B [Ctxt] 00000000 00"},
+    };
+    for (auto const& c : cases)
+        EXPECT_EQ(Show(SaveList([&](OutSerialiser& out) { c.text.Save(out); })), Show(Bytes(c.list))) << c.what;
+}
+
+TEST_F(LocalisedStringTest, RunningLanguageWinsOverTheStoredOne)
+{
+    struct
+    {
+        char const* what;
+        std::map<char const*, char const*> stored;
+        bool loads;
+        char const* base;
+        char const* text;
+    } const cases[] = {
+        {"fake", {{"LStr", "oar"}}, true, "", "oar"},
+        {"no stored text", {{"Str_", "sail"}, {"Ctxt", "Boat"}}, true, "sail", "voile"},
+        {"stored text", {{"Str_", "sail"}, {"Ctxt", "Boat"}, {"LStr", "Segel"}}, true, "sail", "voile"},
+        {"empty answer", {{"Str_", "hull"}, {"Ctxt", "Boat"}, {"LStr", "Rumpf"}}, true, "hull", "Rumpf"},
+        {"no base at all", {{"Str_", ""}, {"Ctxt", ""}, {"LStr", "Rumpf"}}, true, "", "Rumpf"},
+        {"context lost", {{"Str_", "sail"}, {"LStr", "Segel"}}, true, "", "Segel"},
+        {"context and text lost", {{"Str_", "sail"}}, false, "was", "Boat|was"},
+        {"nothing", {}, false, "was", "Boat|was"},
+    };
+    for (auto const& c : cases) {
+        auto const list = Parsed([&](OutSerialiser& out) {
+            for (auto const& [tag, value] : c.stored) out.SaveType(TagOf(tag), value);
+        });
+        LocalisedString text = Make("was");
+        text.ToString();
+        EXPECT_EQ(text.Load(*list, LocalisedString::GetClassUID(), 1), c.loads) << c.what;
+        EXPECT_EQ(text.GetBaseString(), c.base) << c.what;
+        EXPECT_EQ(text.ToString(), c.text) << c.what;
+    }
+}
+
+TEST_F(LocalisedStringTest, FallbackTakesTheClassThenThePlainString)
+{
+    IDTag const classTag("Clas"), stringTag("Name");
+    auto const load = [&](LocalisedString& text, SaveFunction const& save) {
+        return text.LoadWithFallback(*Parsed(save), classTag, stringTag);
+    };
+    LocalisedString text;
+    EXPECT_TRUE(load(text, [&](OutSerialiser& out) {
+        out.SaveClass(classTag, Make("sail"));
+        out.SaveType(stringTag, "plain");
+    }));
+    EXPECT_EQ(text.ToString(), "voile");
+    EXPECT_TRUE(load(text, [&](OutSerialiser& out) { out.SaveType(stringTag, "plain"); }));
+    EXPECT_EQ(text.ToString(), "plain");
+    EXPECT_EQ(text.GetBaseString(), "sail");
+    EXPECT_FALSE(load(text, [](OutSerialiser&) {}));
+    EXPECT_THROW(load(text, [&](OutSerialiser& out) { out.SaveClass(classTag, EmptyClass{}); }),
+                 FutureVersionException);
+}
+
+} // namespace
+} // namespace Kernel::Test
