@@ -1,6 +1,7 @@
 #include "libkernel/archive/ArchiveCreateResult.h"
 
 #include "libkernel/core/Format.h"
+#include "libkernel/text/StringLocaliser.h"
 
 namespace Kernel {
 
@@ -32,17 +33,22 @@ constexpr Message c_messages[] = {
     {Code::NotSupported, "%1 failed because the operation is not supported by the device."},
 };
 
+String8 Localised(char const* text)
+{
+    return StringLocaliser::GetInstance().Localise(text, "Save errors");
+}
+
 } // namespace
 
 String8 ArchiveCreateResult::GetErrorMessage() const
 {
-    return GetErrorMessage(String8("Save"));
+    return GetErrorMessage(Localised("Save"));
 }
 
 String8 ArchiveCreateResult::GetErrorMessage(String8 const& operationName) const
 {
     for (Message const& message : c_messages)
-        if (message.code == m_code) return Format(message.text, operationName);
+        if (message.code == m_code) return Format(Localised(message.text), operationName);
     return String8();
 }
 

@@ -38,7 +38,8 @@ public:
     void SetErr(String8 const& text) { m_err = text; }
     String8 const& GetErr() const { return m_err; }
 
-    /// The message for the code, with "Save" as the operation's name. Empty for codes that have no message.
+    /// The message for the code in the user's language, through the StringLocaliser with the context "Save errors". The
+    /// operation's name is "Save", translated too, if none is given. Empty for codes that have no message.
     String8 GetErrorMessage() const;
     String8 GetErrorMessage(String8 const& operationName) const;
 
