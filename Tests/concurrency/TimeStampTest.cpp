@@ -100,6 +100,7 @@ TEST(HighResTimeStamp, TicksTurnIntoSecondsAndMilliseconds)
     HighResTimeStamp const before(-2, 250); // 1.75 s before 1970.
     EXPECT_EQ(-1, TimeStamp(before).GetValue()) << "rounds toward zero";
     EXPECT_EQ(250, before.GetMillis());
+    EXPECT_EQ(58, before.GetAsStructTm(TimeStampLocale::Utc).tm_sec) << "the second that the milliseconds count from";
     EXPECT_LT(before, stamp);
 }
 

@@ -215,7 +215,8 @@ HighResTimeStamp HighResTimeStamp::GetCurrent()
     return TimePoint(Duration(Platform::GetSystemTime() / c_nsPerTick));
 }
 
-// Before 1970 the second begins below the value, so that milliseconds still count upward.
+// Before 1970 the second begins below the value, so that milliseconds still count upward; civil fields and milliseconds
+// together tell the moment.
 u16 HighResTimeStamp::GetMillis() const
 {
     i64 rest = m_value % c_ticksPerSecond;
@@ -225,7 +226,7 @@ u16 HighResTimeStamp::GetMillis() const
 
 std::tm HighResTimeStamp::GetAsStructTm(TimeStampLocale locale) const
 {
-    return ToCivil(m_value / c_ticksPerSecond, locale);
+    return ToCivil(m_value / c_ticksPerSecond - (m_value % c_ticksPerSecond < 0), locale);
 }
 
 HighResTimeStamp HighResTimeStamp::MakeFromStructTm(std::tm const& fields, TimeStampLocale locale)
