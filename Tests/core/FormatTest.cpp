@@ -32,6 +32,8 @@ TEST(FormatTest, ArgumentsOfAllKindsMeetInOneEncoding)
     EXPECT_EQ(
         Format("%1 %2 %3 %4", -5, u64{18446744073709551615u}, String16(u"\u00E9"), static_cast<char const*>(nullptr)),
         "-5 18446744073709551615 \xC3\xA9 ");
+    EXPECT_EQ(Format("%1|%2|%3", 2.0, -0.1f, 1e20), "2.0|-0.1|100000000000000000000.0");
+    EXPECT_EQ(Format("%1", -9223372036854774784.0), "-9223372036854774784.0");
     EXPECT_EQ(FormatT<String16>(u"%1 of %2", "\xE2\x82\xAC", INT64_MIN), u"\u20AC of -9223372036854775808");
 }
 

@@ -2,15 +2,16 @@
 
 #include "libkernel/core/BaseCharTraits.h"
 #include "libkernel/core/ConvertEnc.h"
-#include "libkernel/core/NumberText.h"
+#include "libkernel/core/DoubleText.h"
 
 #include <new>
 
 namespace Kernel {
 
 /// One argument of a format call, made from a value before formatting starts: a string in any encoding, a terminated
-/// array of units, or an integer in decimal. Lives on the stack for the length of the call. A terminated array of the
-/// target's own units is borrowed for that time; everything else is copied or shared.
+/// array of units, an integer in decimal, or a floating-point number in its short form. Lives on the stack for the
+/// length of the call. A terminated array of the target's own units is borrowed for that time; everything else is
+/// copied or shared.
 template <class S>
 class FormatHolderT
 {
@@ -37,6 +38,14 @@ public:
         Unit* const end = m_digits + NumberTextDetail::c_maxDecimalLength;
         m_data = NumberTextDetail::WriteDecimal(end, NumberTextDetail::Split(value));
         m_length = static_cast<int>(end - m_data);
+    }
+    template <TextDouble T>
+    explicit FormatHolderT(T value) : m_data(m_digits), m_length(DoubleTextDetail::WriteShort(m_digits, value))
+    {
+        if (m_length >= 0) return;
+        Keep(ToStringT<S>(value));
+        m_data = m_string.text.GetData();
+        m_length = m_string.text.GetLength();
     }
     FormatHolderT(FormatHolderT const&) = delete;
     FormatHolderT& operator=(FormatHolderT const&) = delete;
@@ -67,7 +76,8 @@ private:
     int m_length = 0;
     bool m_hasString = false;
     Room m_string;
-    Unit m_digits[NumberTextDetail::c_maxDecimalLength];
+    Unit m_digits[DoubleTextDetail::c_maxShortLength];
+    static_assert(DoubleTextDetail::c_maxShortLength >= NumberTextDetail::c_maxDecimalLength);
 };
 
 /// The format engine: appends @p format to @p out, with each placeholder replaced by its argument, and gives the number

@@ -1,10 +1,13 @@
 #include "libkernel/core/NumberText.h"
 
+#include "libkernel/core/internal/DecimalDigits.h"
+
 #include <algorithm>
-#include <array>
-#include <new>
 
 namespace Kernel {
+
+using namespace NumberTextDetail;
+
 namespace {
 
 constexpr CharacterGrouping c_groupingNumber{3, ','};
@@ -13,50 +16,6 @@ constexpr CharacterGrouping c_groupingHexWords{4, ' '};
 
 constexpr char c_lowerDigits[] = "0123456789abcdefghijklmnopqrstuvwxyz";
 constexpr char c_upperDigits[] = "0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZ";
-
-// The three digits of each number below 1,000: one division gives three digits.
-constexpr auto c_triples = [] {
-    std::array<char, 3000> table{};
-    for (u32 i = 0; i < 1000; ++i) {
-        table[3 * i] = static_cast<char>('0' + i / 100);
-        table[3 * i + 1] = static_cast<char>('0' + i / 10 % 10);
-        table[3 * i + 2] = static_cast<char>('0' + i % 10);
-    }
-    return table;
-}();
-
-int CountDigits(u64 value)
-{
-    int digits = 1;
-    for (;;) {
-        if (value < 10) return digits;
-        if (value < 100) return digits + 1;
-        if (value < 1000) return digits + 2;
-        if (value < 10000) return digits + 3;
-        value /= 10000;
-        digits += 4;
-    }
-}
-
-template <class Unit>
-Unit* WriteTriple(Unit* end, u64 triple)
-{
-    char const* const digits = &c_triples[3 * triple];
-    *--end = static_cast<Unit>(digits[2]);
-    *--end = static_cast<Unit>(digits[1]);
-    *--end = static_cast<Unit>(digits[0]);
-    return end;
-}
-
-// The digits of @p value, ending at @p end, without leading zeros; "0" for 0.
-template <class Unit>
-Unit* WriteDigits(Unit* end, u64 value)
-{
-    for (; value >= 1000; value /= 1000) end = WriteTriple(end, value % 1000);
-    do *--end = static_cast<Unit>('0' + value % 10);
-    while (value /= 10);
-    return end;
-}
 
 template <class Unit>
 Unit* WriteThousands(Unit* end, u64 value, Unit separator)
@@ -80,12 +39,6 @@ void WriteGrouped(Unit* const begin, Unit* end, u64 value, CharacterGrouping con
         *--end = static_cast<Unit>('0' + value % 10);
         value /= 10;
     }
-}
-
-char SignOf(bool negative, SignStyle style)
-{
-    if (negative) return '-';
-    return style == SignStyle::Plus ? '+' : style == SignStyle::Space ? ' ' : 0;
 }
 
 } // namespace

@@ -1,0 +1,43 @@
+#include "libkernel/text/StringParser.h"
+
+#include "libkernel/text/internal/IcuLocale.h"
+
+#include <memory>
+#include <unicode/fmtable.h>
+#include <unicode/numfmt.h>
+
+namespace Kernel {
+namespace {
+
+bool Parse(String8 const& text, Counted<Locale const> const& locale, icu::Formattable& number)
+{
+    UErrorCode status = U_ZERO_ERROR;
+    std::unique_ptr<icu::NumberFormat> const format(icu::NumberFormat::createInstance(ToIcuLocale(locale), status));
+    if (U_FAILURE(status) || !format) return false;
+    format->parse(icu::UnicodeString::fromUTF8({text.GetData(), text.GetLength()}), number, status);
+    return U_SUCCESS(status);
+}
+
+} // namespace
+
+bool StringParser::ParseAsDouble(String8 const& text, Counted<Locale const> const& locale, double& value)
+{
+    icu::Formattable number;
+    if (!Parse(text, locale, number)) return false;
+    UErrorCode status = U_ZERO_ERROR;
+    double const result = number.getDouble(status);
+    if (U_SUCCESS(status)) value = result;
+    return U_SUCCESS(status);
+}
+
+bool StringParser::ParseAsLong(String8 const& text, Counted<Locale const> const& locale, long& value)
+{
+    icu::Formattable number;
+    if (!Parse(text, locale, number)) return false;
+    UErrorCode status = U_ZERO_ERROR;
+    long const result = number.getLong(status);
+    if (U_SUCCESS(status)) value = result;
+    return U_SUCCESS(status);
+}
+
+} // namespace Kernel
