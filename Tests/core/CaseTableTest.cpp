@@ -1,0 +1,71 @@
+#include "libkernel/core/CaseTable.h"
+
+#include <gtest/gtest.h>
+#include <string>
+#include <unicode/uchar.h>
+#include <unicode/ustring.h>
+
+namespace Kernel {
+namespace {
+
+using Operation = CaseTable::Operation;
+
+std::u32string Map(Operation operation, char const* locale, u32 codePoint)
+{
+    u32 to[CaseTable::c_longest];
+    int const count = CaseTable::Get(operation, locale).Map(codePoint, to);
+    return std::u32string(to, to + count);
+}
+
+TEST(CaseTableTest, EveryCodePointFoldsAndMapsAsTheUnicodeLibraryDoes)
+{
+    for (UChar32 c = 0; c <= 0x10FFFF; c = c == 0xD7FF ? 0xE000 : c + 1) {
+        UChar from[2];
+        UChar to[16];
+        i32 n = 0;
+        U16_APPEND_UNSAFE(from, n, c);
+        for (Operation operation : {Operation::Fold, Operation::Lower, Operation::Upper}) {
+            UErrorCode error = U_ZERO_ERROR;
+            i32 const length = operation == Operation::Fold    ? u_strFoldCase(to, 16, from, n, 0, &error)
+                               : operation == Operation::Lower ? u_strToLower(to, 16, from, n, "", &error)
+                                                               : u_strToUpper(to, 16, from, n, "", &error);
+            UChar32 wide[16];
+            i32 count = 0;
+            u_strToUTF32WithSub(wide, 16, &count, to, length, c, nullptr, &error);
+            u32 mapped[CaseTable::c_longest];
+            ASSERT_EQ(CaseTable::Get(operation).Map(static_cast<u32>(c), mapped), count) << c;
+            for (i32 i = 0; i < count; ++i) ASSERT_EQ(mapped[i], static_cast<u32>(wide[i])) << c;
+        }
+        // The simple mapping is all there is to go by for title case; it is a full one where that is one code point.
+        std::u32string const title = Map(Operation::Title, "", static_cast<u32>(c));
+        ASSERT_TRUE(title.size() > 1 || title[0] == static_cast<char32_t>(u_totitle(c))) << c;
+    }
+}
+
+TEST(CaseTableTest, LanguagesKeepTheirOwnRules)
+{
+    struct Case
+    {
+        Operation operation;
+        char const* locale;
+        u32 codePoint;
+        char32_t const* mapped;
+    };
+    for (Case const& c :
+         {Case{Operation::Lower, "tr-TR", 'I', U"\u0131"}, Case{Operation::Upper, "az", 'i', U"\u0130"},
+          Case{Operation::Title, "tr_TR", 'i', U"\u0130"}, Case{Operation::Lower, "tr", 0x130, U"i"},
+          Case{Operation::Lower, "en", 0x130, U"i\u0307"}, Case{Operation::Lower, "tru", 'I', U"i"},
+          Case{Operation::Lower, "lt", 0xCC, U"i\u0307\u0300"}, Case{Operation::Upper, "hy", 0x587, U"\u0535\u054E"},
+          Case{Operation::Upper, "", 0x587, U"\u0535\u0552"}, Case{Operation::Upper, "el", 0x3AC, U"\u0386"},
+          Case{Operation::Fold, "tr", 'I', U"i"}, Case{Operation::Title, "", 0x1C6, U"\u01C5"},
+          Case{Operation::Title, "", 0xFB01, U"Fi"}, Case{Operation::Upper, "", 0x390, U"\u0399\u0308\u0301"},
+          Case{Operation::Lower, "not a locale at all, and a long one", 'A', U"a"},
+          Case{Operation::Upper, "", 0xFFFFFFFF, U"\xFFFFFFFF"}})
+    {
+        SCOPED_TRACE(c.locale);
+        EXPECT_EQ(Map(c.operation, c.locale, c.codePoint), c.mapped) << c.codePoint;
+    }
+}
+
+} // namespace
+} // namespace Kernel

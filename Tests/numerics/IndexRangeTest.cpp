@@ -1,0 +1,41 @@
+#include "libkernel/numerics/IndexRange.h"
+
+#include <gtest/gtest.h>
+
+namespace Kernel {
+namespace {
+
+TEST(IndexRangeTest, BordersFollowFromLocationAndLength)
+{
+    IndexRange const range(3, 4);
+    EXPECT_EQ(range.GetFirst(), 3);
+    EXPECT_EQ(range.GetLast(), 6);
+    EXPECT_EQ(range.GetMax(), 7);
+    for (int i = 0; i < 10; ++i) EXPECT_EQ(range.Contains(i), i >= 3 && i <= 6) << i;
+    EXPECT_TRUE(IndexRange().empty());
+    EXPECT_FALSE(IndexRange(5, 0).Contains(5));
+    EXPECT_EQ(IndexRange(5), IndexRange(5, 1));
+    EXPECT_EQ(IndexRange::FromEndPoints(9, 4), IndexRange(4, 6));
+    EXPECT_EQ(IndexRange(4, 2).Offset(-6), IndexRange(-2, 2));
+}
+
+TEST(IndexRangeTest, ClampAndIntersectsAgreeOnWhatBothHold)
+{
+    struct Case
+    {
+        IndexRange a, b, clamped;
+        bool intersects;
+    };
+    for (Case const& c :
+         {Case{{2, 5}, {4, 10}, {4, 3}, true}, Case{{4, 10}, {2, 5}, {4, 3}, true}, Case{{2, 5}, {3, 2}, {3, 2}, true},
+          Case{{2, 3}, {5, 4}, {5, 0}, false}, Case{{5, 4}, {2, 3}, {5, 0}, false}, Case{{2, 3}, {9, 0}, {9, 0}, false},
+          Case{{7, 0}, {2, 9}, {7, 0}, true}, Case{{1, 2147483647}, {5, 2}, {5, 2}, true}})
+    {
+        SCOPED_TRACE(testing::Message() << c.a.GetLocation() << ',' << c.a.GetLength());
+        EXPECT_EQ(IndexRange::Clamp(c.a, c.b), c.clamped);
+        EXPECT_EQ(c.a.Intersects(c.b), c.intersects);
+    }
+}
+
+} // namespace
+} // namespace Kernel
