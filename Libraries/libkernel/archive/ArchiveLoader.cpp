@@ -118,6 +118,23 @@ Result ReadFATHeader(ArchiveSource& source, u64 position, bool newest, FATHeader
     return Archive::OpenOk;
 }
 
+/// True if the file is in the one state that the link names. A power cut can leave an info block that is a mixture of
+/// two commits, and a link must then neither match a newer table nor miss its own. The table at FirstFAT is whole, and
+/// no two commits in a row have the same time stamp, so where the block and its table disagree the table decides.
+bool IsLinkedState(ArchiveSource& source, Archive::ArchiveInfo const& info, ArchiveLoadData const& link)
+{
+    bool const isSame = info.saveTimeStamp == link.linkSaveTimeStamp && info.saveCount == link.linkSaveCount;
+    FATHeader newest;
+    FATKind const* kind = nullptr;
+    if (info.firstFAT == 0 || ReadFATHeader(source, info.firstFAT, true, newest, kind) != Archive::OpenOk)
+        return isSame;
+    // A compact file is written whole: its save time need not be that of the revision it keeps.
+    bool const isCompact = newest.revisionTag == Archive::RevisionTagStreamlined;
+    bool const sameTime = isCompact || newest.timeStamp == info.saveTimeStamp;
+    if (newest.fileEnd == info.fileEnd && sameTime) return isSame;
+    return !isCompact && newest.timeStamp == link.linkSaveTimeStamp;
+}
+
 } // namespace
 
 Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadData const* expectedLink, Front& front)
@@ -130,9 +147,7 @@ Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadDat
     u8 info[c_infoSize];
     if (source.ReadAt(c_infoPos, info, sizeof(info)) != sizeof(info)) return Archive::OpenBadInfo;
     if (!DecodeInfo(info, front.info)) return Archive::OpenBadInfo;
-    if (expectedLink && (front.info.saveTimeStamp != expectedLink->linkSaveTimeStamp ||
-                         front.info.saveCount != expectedLink->linkSaveCount))
-        return Archive::OpenLinkMismatch;
+    if (expectedLink && !IsLinkedState(source, front.info, *expectedLink)) return Archive::OpenLinkMismatch;
 
     u64 position = c_firstContentPosV7;
     if (front.header.fileVersion >= c_guardVersion) {
@@ -191,16 +206,6 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     Result const result =
         LoadFATChain(source, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
     if (result != Archive::OpenOk) return result;
-
-    // Reached through a link, the file must be in one exact state. A commit writes the same figures into the info block
-    // and the table it names; a block that only half arrived may still show the link the old numbers over a new table.
-    if (data.testLink && data.revisions.size() > before) {
-        Archive::Revision const& newest = *data.revisions[data.revisions.size() - before - 1];
-        // A compact file is written whole: its save time need not be that of the revision it keeps.
-        bool const sameTime =
-            newest.m_tag == Archive::RevisionTagStreamlined || newest.m_timeStamp == front.info.saveTimeStamp;
-        if (newest.m_fileEnd != front.info.fileEnd || !sameTime) return Archive::OpenLinkMismatch;
-    }
 
     // An info block that a crash left half written can lag behind the table it names, or be rubbish; a save that
     // trusted it would write over live bytes or reuse an identifier.

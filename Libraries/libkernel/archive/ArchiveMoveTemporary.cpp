@@ -73,7 +73,10 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
     }
     // A save that is in place but may not last keeps the replaced file beside it.
     bool const isLasting = static_cast<int>(moved) == 0;
-    if (!backup.IsEmpty() && isLasting) FileSystem::Delete(backup, 0);
+    if (!backup.IsEmpty() && isLasting) {
+        FileSystem::Delete(backup, 0);
+        Platform::GetFileCalls().flushFolder(Platform::GetFolderOf(backup.GetData()).c_str());
+    }
     FileSystem::SetFileHidden(final, false);
 
     File::OpenUnmanagedResult result{};

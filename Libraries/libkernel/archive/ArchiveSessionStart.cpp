@@ -12,6 +12,18 @@ namespace Kernel {
 
 using namespace ArchiveFormat;
 
+namespace {
+
+/// A scratch file knows its master by the stamp of its save, even where a torn info block shows the older save count;
+/// so two saves of one second get two stamps, in order. A clock that was set back further differs by itself.
+void TellApart(TimeStamp& stamp, TimeStamp const& last)
+{
+    constexpr i64 c_burstSeconds = 60;
+    if (stamp <= last && stamp > last - c_burstSeconds) stamp = last + 1;
+}
+
+} // namespace
+
 bool Archive::CreateSession(ArchiveSessionHandle& handle, SessionType type, bool const* abort)
 {
     return m->CreateSessionI(handle, type, ChoiceMaster, abort, false) == SessionOk;
@@ -118,6 +130,7 @@ Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle&
             auto revision = MakeCounted<Archive::Revision>();
             revision->m_file = file;
             revision->m_timeStamp = TimeStamp::GetCurrent();
+            if (choice == Archive::ChoiceMaster && m_scratch) TellApart(revision->m_timeStamp, file->m_saveTimeStamp);
             revision->m_tag =
                 type == Archive::SessionTypeIncremental ? Archive::RevisionTagIncremental : Archive::RevisionTagFull;
             CriticalSectionScope const lock(file->m_lock);
