@@ -324,6 +324,59 @@ TEST_F(FileSystemMovesTest, MoveThatMayNotLastFailsButTellsThatItWasMade)
     EXPECT_EQ(Read("third_backup1"), "new content");
 }
 
+TEST_F(FileSystemMovesTest, MoveBetweenNamesOfOneFileLeavesTheNewNameAlone)
+{
+    struct Case
+    {
+        char const* what;
+        std::string from, to;
+        bool fromGoes;
+    };
+    std::filesystem::create_directory(m_folder / "sub");
+    Case const cases[] = {
+        {"two names", "old", "second", true},
+        {"in two folders", "old", "sub/second", true},
+        {"itself", "old", "old", false},
+        {"itself, spelt otherwise", "old", "sub/.././old", false},
+    };
+    auto const rename = [&](Case const& c) { return FileSystem::RenameFile(At(c.from), At(c.to), 0); };
+    auto const move = [&](Case const& c) { return FileSystem::SafeMoveFile(At(c.from), At(c.to)); };
+    auto const run = [&](Case const& c, auto const& operation) {
+        WriteWholeFile(m_folder / c.from, "content");
+        std::filesystem::remove(m_folder / "third");
+        std::filesystem::create_hard_link(m_folder / c.from, m_folder / "third");
+        if (c.fromGoes) std::filesystem::create_hard_link(m_folder / c.from, m_folder / c.to);
+        EXPECT_TRUE(operation(c)) << c.what;
+        EXPECT_EQ(std::filesystem::exists(m_folder / c.from), !c.fromGoes) << c.what;
+        EXPECT_EQ(Read(c.to), "content") << c.what;
+        std::filesystem::remove(m_folder / c.to);
+    };
+    for (Case const& c : cases) {
+        run(c, rename);
+        run(c, move);
+        // Where nothing can be renamed a copy would take its place, and the file's only name would go.
+        TwoVolumes const volumes;
+        FaultyFiles faults;
+        run(c, move);
+        EXPECT_EQ(faults.GetCount(FileCall::Write), 0);
+    }
+}
+
+TEST_F(FileSystemMovesTest, LinkMovesBetweenVolumesAsALink)
+{
+    std::filesystem::remove(m_folder / "old");
+    for (char const* const leadsTo : {"precious", "nowhere"}) {
+        WriteWholeFile(m_folder / "precious", "precious");
+        std::filesystem::create_symlink(leadsTo, m_folder / "old");
+        TwoVolumes const volumes;
+        EXPECT_EQ(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 0), MoveResult::Moved);
+        EXPECT_EQ(List(), (Names{"precious", "target"}));
+        EXPECT_TRUE(std::filesystem::is_symlink(m_folder / "target"));
+        EXPECT_EQ(std::filesystem::read_symlink(m_folder / "target"), leadsTo);
+        EXPECT_EQ(Read("precious"), "precious");
+    }
+}
+
 TEST_F(FileSystemMovesTest, BackupTakesTheFirstFreeNumber)
 {
     String8 out;

@@ -7,11 +7,14 @@
 #include "support/FaultyFiles.h"
 #include "support/TempFolder.h"
 
+#include <chrono>
 #include <filesystem>
+#include <future>
 #include <gtest/gtest.h>
 #include <set>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace Kernel {
@@ -176,6 +179,22 @@ TEST_F(TempFileTest, FullDiskAndTooManyFilesEndTheSearchAtOnce)
     EXPECT_FALSE(TempFile::GenerateTempInOutFile(out, ""));
     EXPECT_FALSE(TempFile::GenerateTempOutFile(out, ""));
     EXPECT_EQ(faults.GetOpenHandles(), 0);
+}
+
+TEST_F(TempFileTest, FileThatIsSlowToMakeKeepsNobodyFromNames)
+{
+    FaultyFiles faults;
+    String8 slow, other;
+    bool isFirst = true;
+    std::future<bool> made; // Outlives the call, so that a name that is kept waiting fails the test and hangs nothing.
+    faults.SetObserver([&](FileCall call, std::string const&) {
+        if (call != FileCall::Open || !std::exchange(isFirst, false)) return;
+        made = std::async(std::launch::async, [&] { return TempFile::GenerateTempFilePath(other, ""); });
+        EXPECT_EQ(made.wait_for(std::chrono::seconds(5)), std::future_status::ready);
+    });
+    EXPECT_TRUE(TempFile::GenerateTempInOutFile(slow, ""));
+    faults.SetObserver(nullptr);
+    EXPECT_EQ(CounterOf(other), CounterOf(slow) + 1);
 }
 
 TEST_F(TempFileTest, ThreadsNeverGetOneName)

@@ -110,7 +110,8 @@ public:
     /// listed, whatever becomes of the files.
     static bool DeleteFilesFromFolder(String8 const& path);
 
-    /// Renames and replaces, atomically or not at all, and flushes the folder. Up to @p retries more tries where the
+    /// Renames and replaces, atomically or not at all, and flushes the folder. Where both are names of one file the old
+    /// name goes. Up to @p retries more tries where the
     /// failure may pass: too many open files, access denied, file in use. False too when the folder's flush fails: the
     /// new name then stands, but may not outlast a power cut. @p isRenamed, if given, tells that from a file that
     /// still has its old name.
@@ -123,12 +124,12 @@ public:
     /// True if SafeMoveFileAdv without retries gives Moved. Who goes on with the file after a failure asks that form.
     static bool SafeMoveFile(String8 const& from, String8 const& to);
 
-    /// Moves a file over @p to; contents and name are on the device before it returns. Between volumes, and when the
-    /// rename fails for good, the contents go to a temporary beside the target, which is flushed and renamed, so that
-    /// the target is old or new but never half written; the source goes last. A source that can't be deleted then is
-    /// logged, and the file counts as moved. Failures are logged. A move that was made, but may not outlast a power cut
-    /// because a folder can't be flushed, is a failure too: @p isMoved, if given, tells it from one after which the
-    /// file stands at @p from as before.
+    /// Moves a file, or a symbolic link as it is, over @p to; contents and name are on the device before it returns.
+    /// Between volumes, and when the rename fails for good, the contents go to a temporary beside the target, which is
+    /// flushed and renamed, so that the target is old or new but never half written; the source goes last. A source
+    /// that can't be deleted then is logged, and the file counts as moved. Failures are logged. A move that was made,
+    /// but may not outlast a power cut because a folder can't be flushed, is a failure too: @p isMoved, if given, tells
+    /// it from one after which the file stands at @p from as before.
     [[nodiscard]] static SafeMoveFileResult SafeMoveFileAdv(String8 const& from, String8 const& to, int retries,
                                                             bool* isMoved = nullptr);
 

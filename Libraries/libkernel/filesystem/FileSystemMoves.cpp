@@ -114,16 +114,25 @@ void CopyMarks(String8 const& from, String8 const& to)
     }
 }
 
-/// Makes a new file in the folder of @p target, for contents that will be renamed over it.
-int MakeBeside(String8 const& target, String8& path, OpenFile& file)
+/// Makes something new in the folder of @p target, by @p make, that will be renamed over it.
+template <class Make>
+int MakeBeside(String8 const& target, String8& path, Make const& make)
 {
     static std::atomic<u32> s_count{0};
     String8 const folder{std::string_view(Platform::GetFolderOf(target.GetData()))};
     int error = EEXIST;
     for (int i = 0; i < c_maxNames && error == EEXIST; ++i) {
         path = FileDetail::AppendElement(folder, Format("~move%1", ++s_count));
-        error = file.Open(path, {.write = true, .create = true, .exclusive = true, .noFollow = true});
+        error = make(path);
     }
+    return error;
+}
+
+/// Puts what was made beside @p to in its place, if all went well, and otherwise takes it away again.
+int FinishBeside(String8 const& beside, String8 const& to, int error)
+{
+    if (error == 0) error = GetFileCalls().rename(ToSystem(beside), ToSystem(to));
+    if (error != 0) GetFileCalls().unlink(ToSystem(beside));
     return error;
 }
 
@@ -138,16 +147,34 @@ int CopyWhole(String8 const& from, String8 const& to)
 
     OpenFile out;
     String8 beside;
-    if (int const error = MakeBeside(to, beside, out)) return error;
+    if (int const error = MakeBeside(to, beside, [&](String8 const& path) {
+            return out.Open(path, {.write = true, .create = true, .exclusive = true, .noFollow = true});
+        }))
+        return error;
     int error = CopyInto(source.Get(), info, out.Get());
     int const closeError = out.Close();
     if (error == 0) error = closeError;
-    if (error == 0) {
-        CopyMarks(from, beside);
-        error = GetFileCalls().rename(ToSystem(beside), ToSystem(to));
-    }
-    if (error != 0) GetFileCalls().unlink(ToSystem(beside));
-    return error;
+    if (error == 0) CopyMarks(from, beside);
+    return FinishBeside(beside, to, error);
+}
+
+/// The same for a symbolic link: the link is what moves, not what it leads to.
+int CopyLink(String8 const& from, String8 const& to)
+{
+    std::string target;
+    if (int const error = GetFileCalls().readLink(ToSystem(from), target)) return error;
+    String8 beside;
+    int const error = MakeBeside(
+        to, beside, [&](String8 const& path) { return GetFileCalls().makeLink(target.c_str(), ToSystem(path)); });
+    return error == 0 ? FinishBeside(beside, to, 0) : error;
+}
+
+/// What a move does where nothing can be renamed, up to the deletion of the source.
+int CopyEntry(String8 const& from, String8 const& to)
+{
+    bool const isLink = FileDetail::GetKind(from, false) == FileKind::Link;
+    int const error = isLink ? CopyLink(from, to) : CopyWhole(from, to);
+    return error == 0 ? FlushFolderOf(to) : error;
 }
 
 FileSystem::SafeMoveFileResult ToMoveResult(int error)
@@ -179,7 +206,7 @@ bool FileSystem::DeleteFilesFromFolder(String8 const& path)
 bool FileSystem::RenameFile(String8 const& from, String8 const& to, int retries, bool* isRenamed)
 {
     int const error = Try(
-        retries, [&] { return GetFileCalls().rename(ToSystem(from), ToSystem(to)); }, MayPassOrIsInUse);
+        retries, [&] { return FileDetail::RenameEntry(from, to); }, MayPassOrIsInUse);
     if (isRenamed) *isRenamed = error == 0;
     return error == 0 && FlushNames(from, to) == 0;
 }
@@ -218,7 +245,7 @@ FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, 
         return ToMoveResult(error);
     }
     int error = Try(
-        retries, [&] { return GetFileCalls().rename(ToSystem(from), ToSystem(to)); }, MayPass);
+        retries, [&] { return FileDetail::RenameEntry(from, to); }, MayPass);
     moved = error == 0;
     if (moved) {
         error = FlushNames(from, to);
@@ -230,14 +257,16 @@ FileSystem::SafeMoveFileResult FileSystem::SafeMoveFileAdv(String8 const& from, 
     // Between volumes the copy is the ordinary way, and no failure of the rename.
     if (error != EXDEV) logMoveError(error);
 
-    error = CopyWhole(from, to);
-    if (error == 0) error = FlushFolderOf(to);
+    // A copy over one's own name would end with the deletion of the only one.
+    FileDetail::Kinship const kinship = FileDetail::GetKinship(from, to);
+    error = kinship == FileDetail::Kinship::Strangers ? CopyEntry(from, to) : 0;
     if (error != 0) {
         WriteToLog(c_logLevel, Format("SafeMoveFile error: CopyFileExW failed with code %1!\n\tOld: %2\n\tNew: %3",
                                       error, from, to));
         return ToMoveResult(error);
     }
     moved = true;
+    if (kinship == FileDetail::Kinship::OneName) return SafeMoveFileResult::Moved;
     error = GetFileCalls().unlink(ToSystem(from));
     if (error != 0)
         WriteToLog(c_logLevel,

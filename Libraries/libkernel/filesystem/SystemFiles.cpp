@@ -3,6 +3,7 @@
 #include "libkernel/filesystem/Path.h"
 #include "libkernel/platform/Errors.h"
 
+#include <algorithm>
 #include <unicode/bytestream.h>
 #include <unicode/casemap.h>
 #include <unicode/stringoptions.h>
@@ -50,6 +51,47 @@ Platform::FileKind GetKind(String8 const& path, bool followLinks)
 bool IsTaken(String8 const& path)
 {
     return GetKind(path, false) != Platform::FileKind::None;
+}
+
+namespace {
+
+bool IsSameFile(std::string const& a, std::string const& b, bool followLinks)
+{
+    Platform::FileInfo infoA, infoB;
+    auto const& calls = Platform::GetFileCalls();
+    return calls.stat(a.c_str(), followLinks, infoA) == 0 && calls.stat(b.c_str(), followLinks, infoB) == 0 &&
+           infoA.device == infoB.device && infoA.inode == infoB.inode;
+}
+
+bool HoldsBoth(std::string const& folder, String8 const& a, String8 const& b)
+{
+    std::vector<Platform::FolderEntry> entries;
+    if (Platform::GetFileCalls().listFolder(folder.c_str(), entries) != 0) return false;
+    auto const holds = [&](String8 const& name) {
+        return std::any_of(entries.begin(), entries.end(), [&](auto const& e) { return name == e.name.c_str(); });
+    };
+    return holds(a) && holds(b);
+}
+
+} // namespace
+
+Kinship GetKinship(String8 const& a, String8 const& b)
+{
+    if (!ToSystem(a) || !ToSystem(b) || !IsSameFile(a.GetData(), b.GetData(), false)) return Kinship::Strangers;
+    std::string const folderA = Platform::GetFolderOf(a.GetData());
+    std::string const folderB = Platform::GetFolderOf(b.GetData());
+    if (!IsSameFile(folderA, folderB, true)) return Kinship::TwoNames;
+    String8 const nameA = GetLastPart(a), nameB = GetLastPart(b);
+    // In a folder that ignores case two spellings may be one entry, and then it lists one of them.
+    return nameA != nameB && HoldsBoth(folderA, nameA, nameB) ? Kinship::TwoNames : Kinship::OneName;
+}
+
+int RenameEntry(String8 const& from, String8 const& to)
+{
+    auto const& calls = Platform::GetFileCalls();
+    int const error = calls.rename(ToSystem(from), ToSystem(to));
+    if (error != 0 || !IsTaken(from)) return error;
+    return GetKinship(from, to) == Kinship::TwoNames ? calls.unlink(ToSystem(from)) : 0;
 }
 
 String8 GetLastPart(String8 const& path)

@@ -44,8 +44,14 @@ String8 GetFolder(TempRecord const& record, bool second)
     return second ? record.second : record.path;
 }
 
-String8 NextPathCS(TempRecord& record, String8 const& folder, String8 const& extension)
+/// A path that nobody else gets, empty without a folder. The lock is held for the count alone: what is done with the
+/// name may wait for a slow volume, and others need names meanwhile.
+String8 NextPath(String8 const& extension, bool second)
 {
+    TempRecord& record = GetRecord();
+    CriticalSectionSpinScope const scope(record.lock);
+    String8 const folder = GetFolder(record, second);
+    if (folder.IsEmpty()) return String8();
     char digits[16];
     auto const end = std::to_chars(digits, std::end(digits), ++record.counter, 16).ptr;
     String8 name(digits, static_cast<int>(end - digits));
@@ -60,12 +66,9 @@ String8 NextPathCS(TempRecord& record, String8 const& folder, String8 const& ext
 template <class Stream, class Make>
 Counted<Stream> MakeFile(String8& out, String8 const& extension, bool second, Make const& make)
 {
-    TempRecord& record = GetRecord();
-    CriticalSectionSpinScope const scope(record.lock);
-    String8 const folder = GetFolder(record, second);
-    if (folder.IsEmpty()) return nullptr;
     for (int failures = 0; failures < c_maxFailures; ++failures) {
-        String8 const path = NextPathCS(record, folder, extension);
+        String8 const path = NextPath(extension, second);
+        if (path.IsEmpty()) return nullptr;
         Result result = Result::Other;
         if (Counted<Stream> stream = make(path, result)) {
             out = path;
@@ -106,14 +109,10 @@ bool TempFile::HaveTempPath()
 
 bool TempFile::GenerateTempFilePath(String8& out, String8 const& extension, bool second)
 {
-    TempRecord& record = GetRecord();
-    CriticalSectionSpinScope const scope(record.lock);
-    String8 const folder = GetFolder(record, second);
-    if (folder.IsEmpty()) return false;
     // Opening alone would not notice a link that leads nowhere, and whoever makes the file would follow it.
-    String8 path;
-    do path = NextPathCS(record, folder, extension);
-    while (FileDetail::IsTaken(path));
+    String8 path = NextPath(extension, second);
+    while (!path.IsEmpty() && FileDetail::IsTaken(path)) path = NextPath(extension, second);
+    if (path.IsEmpty()) return false;
     out = path;
     return true;
 }

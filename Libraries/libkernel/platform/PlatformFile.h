@@ -146,6 +146,8 @@ struct FileCalls
     int (*removeFolder)(char const* path);
     /// Target of a link, as it is written.
     int (*readLink)(char const* path, std::string& target);
+    /// Makes a symbolic link with @p target as its text. EEXIST if anything stands at @p path.
+    int (*makeLink)(char const* target, char const* path);
     /// The entries of a folder, in the file system's order, without "." and "..".
     int (*listFolder)(char const* path, std::vector<FolderEntry>& entries);
     /// Brings the names in a folder to the device: what was made, renamed or removed there lasts. Where that can't be

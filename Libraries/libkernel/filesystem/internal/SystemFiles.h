@@ -35,6 +35,21 @@ Platform::FileKind GetKind(String8 const& path, bool followLinks);
 /// True if a new file could not be made there without meeting something, if only a link that leads nowhere.
 bool IsTaken(String8 const& path);
 
+/// What two paths are to each other, links not followed.
+enum class Kinship : u8
+{
+    Strangers, ///< Different files, or one can't be asked.
+    OneName,   ///< One entry of one folder, however the paths are spelt.
+    TwoNames   ///< Two entries, in one folder or two, that are links to one file.
+};
+
+/// Where it can't be found out whether one file has one name or two, it is one: that answer costs nobody a file.
+Kinship GetKinship(String8 const& a, String8 const& b);
+
+/// Renames and replaces, atomically. The system does nothing where both are names of one file: the old one is then
+/// deleted. Gives the error.
+int RenameEntry(String8 const& from, String8 const& to);
+
 /// What stands behind the last separator, separators at the end left out.
 String8 GetLastPart(String8 const& path);
 

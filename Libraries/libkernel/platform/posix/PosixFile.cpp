@@ -328,6 +328,11 @@ int ReadLink(char const* path, std::string& target)
     return 0;
 }
 
+int MakeLink(char const* target, char const* path)
+{
+    return target && path ? Result(::symlink(target, path)) : EINVAL;
+}
+
 FileKind KindOfEntry(DIR* folder, dirent const& entry)
 {
     switch (entry.d_type) {
@@ -476,6 +481,7 @@ constexpr FileCalls c_systemCalls = {
     .makeFolder = MakeFolder,
     .removeFolder = RemoveFolder,
     .readLink = ReadLink,
+    .makeLink = MakeLink,
     .listFolder = ListFolder,
     .flushFolder = FlushFolder,
     .setTimes = SetTimes,
