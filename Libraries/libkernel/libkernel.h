@@ -140,6 +140,7 @@
 #include "libkernel/streams/FileWriterBase.h"
 #include "libkernel/streams/ForwardBiasedSeekableInStream.h"
 #include "libkernel/streams/FragmentedRawDataStream.h"
+#include "libkernel/streams/GatheringOutStream.h"
 #include "libkernel/streams/InOutStream.h"
 #include "libkernel/streams/InStream.h"
 #include "libkernel/streams/LimitedStreams.h"

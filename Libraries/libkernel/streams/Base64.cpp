@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstring>
 #include <limits>
 
 namespace Kernel {
@@ -147,61 +146,19 @@ void DecodeFromBase64(OutStream& out, char const* from, int count)
     if (held) out.WriteBlock(bytes, held);
 }
 
-Base64OutStream::Base64OutStream(Counted<OutStream> target)
-    : m_target(std::move(target)), m_block(std::make_unique_for_overwrite<char[]>(c_rawBlockSize))
-{
-}
+Base64OutStream::Base64OutStream(Counted<OutStream> target) : GatheringOutStream(std::move(target), c_rawBlockSize) {}
 
 Base64OutStream::~Base64OutStream()
 {
-    try {
-        FlushBase64();
-    } catch (...) {
-        // A destructor has nobody to tell; the target keeps its own record of the failure.
-    }
+    FlushTail();
 }
 
-u64 Base64OutStream::WriteBlock(void const* from, u64 count)
+bool Base64OutStream::Encode(OutStream& target, char const* from, u32 count)
 {
-    char const* p = static_cast<char const*>(from);
-    for (u64 left = count; left;) {
-        if (m_failed) return 0;
-        u64 const part = std::min<u64>(left, c_rawBlockSize - m_fill);
-        std::memcpy(m_block.get() + m_fill, p, part);
-        m_fill += static_cast<u32>(part);
-        p += part;
-        left -= part;
-        if (m_fill == c_rawBlockSize && !FlushBase64()) return 0;
-    }
-    m_taken += count;
-    return count;
-}
-
-bool Base64OutStream::FlushBase64()
-{
-    if (m_failed || m_fill == 0) return !m_failed;
-    m_failed = true; // Stays so if the target throws.
     char text[EncodedSize(c_rawBlockSize)];
-    u64 const length = EncodedSize(m_fill);
-    EncodeAll(text, reinterpret_cast<u8 const*>(m_block.get()), m_fill);
-    m_fill = 0;
-    m_failed = !m_target || m_target->WriteBlock(text, length) != length;
-    return !m_failed;
-}
-
-bool Base64OutStream::Flush()
-{
-    return true;
-}
-
-u64 Base64OutStream::GetSizeOutStream() const
-{
-    return m_taken;
-}
-
-u64 Base64OutStream::TellOutStream() const
-{
-    return m_taken;
+    u64 const length = EncodedSize(count);
+    EncodeAll(text, reinterpret_cast<u8 const*>(from), count);
+    return target.WriteBlock(text, length) == length;
 }
 
 } // namespace Kernel

@@ -1,10 +1,7 @@
 #pragma once
 
-#include "libkernel/core/Countable.h"
 #include "libkernel/core/String.h"
-#include "libkernel/streams/OutStream.h"
-
-#include <memory>
+#include "libkernel/streams/GatheringOutStream.h"
 
 namespace Kernel {
 
@@ -28,10 +25,8 @@ KERNEL_API String8 DecodeFromBase64(String8 const& text);
 KERNEL_API void DecodeFromBase64(OutStream& out, char const* from, int count);
 
 /// Encodes what is written to it onto another stream. The tail with its padding goes out when this stream is
-/// destroyed, and nowhere else, because padding may stand only at the end.
-///
-/// Once the target has come up short the stream has failed and every later write gives 0.
-class KERNEL_API Base64OutStream : public OutStream
+/// destroyed, because padding may stand only at the end.
+class KERNEL_API Base64OutStream final : public GatheringOutStream
 {
 public:
     static constexpr u32 c_rawBlockSize = 12288; ///< Bytes gathered before encoding; a multiple of 3.
@@ -39,24 +34,9 @@ public:
     /// Keeps a reference to @p target. Throws std::bad_alloc without memory for its block.
     explicit Base64OutStream(Counted<OutStream> target);
 
-    u64 WriteBlock(void const* from, u64 count) override;
-    /// True, and encodes nothing.
-    bool Flush() override;
-    /// The raw bytes taken; the position is the same.
-    u64 GetSizeOutStream() const override;
-    u64 TellOutStream() const override;
-
-protected:
-    ~Base64OutStream() override;
-
 private:
-    bool FlushBase64();
-
-    Counted<OutStream> m_target;
-    std::unique_ptr<char[]> m_block; // c_rawBlockSize raw bytes.
-    u32 m_fill = 0;
-    bool m_failed = false;
-    u64 m_taken = 0;
+    ~Base64OutStream() override;
+    bool Encode(OutStream& target, char const* from, u32 count) override;
 };
 
 } // namespace Kernel

@@ -73,58 +73,18 @@ void EncodeToBase85(OutStream& out, char const* from, int count, int lineMode)
 }
 
 Base85OutStream::Base85OutStream(Counted<OutStream> target, int lineMode)
-    : m_target(std::move(target)), m_lineMode(lineMode), m_block(std::make_unique_for_overwrite<char[]>(c_rawBlockSize))
+    : GatheringOutStream(std::move(target), c_rawBlockSize), m_lineMode(lineMode)
 {
 }
 
 Base85OutStream::~Base85OutStream()
 {
-    try {
-        FlushBase85();
-    } catch (...) {
-        // A destructor has nobody to tell; the target keeps its own record of the failure.
-    }
+    FlushTail();
 }
 
-u64 Base85OutStream::WriteBlock(void const* from, u64 count)
+bool Base85OutStream::Encode(OutStream& target, char const* from, u32 count)
 {
-    char const* p = static_cast<char const*>(from);
-    for (u64 left = count; left;) {
-        if (m_failed) return 0;
-        u64 const part = std::min<u64>(left, c_rawBlockSize - m_fill);
-        std::memcpy(m_block.get() + m_fill, p, part);
-        m_fill += static_cast<u32>(part);
-        p += part;
-        left -= part;
-        if (m_fill == c_rawBlockSize && !FlushBase85()) return 0;
-    }
-    m_taken += count;
-    return count;
-}
-
-bool Base85OutStream::FlushBase85()
-{
-    if (m_failed || m_fill == 0) return !m_failed;
-    m_failed = true; // Stays so if the target throws.
-    int const count = static_cast<int>(m_fill);
-    m_fill = 0;
-    m_failed = !m_target || !EncodeSlices(*m_target, m_block.get(), count, m_column, m_lineMode);
-    return !m_failed;
-}
-
-bool Base85OutStream::Flush()
-{
-    return true;
-}
-
-u64 Base85OutStream::GetSizeOutStream() const
-{
-    return m_taken;
-}
-
-u64 Base85OutStream::TellOutStream() const
-{
-    return m_taken;
+    return EncodeSlices(target, from, static_cast<int>(count), m_column, m_lineMode);
 }
 
 } // namespace Kernel

@@ -1,9 +1,6 @@
 #pragma once
 
-#include "libkernel/core/Countable.h"
-#include "libkernel/streams/OutStream.h"
-
-#include <memory>
+#include "libkernel/streams/GatheringOutStream.h"
 
 namespace Kernel {
 
@@ -29,9 +26,8 @@ KERNEL_API int EncodeToBase85(char* to, int size, char const* from, int count, i
 /// came shows in the stream's own position.
 KERNEL_API void EncodeToBase85(OutStream& out, char const* from, int count, int lineMode);
 
-/// Encodes what is written to it onto another stream. The tail goes out when this stream is destroyed, and nowhere
-/// else. Once the target has come up short the stream has failed and every later write gives 0.
-class KERNEL_API Base85OutStream : public OutStream
+/// Encodes what is written to it onto another stream. The tail goes out when this stream is destroyed.
+class KERNEL_API Base85OutStream final : public GatheringOutStream
 {
 public:
     static constexpr u32 c_rawBlockSize = 12000; ///< Bytes gathered before encoding; a multiple of 4.
@@ -39,26 +35,12 @@ public:
     /// Keeps a reference to @p target. Throws std::bad_alloc without memory for its block.
     Base85OutStream(Counted<OutStream> target, int lineMode);
 
-    u64 WriteBlock(void const* from, u64 count) override;
-    /// True, and encodes nothing.
-    bool Flush() override;
-    /// The raw bytes taken; the position is the same.
-    u64 GetSizeOutStream() const override;
-    u64 TellOutStream() const override;
-
-protected:
-    ~Base85OutStream() override;
-
 private:
-    bool FlushBase85();
+    ~Base85OutStream() override;
+    bool Encode(OutStream& target, char const* from, u32 count) override;
 
-    Counted<OutStream> m_target;
     int const m_lineMode;
     int m_column = 0;
-    std::unique_ptr<char[]> m_block; // c_rawBlockSize raw bytes.
-    u32 m_fill = 0;
-    bool m_failed = false;
-    u64 m_taken = 0;
 };
 
 } // namespace Kernel

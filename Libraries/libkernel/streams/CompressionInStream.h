@@ -13,7 +13,9 @@ namespace Kernel {
 /// know how much to ask for. It may take up to 256 KiB from the source beyond what the caller got.
 ///
 /// Damage, or a source that gives nothing before its end, is a DecompressException if the stream was made so, and
-/// otherwise a short read. The mere end of the data is a short read either way. After damage nothing more is read.
+/// otherwise a short read. The mere end of the data is a short read either way; where it comes too early, zlib finds it
+/// damaged and Zstandard does not. After damage nothing more is read, and the call that meets it may give fewer bytes
+/// than were good.
 class KERNEL_API CompressionInStream : public InStream
 {
 public:

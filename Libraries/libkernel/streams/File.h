@@ -8,7 +8,7 @@ namespace Kernel {
 
 /// Owns a C stream, opened by a UTF-8 path in the system's own grammar. One thread at a time.
 ///
-/// Only regular files open: a folder gives IsFolder, a pipe or a device Other, and none of them is waited for.
+/// Only regular files open: a folder gives IsDirectory, a pipe or a device Other, and none of them is waited for.
 class KERNEL_API File
 {
 public:
