@@ -1,0 +1,97 @@
+#include "libkernel/text/Collator.h"
+
+#include "libkernel/text/Locale.h"
+
+#include <algorithm>
+#include <gtest/gtest.h>
+#include <random>
+#include <string>
+#include <vector>
+
+namespace Kernel::Test {
+namespace {
+
+Counted<Collator> Make(char const* locale, bool caseSensitive, bool numeric)
+{
+    return MakeCounted<Collator>(locale ? Locale::Create(locale) : nullptr, caseSensitive, numeric);
+}
+
+constexpr char const* c_bad = "no locale at all"; ///< ICU refuses it.
+
+TEST(CollatorTest, LanguageCaseAndDigitsDecideTheOrder)
+{
+    struct
+    {
+        char const* locale; ///< Null for none.
+        bool caseSensitive, numeric;
+        char const* a;
+        char const* b;
+        int expected;
+    } const cases[] = {
+        {"sv-SE", false, false, "z", "\xC3\xB6", -1},
+        {"de-DE", false, false, "z", "\xC3\xB6", 1},
+        {nullptr, false, false, "z", "\xC3\xB6", 1},
+        {"de-u-co-phonebk", false, false, "\xC3\xA4", "az", -1},
+        {"de-DE", false, false, "\xC3\xA4", "az", -1},
+        {"de-u-co-phonebk", false, false, "\xC3\xA4", "ad", 1},
+        {"en", false, false, "Boat", "boat", 0},
+        {"en", true, false, "Boat", "boat", 1},
+        {"en", false, false, "resume", "r\xC3\xA9sum\xC3\xA9", -1},
+        {"en", false, false, "r\xC3\xA9sum\xC3\xA9", "re\xCC\x81sume\xCC\x81", 0},
+        {"en", false, false, "file10", "file9", -1},
+        {"en", false, true, "file10", "file9", 1},
+        {"en", false, true, "file010", "file10", 0},
+        {"en", true, false, "", "a", -1},
+        {"en", true, false, "", "", 0},
+        {"xx-YY", true, false, "a", "B", -1},
+        {c_bad, true, false, "a", "B", 1},
+        {c_bad, true, true, "a10", "a9", -1},
+        {c_bad, false, false, "a", "B", -1},
+        {c_bad, false, false, "STRASSE",
+         "stra\xC3\x9F"
+         "e",
+         0},
+        {c_bad, false, false, "a\xE2\x80", "a", 1},
+        {"en", true, false, "\xFF", "\xEF\xBF\xBD", 0},
+        {"en", true, false, "a\xE2\x80", "a", 1},
+    };
+    for (auto const& c : cases) {
+        auto const collator = Make(c.locale, c.caseSensitive, c.numeric);
+        EXPECT_EQ(collator->IsLocaleAware(), c.locale != c_bad) << c.a;
+        auto const sign = [](int order) { return (order > 0) - (order < 0); };
+        EXPECT_EQ(sign(collator->Collate(c.a, c.b)), c.expected) << c.a << " " << c.b;
+        EXPECT_EQ(sign(collator->Collate(c.b, c.a)), -c.expected) << c.a << " " << c.b;
+    }
+}
+
+TEST(CollatorTest, SettersChangeTheOrderInPlace)
+{
+    auto const collator = Make("en", false, false);
+    collator->SetCaseSensitive(true);
+    collator->SetNumericOrdering(true);
+    EXPECT_GT(collator->Collate("Boat", "boat"), 0);
+    EXPECT_GT(collator->Collate("a10", "a9"), 0);
+    collator->SetCaseSensitive(false);
+    collator->SetNumericOrdering(false);
+    EXPECT_EQ(collator->Collate("Boat", "boat"), 0);
+    EXPECT_LT(collator->Collate("a10", "a9"), 0);
+}
+
+// Sorting algorithms run off the end of a list that has no order.
+TEST(CollatorTest, RandomBytesAreInOrder)
+{
+    std::mt19937 random(5);
+    auto const collator = Make("de", false, true);
+    std::vector<String8> texts;
+    for (int i = 0; i < 60; ++i) {
+        std::string text;
+        for (u32 n = random() % 6; n > 0; --n) text += static_cast<char>(random() % 3 ? random() : '0' + random() % 10);
+        texts.emplace_back(std::string_view(text));
+    }
+    std::ranges::sort(texts, [&](String8 const& a, String8 const& b) { return collator->Collate(a, b) < 0; });
+    for (size_t i = 0; i < texts.size(); ++i)
+        for (size_t k = i; k < texts.size(); ++k) EXPECT_LE(collator->Collate(texts[i], texts[k]), 0);
+}
+
+} // namespace
+} // namespace Kernel::Test
