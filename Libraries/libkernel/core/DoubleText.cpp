@@ -1,6 +1,5 @@
 #include "libkernel/core/DoubleText.h"
 
-#include "libkernel/core/Endian.h"
 #include "libkernel/core/internal/DecimalDigits.h"
 #include "libkernel/core/internal/HasFraction.h"
 
@@ -79,18 +78,6 @@ Printed Print(double magnitude)
     return {whole, decimals};
 }
 
-// The 8 decimal digits of @p value as values 0 to 9, the first in the lowest byte.
-u64 SpreadDigits(u32 value)
-{
-    u64 const fours = value / 10000 | u64{value % 10000} << 32;
-    u64 const hundreds = (fours * 10486 >> 20) & 0x0000007F'0000007F;
-    u64 const twos = hundreds | (fours - 100 * hundreds) << 16;
-    u64 const tens = (twos * 103 >> 10) & 0x000F000F'000F000F;
-    return tens | (twos - 10 * tens) << 8;
-}
-
-constexpr u64 c_zeros = 0x30303030'30303030;
-
 // Bytes up to the last that is not 0, the first in the lowest.
 int CountUsed(u64 bytes)
 {
@@ -102,15 +89,15 @@ int CountUsed(u64 bytes)
 int WriteDecimals(char* to, u64 decimals, u32 count)
 {
     if (count <= 8) {
-        u64 const digits = SpreadDigits(static_cast<u32>(decimals * c_powersOfTen[8 - count]));
-        StoreLittleEndian(to, digits | c_zeros);
+        u64 const digits = SpreadDigits(decimals * c_powersOfTen[8 - count]);
+        StoreLittleEndian(to, digits | c_zeroDigits);
         return CountUsed(digits);
     }
     u64 const all = decimals * c_powersOfTen[16 - count];
-    u64 const high = SpreadDigits(static_cast<u32>(all / 100'000'000));
-    u64 const low = SpreadDigits(static_cast<u32>(all % 100'000'000));
-    StoreLittleEndian(to, high | c_zeros);
-    StoreLittleEndian(to + 8, low | c_zeros);
+    u64 const high = SpreadDigits(all / c_eightDigits);
+    u64 const low = SpreadDigits(all % c_eightDigits);
+    StoreLittleEndian(to, high | c_zeroDigits);
+    StoreLittleEndian(to + 8, low | c_zeroDigits);
     return low ? 8 + CountUsed(low) : CountUsed(high);
 }
 

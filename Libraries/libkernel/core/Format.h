@@ -35,9 +35,8 @@ public:
     template <TextInteger T>
     explicit FormatHolderT(T value)
     {
-        Unit* const end = m_digits + NumberTextDetail::c_maxDecimalLength;
-        m_data = NumberTextDetail::WriteDecimal(end, NumberTextDetail::Split(value));
-        m_length = static_cast<int>(end - m_data);
+        m_data = NumberTextDetail::WriteDecimal(m_digits, NumberTextDetail::Split(value));
+        m_length = static_cast<int>(m_digits + NumberTextDetail::c_decimalRoom - m_data);
     }
     template <TextDouble T>
     explicit FormatHolderT(T value) : m_data(m_digits), m_length(DoubleTextDetail::WriteShort(m_digits, value))
@@ -77,7 +76,7 @@ private:
     bool m_hasString = false;
     Room m_string;
     Unit m_digits[DoubleTextDetail::c_maxShortLength];
-    static_assert(DoubleTextDetail::c_maxShortLength >= NumberTextDetail::c_maxDecimalLength);
+    static_assert(DoubleTextDetail::c_maxShortLength >= NumberTextDetail::c_decimalRoom);
 };
 
 /// The format engine: appends @p format to @p out, with each placeholder replaced by its argument, and gives the number

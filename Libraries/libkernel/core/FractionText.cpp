@@ -75,7 +75,7 @@ public:
     operator std::string_view() const { return {m_begin, static_cast<size_t>(std::end(m_room) - m_begin)}; }
 
 private:
-    char m_room[c_maxDecimalLength];
+    char m_room[c_digitsRoom];
     char const* m_begin;
 };
 

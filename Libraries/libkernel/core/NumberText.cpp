@@ -3,6 +3,7 @@
 #include "libkernel/core/internal/DecimalDigits.h"
 
 #include <algorithm>
+#include <array>
 
 namespace Kernel {
 
@@ -17,14 +18,24 @@ constexpr CharacterGrouping c_groupingHexWords{4, ' '};
 constexpr char c_lowerDigits[] = "0123456789abcdefghijklmnopqrstuvwxyz";
 constexpr char c_upperDigits[] = "0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZ";
 
-template <class Unit>
-Unit* WriteThousands(Unit* end, u64 value, Unit separator)
+// Each number below 1,000 with its three digits in the upper bytes, the first lowest; room for a separator below them.
+constexpr auto c_groups = [] {
+    std::array<u32, 1000> table{};
+    for (u32 i = 0; i < 1000; ++i) table[i] = ('0' + i / 100) << 8 | ('0' + i / 10 % 10) << 16 | ('0' + i % 10) << 24;
+    return table;
+}();
+
+constexpr int c_thousandsRoom = 7 * 4;
+
+// The digits of @p value in groups of three, ending at @p end. Writes whole groups: needs c_thousandsRoom before the
+// end. Gives the first digit.
+char* WriteThousands(char* end, u64 value, u32 separator)
 {
-    for (; value >= 1000; value /= 1000) {
-        end = WriteTriple(end, value % 1000);
-        *--end = separator;
-    }
-    return WriteDigits(end, value);
+    int const digits = CountDigits(value);
+    char* to = end;
+    for (; value >= 1000; value /= 1000) StoreLittleEndian(to -= 4, c_groups[value % 1000] | separator);
+    StoreLittleEndian(to - 4, c_groups[value]);
+    return end - digits - (digits - 1) / 3;
 }
 
 // Digits, then fill zeros, from @p end back to @p begin, with a separator on each group boundary but never first.
@@ -61,11 +72,18 @@ CharacterGrouping const* CharacterGroupingHexWords()
 namespace NumberTextDetail {
 
 template <class Unit>
-Unit* WriteDecimal(Unit* end, Magnitude number)
+Unit* WriteDecimal(Unit* room, Magnitude number)
 {
-    end = WriteDigits(end, number.value);
-    if (number.negative) *--end = '-';
-    return end;
+    if constexpr (std::is_same_v<Unit, char>) {
+        char* const begin = WriteDigits(room + c_decimalRoom, number.value);
+        begin[-1] = '-';
+        return begin - number.negative;
+    } else {
+        char digits[c_decimalRoom];
+        char* const begin = WriteDecimal(digits, number);
+        CopyAscii(room + (begin - digits), begin, digits + c_decimalRoom);
+        return room + (begin - digits);
+    }
 }
 
 template <class S>
@@ -90,13 +108,17 @@ S Decimal(Magnitude number, SignStyle style, CharacterGrouping const* grouping, 
         begin = end - text;
     }
     if (sign) *begin++ = static_cast<Unit>(sign);
-    if (grouped && (grouping->size != 3 || total > text))
+    bool const isFilled = total > text && pad == PadStyle::ZerosLeft;
+    if (grouped && (grouping->size != 3 || grouping->separator > 0x7F || isFilled)) {
         WriteGrouped(begin, end, number.value, *grouping);
-    else {
-        Unit* const first = grouped ? WriteThousands(end, number.value, static_cast<Unit>(grouping->separator))
-                                    : WriteDigits(end, number.value);
-        std::fill(begin, first, Unit{'0'});
+        return result;
     }
+    char room[c_thousandsRoom];
+    char* const last = room + sizeof room;
+    char* const first =
+        grouped ? WriteThousands(last, number.value, grouping->separator) : WriteDigits(last, number.value);
+    if (isFilled) begin = std::fill_n(begin, total - text, Unit{'0'});
+    CopyAscii(begin, first, last);
     return result;
 }
 

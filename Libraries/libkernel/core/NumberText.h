@@ -81,12 +81,13 @@ extern template KERNEL_API String8 InBase<String8>(u64, u32, int, PadStyle, bool
 extern template KERNEL_API String16 InBase<String16>(u64, u32, int, PadStyle, bool);
 extern template KERNEL_API String32 InBase<String32>(u64, u32, int, PadStyle, bool);
 
-/// Longest decimal text of an integer: 20 digits, or a sign and 19.
-constexpr int c_maxDecimalLength = 20;
+/// Units that WriteDecimal needs for an integer: more than its text has.
+constexpr int c_decimalRoom = 25;
 
-/// Writes the decimal digits of @p number, with "-" if it is negative, so that they end at @p end; gives the first.
+/// Writes the decimal digits of @p number, with "-" if it is negative, to the end of @p room, of c_decimalRoom units;
+/// gives the first.
 template <class Unit>
-Unit* WriteDecimal(Unit* end, Magnitude number);
+Unit* WriteDecimal(Unit* room, Magnitude number);
 extern template KERNEL_API char* WriteDecimal<char>(char*, Magnitude);
 extern template KERNEL_API char16_t* WriteDecimal<char16_t>(char16_t*, Magnitude);
 extern template KERNEL_API unsigned int* WriteDecimal<unsigned int>(unsigned int*, Magnitude);

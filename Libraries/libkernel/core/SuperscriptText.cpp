@@ -19,7 +19,7 @@ template <class S>
 S Superscript(Magnitude number, SignStyle style)
 {
     using Traits = CharTraits<typename S::EncodingType>;
-    char plain[1 + c_maxDecimalLength];
+    char plain[1 + c_digitsRoom];
     char* const end = plain + sizeof plain;
     char* begin = WriteDigits(end, number.value);
     if (char const sign = SignOf(number.negative, style)) *--begin = sign;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "libkernel/core/Endian.h"
 #include "libkernel/core/NumberText.h"
 
 #include <algorithm>
@@ -22,17 +23,6 @@ inline constexpr auto c_powersOfTen = [] {
     return table;
 }();
 
-// The three digits of each number below 1,000: one division gives three digits.
-inline constexpr auto c_triples = [] {
-    std::array<char, 3000> table{};
-    for (u32 i = 0; i < 1000; ++i) {
-        table[3 * i] = static_cast<char>('0' + i / 100);
-        table[3 * i + 1] = static_cast<char>('0' + i / 10 % 10);
-        table[3 * i + 2] = static_cast<char>('0' + i % 10);
-    }
-    return table;
-}();
-
 /// Decimal digits of @p value; 1 for 0.
 inline int CountDigits(u64 value)
 {
@@ -41,24 +31,46 @@ inline int CountDigits(u64 value)
     return static_cast<int>(low + (value >= c_powersOfTen[low])) + (value == 0);
 }
 
-template <class Unit>
-Unit* WriteTriple(Unit* end, u64 triple)
+/// The 8 decimal digits of @p value, below 10^8, as values 0 to 9, the first in the lowest byte.
+inline u64 SpreadDigits(u64 value)
 {
-    char const* const digits = &c_triples[3 * triple];
-    *--end = static_cast<Unit>(digits[2]);
-    *--end = static_cast<Unit>(digits[1]);
-    *--end = static_cast<Unit>(digits[0]);
-    return end;
+    // Halves the digits three times, in all parts of the word at once.
+    u64 const fours = value / 10000 | (value % 10000) << 32;
+    u64 const hundreds = (fours * 10486 >> 20) & 0x0000007F'0000007F;
+    u64 const twos = hundreds | (fours - 100 * hundreds) << 16;
+    u64 const tens = (twos * 103 >> 10) & 0x000F000F'000F000F;
+    return tens | (twos - 10 * tens) << 8;
 }
 
-/// The digits of @p value, ending at @p end, without leading zeros; "0" for 0. Gives the first.
-template <class Unit>
-Unit* WriteDigits(Unit* end, u64 value)
+/// What makes characters of spread digits.
+constexpr u64 c_zeroDigits = 0x30303030'30303030;
+
+inline void WriteEight(char* to, u64 value)
 {
-    for (; value >= 1000; value /= 1000) end = WriteTriple(end, value % 1000);
-    do *--end = static_cast<Unit>('0' + value % 10);
-    while (value /= 10);
-    return end;
+    StoreLittleEndian(to, SpreadDigits(value) | c_zeroDigits);
+}
+
+constexpr u64 c_eightDigits = 100'000'000;
+/// Room that WriteDigits needs before the end: it writes whole words, so that the number of digits, which no machine
+/// can foresee, decides about few branches.
+constexpr int c_digitsRoom = 24;
+
+/// The digits of @p value, ending at @p end, without leading zeros; "0" for 0. Gives the first.
+inline char* WriteDigits(char* end, u64 value)
+{
+    if (value < c_eightDigits)
+        WriteEight(end - 8, value);
+    else {
+        u64 const high = value / c_eightDigits;
+        WriteEight(end - 8, value % c_eightDigits);
+        if (high < c_eightDigits)
+            WriteEight(end - 16, high);
+        else {
+            WriteEight(end - 16, high % c_eightDigits);
+            WriteEight(end - 24, high / c_eightDigits);
+        }
+    }
+    return end - CountDigits(value);
 }
 
 /// The character before a number; 0 for none.
