@@ -136,6 +136,40 @@ TEST(ConvertEncTest, LongTextGrowsItsTargetOnceAndExactly)
     }
 }
 
+TEST(ConvertEncTest, TextThatOnlyBeginsWithAsciiIsExactAndKeepsNoRoom)
+{
+    for (u32 const codePoint : {0xE9u, 0x20ACu, 0x1F600u})
+        for (size_t const far : {1u, 40u, 9000u}) {
+            SCOPED_TRACE(far);
+            std::vector<u32> text(600, 'a');
+            text.insert(text.end(), far, codePoint);
+            text.push_back('z');
+            ExpectConverts<TEncUtf16, TEncUtf8>(text);
+            ExpectConverts<TEncUtf8, TEncUtf16>(text);
+            String16 const wide = ConvertedTo<TEncUtf16>(Reference<TEncUtf8>(text));
+            EXPECT_LE(wide.GetCapacity(), wide.GetLength() + wide.GetLength() / 4 + 8);
+        }
+    // Room that the caller made stays.
+    String16 reserved;
+    reserved.Reserve(5000);
+    ConvertEnc<TEncUtf16, TEncUtf8>(reserved, "a\xC3\xA9", 3);
+    EXPECT_GE(reserved.GetCapacity(), 5000);
+}
+
+TEST(ConvertEncTest, VeryLongAsciiGoesBothWaysFromAnyPlace)
+{
+    String8 text;
+    char* const units = text.SetLength((1 << 22) + 100);
+    for (int i = 0; i < text.GetLength(); ++i) units[i] = static_cast<char>(i * 7 & 0x7F);
+    for (char const* tail : {"", "\u00E9 and more", "\U0001F600"}) {
+        String8 const whole = text + tail;
+        String16 wide(u"abc");
+        ConvertEnc<TEncUtf16, TEncUtf8>(wide, whole.GetData(), whole.GetLength());
+        ASSERT_TRUE((ConvertedTo<TEncUtf8>(wide.GetSubstring(3)) == whole));
+        ASSERT_TRUE((ConvertedTo<TEncUtf8>(ConvertedTo<TEncUtf32>(wide)) == String8("abc") + whole));
+    }
+}
+
 TEST(ConvertEncTest, ZeroUnitsPassThroughByLength)
 {
     EXPECT_EQ(ConvertedTo<TEncUtf16>(String8("a\0b", 3)), String16(u"a\0b", 3));

@@ -56,6 +56,19 @@ __m128i AtLeast(__m128i bytes, int bound)
     return _mm_cmpeq_epi8(_mm_max_epu8(bytes, b), bytes);
 }
 
+// Stretches of ASCII from @p i on.
+int SkipAscii(char const* s, int i, int n, bool allowZero)
+{
+    for (; n - i >= 64; i += 64) {
+        __m128i const a = Load(s + i), b = Load(s + i + 16), c = Load(s + i + 32), d = Load(s + i + 48);
+        __m128i const any = _mm_or_si128(_mm_or_si128(a, b), _mm_or_si128(c, d));
+        __m128i const least = _mm_min_epu8(_mm_min_epu8(a, b), _mm_min_epu8(c, d));
+        __m128i const zeros = _mm_cmpeq_epi8(least, _mm_setzero_si128());
+        if (_mm_movemask_epi8(any) != 0 || (!allowZero && _mm_movemask_epi8(zeros) != 0)) break;
+    }
+    return i;
+}
+
 // A byte is in its place if it is a continuation byte exactly where one of the three bytes before it asks for one, and
 // is no lead above F7. Sixteen places are asked at once, from @p i on, which has three bytes before it that are in
 // theirs; gives where the first sixteen begin that are not all in place, or fewer than sixteen bytes are left.
@@ -70,6 +83,7 @@ int SkipValid(char const* s, int i, int n, bool allowZero)
         __m128i const bad = _mm_or_si128(_mm_xor_si128(asked, tails),
                                          _mm_or_si128(AtLeast(bytes, 0xF8), _mm_cmpeq_epi8(bytes, forbidden)));
         if (_mm_movemask_epi8(bad) != 0) break;
+        if (_mm_movemask_epi8(bytes) == 0) i = SkipAscii(s, i + 16, n, allowZero) - 16;
     }
     return i;
 }

@@ -2,6 +2,7 @@
 
 #include "libkernel/core/CharTraits.h"
 #include "libkernel/core/Endian.h"
+#include "libkernel/core/internal/VectorConvert.h"
 
 #include <algorithm>
 #include <bit>
@@ -13,13 +14,15 @@
 
 // Two passes. The first counts what each unit adds to the target, with no look at its neighbours, so that sixteen units
 // can be counted at once; for well-formed text that is the exact length. The second walks code points and is held
-// to that length, which keeps ill-formed text inside the block as well. Runs of ASCII go sixteen units at a time.
+// to that length, which keeps ill-formed text inside the block as well. Between UTF-8 and UTF-16 most goes by vectors
+// (VectorConvert.cpp); elsewhere runs of ASCII go sixteen units at a time.
 
 namespace Kernel {
 namespace {
 
 constexpr int c_run = 16;
-constexpr int c_longest = 4; // Units of the longest code point.
+constexpr int c_longest = 4;       // Units of the longest code point.
+constexpr int c_asciiSample = 512; // Units from the start that tell what kind of text it is.
 
 // Units that one source unit adds to the target. The lead byte of a code point pays for the whole of it in UTF-16 and
 // UTF-32; in UTF-8 each half of a surrogate pair pays for two of its four bytes.
@@ -217,12 +220,35 @@ template <class To, class From>
 }
 
 template <class To, class From>
+constexpr bool c_hasVectors = !std::is_same_v<To, TEncUtf32> && !std::is_same_v<From, TEncUtf32>;
+
+bool IsBeyondVectors(char unit)
+{
+    return static_cast<u8>(unit) >= 0xF0;
+}
+
+bool IsBeyondVectors(char16_t unit)
+{
+    return CharTraits<TEncUtf16>::IsSurrogate(unit);
+}
+
+template <class To, class From>
 typename To::Unit* Convert(typename To::Unit* to, typename To::Unit const* const toEnd, typename From::Unit const* from,
                            typename From::Unit const* const fromEnd)
 {
     using Source = CharTraits<From>;
     using Target = CharTraits<To>;
     auto const room = [&] { return std::min(fromEnd - from, toEnd - to); };
+    if constexpr (c_hasVectors<To, From>)
+        while (room() >= c_vectorRoom && ConvertInVectors(to, toEnd, from, fromEnd) && room() >= c_longest) {
+            // Whatever the vectors stopped at, and those of its like that follow.
+            do {
+                if (IsAscii(*from))
+                    *to++ = static_cast<typename To::Unit>(*from++);
+                else
+                    ConvertFar<To, From>(to, from);
+            } while (room() >= c_longest && IsBeyondVectors(*from));
+        }
     while (room() >= c_run) {
         int const plain = CopyAscii(to, from);
         if (plain == c_run) { // A step of known length lets the next copy begin before this one is looked at.
@@ -252,6 +278,36 @@ typename To::Unit* Convert(typename To::Unit* to, typename To::Unit const* const
     return to;
 }
 
+// Text that begins with ASCII is mostly ASCII to its end, and has as many units in every encoding: it is written at
+// once, which saves the pass that measures. Gives the units that were appended so.
+template <class To, class From>
+int AppendAscii(StringT<To>& dst, typename From::Unit const* src, int n)
+{
+    if constexpr (c_hasVectors<To, From>) {
+        int const old = dst.GetLength();
+        if (n <= 0 || n > std::numeric_limits<i32>::max() - old || !IsAsciiRun(src, std::min(n, c_asciiSample)))
+            return 0;
+        int const plain = CopyAsciiRun(dst.SetLength(old + n) + old, src, n);
+        dst.SetLength(old + plain);
+        return plain;
+    }
+    return 0;
+}
+
+// Makes the text @p length units long, of which @p kept are there. The block is replaced if it was made far too large,
+// which is where it now holds more than @p reserved units.
+template <class To>
+typename To::Unit* GrowTo(StringT<To>& dst, int kept, int length, int reserved)
+{
+    if (dst.GetCapacity() > reserved && dst.GetCapacity() - length > length / 4) {
+        StringT<To> exact;
+        exact.Reserve(length);
+        exact.Append(dst.GetData(), kept);
+        dst.Swap(exact);
+    }
+    return dst.SetLength(length);
+}
+
 } // namespace
 
 template <class To, class From>
@@ -261,13 +317,15 @@ void ConvertEnc(StringT<To>& dst, typename From::Unit const* src, int n)
     if constexpr (std::is_same_v<To, From>)
         dst.Append(src, n);
     else {
-        u64 const added = TargetLength<To, From>(src, n);
         int const old = dst.GetLength();
+        int const reserved = dst.GetCapacity();
+        int const plain = AppendAscii<To, From>(dst, src, n);
+        if (plain == n) return;
+        u64 const added = static_cast<u64>(plain) + TargetLength<To, From>(src + plain, n - plain);
         if (added > static_cast<u64>(std::numeric_limits<i32>::max() - old)) throw std::bad_alloc();
-        if (added == 0) return;
         int const length = old + static_cast<int>(added);
-        auto* const units = dst.SetLength(length);
-        auto* const end = Convert<To, From>(units + old, units + length, src, src + n);
+        auto* const units = GrowTo(dst, old + plain, length, reserved);
+        auto* const end = Convert<To, From>(units + old + plain, units + length, src + plain, src + n);
         if (end != units + length) dst.SetLength(static_cast<int>(end - units));
     }
 }
