@@ -1,24 +1,17 @@
 #include "libkernel/filesystem/FileFinder.h"
 
 #include "libkernel/filesystem/FileEnumerator.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
-#include <filesystem>
-#include <gtest/gtest.h>
-#include <string>
 #include <vector>
 
 namespace Kernel {
 namespace {
 
 namespace fs = std::filesystem;
+using TestSupport::S;
 using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
-
-String8 S(std::string const& text)
-{
-    return String8{std::string_view(text)};
-}
 
 /// "kind name" of each entry, with an "l" before links.
 std::vector<std::string> Describe(std::vector<FileEnumerator::PathRec> const& paths, size_t cut)

@@ -4,12 +4,9 @@
 #include "support/CrashRecorder.h"
 #include "support/FakeClock.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
-#include <filesystem>
-#include <gtest/gtest.h>
 #include <optional>
-#include <string>
 #include <sys/stat.h>
 #include <vector>
 
@@ -22,14 +19,10 @@ using TestSupport::Fault;
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
+using TestSupport::S;
 using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 using MoveResult = FileSystem::SafeMoveFileResult;
-
-String8 S(std::string const& text)
-{
-    return String8{std::string_view(text)};
-}
 
 /// Puts two volumes in place: what is called "old" lies on another one than the rest and can't be renamed.
 class TwoVolumes
@@ -48,14 +41,14 @@ public:
 };
 
 /// A folder with "old" and "target", a clock that stands still, a log that is kept, and files that can fail.
-class FileSystemMovesTest : public testing::Test, LogSink
+class FileSystemMovesTest : public TestSupport::FileFixture, LogSink
 {
 protected:
     FileSystemMovesTest()
     {
         m_before = SetLogSink(this);
-        WriteWholeFile(m_folder / "old", "new content");
-        WriteWholeFile(m_folder / "target", "target content");
+        Make("old", "new content");
+        Make("target", "target content");
     }
     ~FileSystemMovesTest() override { SetLogSink(m_before); }
 
@@ -65,7 +58,6 @@ protected:
         m_log.push_back(text.GetData());
     }
 
-    String8 At(std::string const& name) const { return S(m_folder / name); }
     std::string Read(std::string const& name) const { return ReadWholeFile(m_folder / name); }
     std::vector<std::string> List() const
     {
@@ -76,7 +68,6 @@ protected:
         return names;
     }
 
-    TempFolder m_folder;
     FakeClock m_clock;
     std::vector<std::string> m_log;
     LogSink* m_before;

@@ -4,12 +4,9 @@
 #include "libkernel/platform/Errors.h"
 #include "libkernel/platform/FileMarks.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
 #include <fcntl.h>
-#include <filesystem>
-#include <gtest/gtest.h>
-#include <string>
 #include <sys/stat.h>
 #include <thread>
 #include <unistd.h>
@@ -19,36 +16,9 @@ namespace {
 
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
-using TestSupport::TempFolder;
-using TestSupport::WriteWholeFile;
+using TestSupport::S;
 
-String8 S(std::string const& text)
-{
-    return String8{std::string_view(text)};
-}
-
-class FileSystemTest : public testing::Test
-{
-protected:
-    String8 Make(std::string const& name, std::string const& content = "content")
-    {
-        WriteWholeFile(m_folder / name, content);
-        return S(m_folder / name);
-    }
-    String8 MakeFolder(std::string const& name)
-    {
-        std::filesystem::create_directories(m_folder / name);
-        return S(m_folder / name);
-    }
-    String8 MakeLink(std::string const& name, std::string const& target)
-    {
-        std::filesystem::create_symlink(target, m_folder / name);
-        return S(m_folder / name);
-    }
-    String8 At(std::string const& name) const { return S(m_folder / name); }
-
-    TempFolder m_folder;
-};
+using FileSystemTest = TestSupport::FileFixture;
 
 TEST_F(FileSystemTest, KindsOfEntriesAreToldApart)
 {

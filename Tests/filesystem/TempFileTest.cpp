@@ -5,14 +5,11 @@
 #include "libkernel/streams/FileInOutStream.h"
 #include "libkernel/streams/FileOutStream.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
 #include <chrono>
-#include <filesystem>
 #include <future>
-#include <gtest/gtest.h>
 #include <set>
-#include <string>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -23,13 +20,9 @@ namespace {
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
+using TestSupport::S;
 using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
-
-String8 S(std::string const& text)
-{
-    return String8{std::string_view(text)};
-}
 
 /// The first bytes of an archive with the given version and flags.
 std::string Header(int version, int flags)

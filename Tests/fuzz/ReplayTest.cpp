@@ -4,6 +4,7 @@
 #include <fstream>
 #include <gtest/gtest.h>
 #include <iterator>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -14,8 +15,11 @@
 
 namespace {
 
+// Printed by its name, for lists of tests.
 struct Target
 {
+    friend void PrintTo(Target const& target, std::ostream* out) { *out << target.name; }
+
     char const* name;
     int (*run)(uint8_t const* data, size_t size);
 };

@@ -5,7 +5,6 @@
 #include "support/FaultyFiles.h"
 #include "support/TempFolder.h"
 
-#include <algorithm>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -157,22 +156,6 @@ TEST(PlatformFile, DenyWriteHoldsBetweenProcesses)
     EXPECT_EQ(0, status);
 }
 
-TEST(PlatformFile, RefusedTruncationLeavesTheFileWhole)
-{
-    TempFolder const folder;
-    std::string const path = folder / "file";
-    WriteWholeFile(path, "text");
-    {
-        OpenHandle const holder(path, {.read = true, .write = true, .share = FileShare::DenyWrite});
-        OpenHandle const other(path, {.write = true, .create = true, .truncate = true});
-        EXPECT_EQ(EACCES, other.error);
-        EXPECT_EQ("text", ReadWholeFile(path));
-    }
-    OpenHandle const other(path, {.write = true, .create = true, .truncate = true});
-    EXPECT_EQ(0, other.error);
-    EXPECT_EQ("", ReadWholeFile(path));
-}
-
 TEST(PlatformFile, WriteOnlyFileCanBeWritten)
 {
     TempFolder const folder;
@@ -216,81 +199,13 @@ TEST(PlatformFile, CountsStopAtTheEndAndOffsetsAreChecked)
     EXPECT_EQ(EBADF, Calls().flush(c_noHandle, FlushKind::Data));
 }
 
-TEST(PlatformFile, AppendingHandlesDoNotOverwriteEachOther)
+TEST(PlatformFile, UnlinkLeavesFoldersAloneAndAMissingOneCannotBeFlushed)
 {
     TempFolder const folder;
-    OpenFlags flags = c_create;
-    flags.append = true;
-    OpenHandle const a(folder / "file", flags);
-    OpenHandle const b(folder / "file", flags);
-    for (FileHandle const handle : {a.handle, b.handle, a.handle}) Calls().write(handle, "ab", 2);
-    EXPECT_EQ("ababab", ReadWholeFile(folder / "file"));
-}
-
-TEST(PlatformFile, RenameReplacesAndFoldersList)
-{
-    TempFolder const folder;
-    WriteWholeFile(folder / "a", "new");
-    WriteWholeFile(folder / "b", "old");
     ASSERT_EQ(0, Calls().makeFolder((folder / "sub").c_str()));
-    ASSERT_EQ(0, ::symlink("sub", (folder / "link").c_str()));
-    EXPECT_EQ(0, Calls().rename((folder / "a").c_str(), (folder / "b").c_str()));
-    EXPECT_EQ(0, Calls().flushFolder(folder.GetPath().c_str()));
-    EXPECT_EQ("new", ReadWholeFile(folder / "b"));
-
-    std::vector<FolderEntry> entries;
-    ASSERT_EQ(0, Calls().listFolder(folder.GetPath().c_str(), entries));
-    std::sort(entries.begin(), entries.end(), [](auto const& x, auto const& y) { return x.name < y.name; });
-    ASSERT_EQ(3u, entries.size());
-    EXPECT_EQ("b", entries[0].name);
-    EXPECT_EQ(FileKind::File, entries[0].kind);
-    EXPECT_EQ(FileKind::Link, entries[1].kind);
-    EXPECT_EQ(FileKind::Folder, entries[2].kind);
-    EXPECT_EQ(ENOENT, Calls().listFolder((folder / "none").c_str(), entries));
+    EXPECT_NE(0, Calls().unlink((folder / "sub").c_str()));
+    EXPECT_EQ(0, Calls().flushFolder((folder / "sub").c_str()));
     EXPECT_EQ(ENOENT, Calls().flushFolder((folder / "none").c_str()));
-    EXPECT_EQ(ENOENT, Calls().unlink((folder / "a").c_str()));
-    EXPECT_NE(0, Calls().unlink((folder / "sub").c_str())) << "unlink must leave folders alone";
-
-    std::string target;
-    EXPECT_EQ(0, Calls().readLink((folder / "link").c_str(), target));
-    EXPECT_EQ("sub", target);
-    EXPECT_EQ(EINVAL, Calls().readLink((folder / "b").c_str(), target));
-}
-
-TEST(PlatformFile, TimesAndKindsComeBackAsSet)
-{
-    TempFolder const folder;
-    std::string const path = folder / "file";
-    WriteWholeFile(path, "text");
-    FileInfo before;
-    ASSERT_EQ(0, Calls().stat(path.c_str(), true, before));
-    ASSERT_EQ(0, Calls().setTimes(path.c_str(), -1'500'000'000, c_keepTime));
-    FileInfo info;
-    ASSERT_EQ(0, Calls().stat(path.c_str(), true, info));
-    EXPECT_EQ(-1'500'000'000, info.accessTime) << "1.5 s before 1970";
-    EXPECT_EQ(before.modifyTime, info.modifyTime);
-    EXPECT_EQ(4u, info.size);
-    EXPECT_EQ(FileKind::File, info.kind);
-    EXPECT_EQ(before.inode, info.inode);
-    EXPECT_EQ(ENOENT, Calls().stat((folder / "none").c_str(), true, info));
-    EXPECT_EQ(FileKind::None, info.kind);
-}
-
-TEST(PlatformFile, AttributesComeBackAsSet)
-{
-    TempFolder const folder;
-    std::string const path = folder / "file";
-    WriteWholeFile(path, "text");
-    std::string const value("a\0b", 3);
-    int const error = Calls().setAttribute(path.c_str(), "kernel.test", value.data(), value.size());
-    if (error == EOPNOTSUPP) GTEST_SKIP() << "the temporary folder's file system has no extended attributes";
-    ASSERT_EQ(0, error);
-    std::string got;
-    EXPECT_EQ(0, Calls().getAttribute(path.c_str(), "kernel.test", got));
-    EXPECT_EQ(value, got);
-    EXPECT_EQ(0, Calls().removeAttribute(path.c_str(), "kernel.test"));
-    EXPECT_EQ(ENODATA, Calls().getAttribute(path.c_str(), "kernel.test", got));
-    EXPECT_EQ("", got);
 }
 
 TEST(PlatformFile, FolderOfAPathIsWhatItsNameLiesIn)
@@ -363,21 +278,6 @@ TEST_F(StdioTest, FaultShowsThroughTheStream)
     EXPECT_EQ(EOF, std::fclose(file));
     EXPECT_EQ(0, files.GetOpenHandles()) << "a failed close must not leak the handle";
     EXPECT_EQ("01234", ReadWholeFile(m_folder / "file"));
-}
-
-TEST_F(StdioTest, AppendingStreamWritesBehindOthers)
-{
-    OpenFlags flags = c_create;
-    flags.append = true;
-    std::FILE* const file = Open(flags, "a+");
-    ASSERT_TRUE(file);
-    std::fputs("ab", file);
-    std::fflush(file);
-    WriteWholeFile(m_folder / "file", "longer text");
-    std::rewind(file);
-    std::fputs("cd", file);
-    std::fclose(file);
-    EXPECT_EQ("longer textcd", ReadWholeFile(m_folder / "file"));
 }
 
 } // namespace

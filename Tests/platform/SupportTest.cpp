@@ -79,28 +79,6 @@ TEST_F(CrashTest, UnflushedReplacementIsCaught)
     }
 }
 
-TEST(FaultyFiles, EachFaultStrikesOnceAndLeavesNoHandle)
-{
-    for (FileCall const call :
-         {FileCall::Open, FileCall::Write, FileCall::Flush, FileCall::Close, FileCall::Rename, FileCall::FlushFolder})
-    {
-        TempFolder const folder;
-        WriteWholeFile(folder / "file", "old");
-        bool ok = false;
-        int const fired = ForEachFault(
-            {.call = call, .error = EIO},
-            [&](FaultyFiles& files) {
-                ok = Replace(folder, "new", true);
-                EXPECT_EQ(files.HasFired(), !ok);
-                EXPECT_EQ(0, files.GetOpenHandles());
-            },
-            [&](int) { EXPECT_EQ(ok, &GetFileCalls() == &GetSystemFileCalls() && ok); });
-        EXPECT_EQ(1, fired) << static_cast<int>(call);
-        EXPECT_TRUE(ok);
-        EXPECT_EQ("new", ReadWholeFile(folder / "file"));
-    }
-}
-
 TEST(FaultyFiles, PlansCountShortenAndLose)
 {
     TempFolder const folder;

@@ -76,39 +76,5 @@ TEST(Base64Test, StreamFormsAgreeWithTheWholeAtEverySliceBorder)
     }
 }
 
-TEST(Base64Test, OutStreamPadsOnlyWhenItDies)
-{
-    constexpr u64 block = Base64OutStream::c_rawBlockSize;
-    for (u64 size : {u64(0), u64(1), block - 1, block, block + 1, 2 * block + 2}) {
-        SCOPED_TRACE(size);
-        Testing::Bytes const data = Testing::MakePixels(size, 4);
-        Counted<ByteSink> sink = MakeCounted<ByteSink>();
-        auto stream = MakeCounted<Base64OutStream>(sink);
-        for (u64 at = 0; at < size;) {
-            u64 const part = std::min<u64>(1000, size - at);
-            ASSERT_EQ(stream->WriteBlock(data.data() + at, part), part);
-            at += part;
-        }
-        EXPECT_TRUE(stream->Flush());
-        EXPECT_EQ(sink->bytes.size(), size / block * 16384);
-        EXPECT_EQ(stream->Tell(), size);
-        stream.Reset();
-        String8 const whole =
-            EncodeToBase64(String8(reinterpret_cast<char const*>(data.data()), static_cast<int>(size)));
-        EXPECT_EQ(sink->GetText(), std::string(whole.GetView()));
-    }
-}
-
-TEST(Base64Test, FullTargetFailsTheOutStreamForGood)
-{
-    Testing::Bytes const data(3 * Base64OutStream::c_rawBlockSize);
-    Counted<ByteSink> sink = MakeCounted<ByteSink>(20000);
-    auto stream = MakeCounted<Base64OutStream>(sink);
-    EXPECT_EQ(stream->WriteBlock(data.data(), data.size()), 0u);
-    EXPECT_EQ(stream->WriteBlock(data.data(), 1), 0u);
-    stream.Reset();
-    EXPECT_EQ(sink->writes, 2);
-}
-
 } // namespace
 } // namespace Kernel

@@ -63,28 +63,5 @@ TEST(Base85Test, TooSmallADestinationLeavesTheColumn)
     EXPECT_EQ(column, 5);
 }
 
-TEST(Base85Test, OutStreamAgreesWithTheWholeAcrossBlocks)
-{
-    constexpr u64 block = Base85OutStream::c_rawBlockSize;
-    for (u64 size : {u64(0), u64(3), u64(1201), block, block + 1, 3 * block - 2})
-        for (int lineMode : {0, 1, 2}) {
-            SCOPED_TRACE(size);
-            Testing::Bytes data = Testing::MakePixels(size, 5);
-            std::fill_n(data.begin(), size / 3, u8(0)); // Runs of 'z' put the lines out of step with the slices.
-            Counted<ByteSink> sink = MakeCounted<ByteSink>();
-            auto stream = MakeCounted<Base85OutStream>(sink, lineMode);
-            for (u64 at = 0; at < size;) {
-                u64 const part = std::min<u64>(701, size - at);
-                ASSERT_EQ(stream->WriteBlock(data.data() + at, part), part);
-                at += part;
-            }
-            EXPECT_TRUE(stream->Flush());
-            EXPECT_EQ(sink->bytes.empty(), size < block);
-            EXPECT_EQ(stream->GetSize(), size);
-            stream.Reset();
-            EXPECT_EQ(sink->GetText(), Encode(std::string(data.begin(), data.end()), lineMode));
-        }
-}
-
 } // namespace
 } // namespace Kernel

@@ -3,9 +3,8 @@
 #include "StreamTestSupport.h"
 #include "libkernel/platform/Errors.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <thread>
 
@@ -16,17 +15,11 @@ using namespace Test;
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
-using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 using Result = File::OpenUnmanagedResult;
 using ShareMode = File::ShareMode;
 
-class FileInOutStreamTest : public testing::Test
-{
-protected:
-    TempFolder m_folder;
-    std::string const m_path = m_folder / "file";
-};
+using FileInOutStreamTest = TestSupport::FileFixture;
 
 TEST_F(FileInOutStreamTest, EachFormOpensOrMakesTheFile)
 {

@@ -3,9 +3,8 @@
 #include "StreamTestSupport.h"
 #include "libkernel/streams/FastFileInStream.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
-#include <gtest/gtest.h>
 #include <random>
 
 namespace Kernel {
@@ -14,10 +13,9 @@ namespace {
 using namespace Test;
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
-using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 
-class FileInStreamTest : public testing::Test
+class FileInStreamTest : public TestSupport::FileFixture
 {
 protected:
     FileInStreamTest() { WriteWholeFile(m_path, m_text); }
@@ -30,8 +28,6 @@ protected:
     }
 
     FaultyFiles m_calls;
-    TempFolder m_folder;
-    std::string const m_path = m_folder / "file";
     std::string const m_text = Pattern(20'000);
 };
 

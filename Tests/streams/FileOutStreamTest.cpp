@@ -4,9 +4,8 @@
 #include "libkernel/streams/FastFileOutStream.h"
 #include "libkernel/streams/FileInOutStream.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
-#include <gtest/gtest.h>
 #include <random>
 
 namespace Kernel {
@@ -16,16 +15,10 @@ using namespace Test;
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
-using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 using Result = File::OpenUnmanagedResult;
 
-class FileOutStreamTest : public testing::Test
-{
-protected:
-    TempFolder m_folder;
-    std::string const m_path = m_folder / "file";
-};
+using FileOutStreamTest = TestSupport::FileFixture;
 
 // Both kinds of seekable file stream against a memory stream. The seeks stay inside, since a file seek alone does not
 // lengthen a file.

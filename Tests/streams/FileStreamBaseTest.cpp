@@ -8,10 +8,9 @@
 #include "libkernel/streams/FileInStream.h"
 #include "libkernel/streams/FileOutStream.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
 #include <functional>
-#include <gtest/gtest.h>
 
 namespace Kernel {
 namespace {
@@ -21,7 +20,6 @@ using TestSupport::Fault;
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
-using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 using Reason = FileIOException::Reason;
 
@@ -137,7 +135,7 @@ std::vector<FaultCase> MakeFaultCases()
     };
 }
 
-class FileStreamBaseTest : public testing::Test
+class FileStreamBaseTest : public TestSupport::FileFixture
 {
 protected:
     FileStreamBaseTest() { WriteWholeFile(m_path, Pattern(5000)); }
@@ -164,8 +162,6 @@ protected:
     }
 
     FaultyFiles m_faults;
-    TempFolder m_folder;
-    std::string const m_path = m_folder / "file";
 };
 
 TEST_F(FileStreamBaseTest, WithoutAHandlerTheFirstFailureIsThrownOnce)

@@ -4,11 +4,9 @@
 #include "libkernel/platform/FileMarks.h"
 #include "libkernel/platform/PlatformFile.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
 
 #include <cstdio>
-#include <filesystem>
-#include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -18,17 +16,11 @@ namespace {
 using TestSupport::FaultyFiles;
 using TestSupport::FileCall;
 using TestSupport::ReadWholeFile;
-using TestSupport::TempFolder;
 using TestSupport::WriteWholeFile;
 using Result = File::OpenUnmanagedResult;
 using AccessMode = File::AccessMode;
 
-class FileTest : public testing::Test
-{
-protected:
-    TempFolder m_folder;
-    std::string const m_path = m_folder / "file";
-};
+using FileTest = TestSupport::FileFixture;
 
 TEST_F(FileTest, ModesDoWhatTheCLibrarysDo)
 {

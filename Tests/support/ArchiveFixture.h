@@ -4,10 +4,9 @@
 #include "libkernel/archive/ArchiveRevision.h"
 #include "libkernel/archive/ArchiveSession.h"
 #include "support/BytesItem.h"
+#include "support/TempFolder.h"
 
-#include <fstream>
 #include <gtest/gtest.h>
-#include <iterator>
 #include <map>
 #include <optional>
 #include <string>
@@ -16,16 +15,8 @@ namespace KernelTest {
 
 constexpr Kernel::IDTag c_documentTag("Docu");
 
-inline std::string ReadWhole(std::string const& path)
-{
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
-}
-
-inline void WriteWhole(std::string const& path, std::string const& bytes)
-{
-    std::ofstream(path, std::ios::binary).write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
-}
+inline constexpr auto& ReadWhole = TestSupport::ReadWholeFile;
+inline constexpr auto& WriteWhole = TestSupport::WriteWholeFile;
 
 inline Kernel::String8 Str(std::string const& s)
 {
