@@ -229,6 +229,28 @@ TEST_F(TempFileTest, StartEmptiesTheFoldersButKeepsMidStreamlineFiles)
     EXPECT_TRUE(FileSystem::IsDirectory(S(m_second / "folder")));
 }
 
+TEST_F(TempFileTest, FileThatCannotBeAskedForItsMarkStays)
+{
+    struct Case
+    {
+        FileCall call;
+        int error;
+        bool stays;
+    };
+    FaultyFiles faults;
+    for (Case const& c : {Case{FileCall::Open, EMFILE, true}, Case{FileCall::Open, EACCES, true},
+                          Case{FileCall::Read, EIO, true}, Case{FileCall::Open, ENOENT, false}})
+    {
+        WriteWholeFile(m_second / "rescue", Header(11, 4));
+        faults.Clear();
+        faults.Plan({.call = c.call, .error = c.error, .path = "rescue"});
+        std::vector<String8> rescued;
+        TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
+        EXPECT_TRUE(rescued.empty());
+        EXPECT_EQ(FileSystem::Exists(S(m_second / "rescue")), c.stays) << c.error;
+    }
+}
+
 TEST_F(TempFileTest, MidStreamlineMarkIsReadFromAWholeHeaderOnly)
 {
     struct Case

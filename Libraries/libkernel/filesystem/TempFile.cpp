@@ -79,6 +79,41 @@ Counted<Stream> MakeFile(String8& out, String8 const& extension, bool second, Ma
     return nullptr;
 }
 
+enum class Mark
+{
+    Unknown, // The file could not be asked for a reason that may pass.
+    Unset,
+    Set
+};
+
+// The first 12 bytes of an archive file, little-endian:
+//
+//   offset  size  field
+//        0     4  magic, the bytes 00 FF 4B 41
+//        4     2  version, 7 to 11
+//        6     2  flags; bit 2 is the mid-streamline mark
+//        8     4  kind of document
+Mark GetMark(String8 const& path)
+{
+    constexpr u32 c_magic = 0x414BFF00;
+    constexpr u16 c_firstVersion = 7;
+    constexpr u16 c_lastVersion = 11;
+    constexpr u16 c_midStreamline = 1u << 2;
+    u8 header[12];
+    OpenFile file;
+    FileDetail::Failure const failure = FileDetail::GetFailure(file.Open(path, {.read = true}));
+    if (failure == FileDetail::Failure::TooManyOpen || failure == FileDetail::Failure::AccessDenied)
+        return Mark::Unknown;
+    if (failure != FileDetail::Failure::None) return Mark::Unset;
+    Platform::IoResult const read = Platform::GetFileCalls().readAt(file.Get(), header, sizeof header, 0);
+    if (read.error != 0) return Mark::Unknown;
+    if (read.count != sizeof header) return Mark::Unset;
+    u16 const version = LoadLittleEndian<u16>(header + 4);
+    bool const isSet = LoadLittleEndian<u32>(header) == c_magic && version >= c_firstVersion &&
+                       version <= c_lastVersion && (LoadLittleEndian<u16>(header + 6) & c_midStreamline) != 0;
+    return isSet ? Mark::Set : Mark::Unset;
+}
+
 } // namespace
 
 void TempFile::SetTempPath(String8 const& path)
@@ -95,10 +130,9 @@ void TempFile::SetTempPath(String8 const& path, String8 const& secondPath, std::
     if (!entries) return;
     for (FileEnumerator::PathRec const& entry : entries->GetPaths()) {
         if (entry.kind != FileEnumerator::Kind::File) continue;
-        if (IsMidStreamlineFile(entry.path))
-            rescued.push_back(entry.path);
-        else
-            FileSystem::Delete(entry.path, 0);
+        Mark const mark = GetMark(entry.path);
+        if (mark == Mark::Set) rescued.push_back(entry.path);
+        if (mark == Mark::Unset) FileSystem::Delete(entry.path, 0);
     }
 }
 
@@ -140,26 +174,9 @@ Counted<FileOutStream> TempFile::GenerateTempOutFile(String8& out, String8 const
     });
 }
 
-// The first 12 bytes of an archive file, little-endian:
-//
-//   offset  size  field
-//        0     4  magic, the bytes 00 FF 4B 41
-//        4     2  version, 7 to 11
-//        6     2  flags; bit 2 is the mid-streamline mark
-//        8     4  kind of document
 bool TempFile::IsMidStreamlineFile(String8 const& path)
 {
-    constexpr u32 c_magic = 0x414BFF00;
-    constexpr u16 c_firstVersion = 7;
-    constexpr u16 c_lastVersion = 11;
-    constexpr u16 c_midStreamline = 1u << 2;
-    u8 header[12];
-    OpenFile file;
-    if (file.Open(path, {.read = true}) != 0) return false;
-    if (Platform::GetFileCalls().readAt(file.Get(), header, sizeof header, 0).count != sizeof header) return false;
-    u16 const version = LoadLittleEndian<u16>(header + 4);
-    return LoadLittleEndian<u32>(header) == c_magic && version >= c_firstVersion && version <= c_lastVersion &&
-           (LoadLittleEndian<u16>(header + 6) & c_midStreamline) != 0;
+    return GetMark(path) == Mark::Set;
 }
 
 } // namespace Kernel

@@ -27,8 +27,9 @@ public:
     /// Sets the folder for temporaries and deletes every file in it: what an earlier run left behind.
     static void SetTempPath(String8 const& path);
 
-    /// The same, and sets the second folder. Of the files there, those with the mid-streamline mark are added to
-    /// @p rescued, as full paths, and stay; the others are deleted.
+    /// The same, and sets the second folder, which must be another one. Of the files there, those with the
+    /// mid-streamline mark are added to @p rescued, as full paths, and stay; the others are deleted, except what could
+    /// not be opened or read for the moment: it may be somebody's only copy.
     static void SetTempPath(String8 const& path, String8 const& secondPath, std::vector<String8>& rescued);
 
     static bool HaveTempPath();
