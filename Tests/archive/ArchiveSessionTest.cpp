@@ -6,6 +6,7 @@
 #include "support/ArchiveFixture.h"
 #include "support/TempFolder.h"
 
+#include <fstream>
 #include <gtest/gtest.h>
 #include <thread>
 

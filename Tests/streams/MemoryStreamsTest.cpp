@@ -59,24 +59,18 @@ TEST(MemoryStreamsTest, SeeksInsideLandWhereTheyShouldInEveryStream)
     Counted<FragmentedRawDataStream> const fragments = FragmentedRawDataStream::Create(data);
     NullOutStream target, null;
     BufferedOutStream buffered(target, 1024);
-    for (OutStream* out : {static_cast<OutStream*>(memory.Get()), static_cast<OutStream*>(fragments.Get()),
-                           static_cast<OutStream*>(&null), static_cast<OutStream*>(&buffered)})
-        Write(*out, text);
+    for (OutStream* out : std::vector<OutStream*>{memory.Get(), fragments.Get(), &null, &buffered}) Write(*out, text);
 
     for (SeekCase const& c : c_seeksInside) {
         SCOPED_TRACE(c.what);
-        for (InStreamSeekable* in :
-             {static_cast<InStreamSeekable*>(reader.Get()), static_cast<InStreamSeekable*>(memory.Get()),
-              static_cast<InStreamSeekable*>(fragments.Get())})
-        {
+        for (InStreamSeekable* in : std::vector<InStreamSeekable*>{reader.Get(), memory.Get(), fragments.Get()}) {
             EXPECT_TRUE(in->Seek(40) && in->Seek(c.method, c.offset));
             EXPECT_EQ(in->Tell(), c.expected);
             EXPECT_FALSE(in->Seek(static_cast<SeekMethod>(3), 0));
             EXPECT_FALSE(in->Seek(static_cast<SeekMethod>(-1), 0));
             EXPECT_EQ(in->Tell(), c.expected);
         }
-        for (OutStreamSeekable* out :
-             {static_cast<OutStreamSeekable*>(&null), static_cast<OutStreamSeekable*>(&buffered)}) {
+        for (OutStreamSeekable* out : std::vector<OutStreamSeekable*>{&null, &buffered}) {
             EXPECT_TRUE(out->Seek(40) && out->Seek(c.method, c.offset));
             EXPECT_EQ(out->Tell(), c.expected);
             EXPECT_FALSE(out->Seek(static_cast<SeekMethod>(3), 0));
@@ -124,9 +118,7 @@ TEST(MemoryStreamsTest, TruncationEndsAtTheSmallerOfSizeAndEnd)
             FragmentedRawDataStream::Create(MakeCounted<FragmentedRawData>(u64{0}));
         NullOutStream target, null;
         BufferedOutStream buffered(target);
-        for (OutStreamSeekable* out :
-             {static_cast<OutStreamSeekable*>(memory.Get()), static_cast<OutStreamSeekable*>(fragments.Get()),
-              static_cast<OutStreamSeekable*>(&null), static_cast<OutStreamSeekable*>(&buffered)})
+        for (OutStreamSeekable* out : std::vector<OutStreamSeekable*>{memory.Get(), fragments.Get(), &null, &buffered})
         {
             Write(*out, "abcdef");
             out->Seek(1);
