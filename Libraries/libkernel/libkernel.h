@@ -8,6 +8,7 @@
 #include "libkernel/archive/ArchiveReferenceInfo.h"
 #include "libkernel/archive/ArchiveRevision.h"
 #include "libkernel/archive/ArchiveSession.h"
+#include "libkernel/archive/ArchiveStreamline.h"
 #include "libkernel/archive/ArchiveThumbnails.h"
 #include "libkernel/concurrency/CriticalSection.h"
 #include "libkernel/concurrency/Dispatch.h"

@@ -11,6 +11,7 @@
 
 #include <functional>
 #include <memory>
+#include <set>
 #include <vector>
 
 namespace Kernel {
@@ -18,9 +19,11 @@ namespace Kernel {
 class ArchiveErrorCallback;
 class ArchiveSession;
 class ArchiveSessionHandle;
+class ArchiveStreamlineProgress;
 class ArchiveThumbnails;
 class InStream;
 class InStreamSeekable;
+class OutStream;
 struct ArchiveImpl;
 
 /// The document container on disk: a file store over one append-only master file and, optionally, a scratch file beside
@@ -42,6 +45,7 @@ public:
     class AccessBlock;
     class AccessBlockAdorner;
     class OffliningUpdater;
+    struct StreamlineData; // What a streamline has written: the archive's own.
 
     enum OpenMode
     {
@@ -178,6 +182,34 @@ public:
         CaptureDone = 0,
         CaptureNoAccess = 1,
         CaptureFailed = 2 ///< Or there is a scratch file.
+    };
+
+    enum ConvertToThrowAwayResult
+    {
+        ConvertDone = 0,
+        ConvertNoAccess = 1,
+        ConvertFailed = 2,
+        ConvertNoMemory = 3
+    };
+
+    enum StreamlineResult
+    {
+        StreamlineDone = 0, ///< Or nothing needed doing.
+        StreamlineAborted = 1,
+        StreamlineFailed = 2,     ///< A session or stream is active, no master, read-only, a bad block, ...
+        StreamlineNotCreated = 3, ///< The new file could not be created.
+        StreamlineNoAccess = 4,   ///< The file cannot be had, is no longer the one that was opened, or a write failed.
+        StreamlineNotVerified = 6,
+        StreamlineOverwriteFailed = 7, ///< The temporary stays: it is the only whole copy.
+        StreamlineNoSpace = 8          ///< The same, for lack of space.
+    };
+
+    /// What a check of the files against the archive's own tables found.
+    enum VerifyResult
+    {
+        VerifyMatch = 0,
+        VerifyNotRun = 1,  ///< There is no memory, or the files cannot be had.
+        VerifyMismatch = 2 ///< The files have been shunted.
     };
 
     /// What a scratch file says about its master, read without opening an archive.
@@ -370,6 +402,9 @@ public:
     bool ExternalUpdateRestoreToUnsaved();
     /// Moves the archive's single file into a temporary path and makes the archive throw-away.
     CaptureResult CaptureToThrowaway();
+    /// Writes what the archive holds to a new temporary file, without history or thumbnails, and goes on with that. The
+    /// old files stay on disk and are no longer the archive's. An archive that is throw-away already stays as it is.
+    ConvertToThrowAwayResult ConvertToThrowAway();
 
     // Sessions. The abort flag may be null; another thread may set it at any time.
 
@@ -382,6 +417,9 @@ public:
     /// Commits and releases the session. Returns only when the save is on the device; a throw means that the last
     /// committed state stands, but for failures of the final move of a temporary.
     void CloseSession(ArchiveSessionHandle& handle, bool updateTimestamps);
+    /// The same; then reads the tables of both files back and compares them with those in memory, before anybody else
+    /// can save. After a mismatch @p report is the id under which the files were shunted, see SetShuntPath.
+    VerifyResult CloseSessionAndVerifyFileState(ArchiveSessionHandle& handle, String8& report, bool updateTimestamps);
 
     // Reading. Paths are looked up at the working revision: the head, unless the archive has been rewound.
 
@@ -427,6 +465,55 @@ public:
     u64 GetRewindCount() const;
     Counted<ArchiveThumbnails const> LoadThumbnails();
 
+    /// True if every path exists at the working revision. Otherwise shunts the files, with the missing paths in the
+    /// log, and gives the id in @p report.
+    bool VerifyExistingFiles(std::set<String8> const& paths, String8& report) const;
+    /// True if some revision has data for a path that is not in @p paths.
+    bool TestForAdditionalFiles(std::set<String8> const& paths) const;
+
+    // Streamlining: the newest version of each file, as the working revision shows it, in a compact file without
+    // history or user data. Stored bytes are copied, never packed again, in one pass through one buffer of 1 MiB.
+    // Everybody else's reads and saves wait until it is done. While a session runs or a stream is open it is refused.
+
+    /// True if the history holds something that a rewrite would drop: a deletion, or a file saved again.
+    bool RequiresStreamlining() const;
+    /// True if the master is of an older format version.
+    bool StreamliningAdviseable() const;
+    /// Makes the master compact in place; does nothing where that is not required. The compact file is on the device
+    /// before anything is replaced. Then it is moved over the master, or where that cannot be done its bytes are
+    /// written over the master's, which meanwhile carries a mark: see IsMidStreamlineFile. Every pointer may be null.
+    ///
+    /// A failure leaves the master as it was, but for a replacement or overwriting that fails half way: the archive is
+    /// then empty or its file suspect, no session starts any more, and it must be opened again.
+    StreamlineResult Streamline(bool const* abort, Counted<ArchiveStreamlineProgress> const& progress,
+                                MarshalledFileAccess const* marshalled);
+    /// The same, and the compact file is checked against the archive before anything is replaced. @p report receives
+    /// the id of the shunt on a mismatch.
+    StreamlineResult StreamlineAndVerifyFileState(String8& report, bool const* abort,
+                                                  Counted<ArchiveStreamlineProgress> const& progress,
+                                                  MarshalledFileAccess const* marshalled);
+    /// Writes a compact copy to @p path, over what stands there; the archive stays as it is.
+    StreamlineResult StreamlineToNew(String8 const& path) const;
+    /// Writes a compact copy, front to back, without thumbnails. An archive that needs no streamlining is copied as it
+    /// stands up to its end.
+    StreamlineResult StreamlineToOutStream(OutStream& out) const;
+    StreamlineResult StreamlineToFragmentedRawData(FragmentedRawData& data) const;
+    /// Writes a compact copy to @p path and goes on with that as master. The old file stays on disk and is no longer
+    /// the archive's.
+    StreamlineResult StreamlineAndSwitch(String8 const& path);
+    /// The same, as scratch file of an archive that has no master any more.
+    StreamlineResult StreamlineAndSwitchAsScratch(String8 const& path);
+    /// The file has the mark of a streamline's temporary, or of a master that was being overwritten by one. A host asks
+    /// this before it trusts such a master.
+    static bool IsMidStreamlineFile(String8 const& path);
+    /// The archive's one file up to its end, byte for byte. Null when there are two, during a session, and when the
+    /// file cannot be read.
+    Counted<RawData> ExtractToRawData() const;
+    bool IsDoingStreamline() const;
+    /// Off by default. On: Streamline always overwrites the master and never moves a file over it.
+    void SetAlwaysStreamlineOverwrite(bool always);
+    bool GetAlwaysStreamlineOverwrite() const;
+
     // Keeping data without the file.
 
     /// Copies all data out of the file on a background job. @p updater may be null.
@@ -439,6 +526,9 @@ public:
 
     static void SetBackupPath(String8 const& path);
     static String8 GetBackupPath();
+    /// The folder that files are copied to, with a log, when a check of them fails; empty, as at first, for none. What
+    /// the check reports is then the id that the copies' names begin with, with "-NOLOG" behind it when the log could
+    /// not be written; and "NOLOG" without a folder.
     static void SetShuntPath(String8 const& path);
     static String8 GetShuntPath();
     /// Around the end of the process: the first stops background work of every archive, the second drops what is shared
@@ -459,6 +549,7 @@ private:
     friend class ArchiveSession;
     friend class ArchiveSessionHandle;
     friend class ArchiveCommit;
+    friend class ArchiveStreamliner;
 
     explicit Archive(IDTag tag);
 

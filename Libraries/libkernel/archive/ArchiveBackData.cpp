@@ -3,6 +3,7 @@
 #include "libkernel/archive/internal/ArchiveAppender.h"
 #include "libkernel/archive/internal/ArchiveBucket.h"
 #include "libkernel/archive/internal/ArchiveInStream.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/concurrency/Dispatch.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/Endian.h"
@@ -376,6 +377,7 @@ Counted<FileStoreBackData const> Archive::CreateBackData(NonCounted<FileStoreRev
                                                          String8 const& path)
 {
     if (!revision || path.IsEmpty() || IsCorrupted()) return nullptr;
+    ArchiveReadGate gate(*m);
     FileRevision entry;
     Counted<ArchiveFile> file;
     Counted<Revision> holds;
@@ -401,6 +403,7 @@ Counted<FileStoreBackData const> Archive::CreateBackData(NonCounted<FileStoreRev
     try {
         copy = store.Copy(*m, *file, entry, nullptr);
     } catch (ArchiveCRCException const&) {
+        gate.Leave();
         try {
             m->ReportCorruption(true);
         } catch (ArchiveCorruptionException const&) {

@@ -48,7 +48,6 @@ private:
     void WriteThumbnails();
     bool TryWriteThumbnails();
     void CopyFields();
-    bool ClearScratch();
     void AddRevision();
     void TellObjects();
     void MoveHolders();
@@ -104,7 +103,7 @@ void ArchiveCommit::Run(bool updateTimestamps)
     // Behind the holders, which take what they need from the scratch file's old blocks: a front that has grown, by the
     // master's path or by a reference path, writes over the first of them.
     if (clearsScratch) {
-        ClearScratch();
+        m_impl.ResetScratch(m_file, m.nextFreeUID);
         DropScratchRevisions();
     }
     Attempt([this] { QueueForOfflining(); });
@@ -400,45 +399,6 @@ void ArchiveCommit::CopyFields()
     m_file.m_saveCount = m_info.saveCount;
     m_file.m_nextFreeUID = m_info.nextFreeUID;
     m_file.m_rawInfo = m_info;
-}
-
-// Ties the scratch file to the master's new state, with no revision of its own. Its old blocks stay where they are
-// until the next scratch session writes over them. On failure the archive goes on without a scratch file.
-bool ArchiveCommit::ClearScratch()
-{
-    Archive::ArchiveFile& scratch = *m_impl.m_scratch;
-    FreshFile fresh;
-    fresh.archiveUID = m_impl.m_archiveUID;
-    fresh.info.totalBytes = m_file.m_totalBytes;
-    fresh.info.deadBytes = m_file.m_deadBytes;
-    fresh.info.saveTimeStamp = TimeStamp::GetCurrent();
-    fresh.info.saveCount = m_file.m_saveCount;
-    fresh.info.nextFreeUID = m.nextFreeUID;
-    fresh.hasLink = true;
-    fresh.linkSaveTimeStamp = m_file.m_saveTimeStamp;
-    fresh.linkSaveCount = m_file.m_saveCount;
-    fresh.linkPath = m_file.m_finalPath.IsEmpty() ? m_file.m_path : m_file.m_finalPath;
-    bool cleared = false;
-    try {
-        CriticalSectionScope const lock(scratch.m_lock);
-        if (scratch.m_referenceInfo) {
-            fresh.hasReference = true;
-            fresh.referencePath = scratch.m_referenceInfo->GetPath();
-        }
-        fresh.writeCounter = scratch.m_writeCounter + 1;
-        std::vector<u8> bytes;
-        cleared = EncodeFresh(bytes, fresh) && scratch.m_stream &&
-                  scratch.m_stream->WriteAt(0, bytes.data(), bytes.size()) == bytes.size() &&
-                  scratch.m_stream->ForceFlush() && !scratch.m_stream->IsBroken();
-        if (cleared) m_impl.SetFreshFields(scratch, fresh);
-    } catch (Exception const&) {
-    } catch (std::bad_alloc const&) {
-    }
-    if (!cleared) {
-        CriticalSectionScope const lock(m_impl.m_stateLock);
-        m_impl.m_scratch = nullptr;
-    }
-    return cleared;
 }
 
 void ArchiveCommit::AddRevision()

@@ -114,6 +114,44 @@ bool ArchiveImpl::WriteFreshFile(Archive::ArchiveFile& file, FreshFile& fresh)
     return true;
 }
 
+// The scratch file's old blocks stay where they are until the next scratch session writes over them.
+bool ArchiveImpl::ResetScratch(Archive::ArchiveFile const& master, u32 nextFreeUID)
+{
+    Archive::ArchiveFile& scratch = *m_scratch;
+    FreshFile fresh;
+    fresh.archiveUID = m_archiveUID;
+    fresh.info.totalBytes = master.m_totalBytes;
+    fresh.info.deadBytes = master.m_deadBytes;
+    fresh.info.saveTimeStamp = TimeStamp::GetCurrent();
+    fresh.info.saveCount = master.m_saveCount;
+    fresh.info.nextFreeUID = nextFreeUID;
+    fresh.hasLink = true;
+    fresh.linkSaveTimeStamp = master.m_saveTimeStamp;
+    fresh.linkSaveCount = master.m_saveCount;
+    fresh.linkPath = master.m_finalPath.IsEmpty() ? master.m_path : master.m_finalPath;
+    bool cleared = false;
+    try {
+        CriticalSectionScope const lock(scratch.m_lock);
+        if (scratch.m_referenceInfo) {
+            fresh.hasReference = true;
+            fresh.referencePath = scratch.m_referenceInfo->GetPath();
+        }
+        fresh.writeCounter = scratch.m_writeCounter + 1;
+        std::vector<u8> bytes;
+        cleared = EncodeFresh(bytes, fresh) && scratch.m_stream &&
+                  scratch.m_stream->WriteAt(0, bytes.data(), bytes.size()) == bytes.size() &&
+                  scratch.m_stream->ForceFlush() && !scratch.m_stream->IsBroken();
+        if (cleared) SetFreshFields(scratch, fresh);
+    } catch (Exception const&) {
+    } catch (std::bad_alloc const&) {
+    }
+    if (!cleared) {
+        CriticalSectionScope const lock(m_stateLock);
+        m_scratch = nullptr;
+    }
+    return cleared;
+}
+
 namespace {
 
 /// The info block of a file that was never saved into.

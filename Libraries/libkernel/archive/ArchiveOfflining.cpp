@@ -1,5 +1,6 @@
 #include "libkernel/archive/internal/ArchiveBucket.h"
 #include "libkernel/archive/internal/ArchiveInStream.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/concurrency/Dispatch.h"
 #include "libkernel/core/Limits.h"
 #include "libkernel/filestore/BackstoreException.h"
@@ -176,6 +177,9 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
     Counted<FileStoreBackData const> copy;
     ArchiveBackDataBucketStore& store = ArchiveBackDataBucketStore::GetInstance();
     try {
+        ArchiveReadGate const gate(*this);
+        // A streamline that ran meanwhile has moved the bytes and emptied the queue.
+        if (!FindRevision(revision.Get())) return true;
         ArchiveAccessScope const access(*this);
         if (!access.IsOpen()) return false;
         // Without a CRC of the stored bytes the only way to test them is to unpack them.

@@ -225,6 +225,8 @@ void ArchiveSession::State::CopyStored(ArchiveQueueEntry const& queued)
         Counted<Archive::ArchiveFile> sourceFile;
         {
             CriticalSectionScope const scope(from.m_stateLock);
+            // Streamlined away since the copy was queued: to leave the file out without a word would lose it.
+            if (!from.AsRevisionCS(queued.sourceRevision.Get())) throw OutStream::WriteException();
             Archive::FileInfo* const info = from.FindFileInfoCS(sourcePath);
             Archive::Revision* where = nullptr;
             Archive::FileRevision* const found =

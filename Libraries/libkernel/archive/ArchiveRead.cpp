@@ -1,5 +1,6 @@
 #include "libkernel/archive/internal/ArchiveAppender.h"
 #include "libkernel/archive/internal/ArchiveInStream.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/Endian.h"
 #include "libkernel/core/Limits.h"
@@ -242,15 +243,21 @@ void ArchiveImpl::ReportCorruption(bool reportToCallback)
 }
 
 bool ArchiveImpl::LoadFileI(Archive::FileRevision const& entry, Archive::Revision const& revision, FileStoreItem& item,
-                            bool reportToCallback)
+                            bool reportToCallback, ArchiveReadGate& gate)
 {
-    bool loaded = entry.backData && entry.backData->LoadItem(item);
+    bool loaded = false;
+    if (entry.backData) {
+        gate.Leave();
+        loaded = entry.backData->LoadItem(item);
+        if (!loaded) gate.Enter();
+    }
     if (!loaded) {
         InStreamResult result = InStreamResult::Failure;
         bool corrupt = false;
         try {
             Counted<InStream> const stream = CreateInStream(Counted<Archive::Revision const>(&revision), entry, result);
             corrupt = !stream && result == InStreamResult::Corrupt;
+            gate.Leave();
             if (stream) loaded = item.Load(*stream, m_self);
         } catch (ArchiveCorruptionException const& e) {
             if (e.GetArchive() != &m_self) throw;
@@ -271,6 +278,7 @@ bool ArchiveImpl::LoadFileI(Archive::FileRevision const& entry, Archive::Revisio
 bool Archive::LoadFile(String8 const& path, NonCounted<FileStoreRevision const> revision, FileStoreItem& item,
                        bool reportToCallback)
 {
+    ArchiveReadGate gate(*m);
     FileRevision entry;
     Counted<Revision> where;
     {
@@ -283,18 +291,20 @@ bool Archive::LoadFile(String8 const& path, NonCounted<FileStoreRevision const> 
         entry = *at2;
         where = Counted<Revision>(found);
     }
-    return m->LoadFileI(entry, *where, item, reportToCallback);
+    return m->LoadFileI(entry, *where, item, reportToCallback, gate);
 }
 
 bool Archive::LoadFile(String8 const& path, FileStoreItem& item)
 {
+    ArchiveReadGate gate(*m);
     FileRevision entry;
     Counted<Revision const> revision;
-    return GetFileRevision(path, entry, revision) && m->LoadFileI(entry, *revision, item, true);
+    return GetFileRevision(path, entry, revision) && m->LoadFileI(entry, *revision, item, true, gate);
 }
 
 Counted<InStream> Archive::OpenFileInStream(String8 const& path)
 {
+    ArchiveReadGate const gate(*m);
     FileRevision entry;
     Counted<Revision const> revision;
     if (!GetFileRevision(path, entry, revision)) return nullptr;
@@ -306,6 +316,7 @@ Counted<InStream> Archive::OpenFileInStream(String8 const& path)
 
 Counted<InStream> Archive::OpenFileInStream(String8 const& path, NonCounted<FileStoreRevision const> revision)
 {
+    ArchiveReadGate const gate(*m);
     FileRevision entry;
     Counted<Revision const> holds;
     {
@@ -417,6 +428,7 @@ bool ArchiveImpl::ReadEntryI(FileInOutStream& stream, Archive::FileRevision cons
 
 bool Archive::ReadFile(String8 const& path, RawDataBlock& data)
 {
+    ArchiveReadGate const gate(*m);
     FileRevision entry;
     Counted<Revision const> revision;
     return GetFileRevision(path, entry, revision) && m->ReadEntry(*revision->m_file, entry, data);
@@ -479,6 +491,7 @@ Archive::BlockCheck ArchiveImpl::CheckUnpacked(Archive::ArchiveFile& file, Archi
 
 Archive::BlockCheck Archive::CheckStoredBlock(Revision const& revision, FileRevision const& entry)
 {
+    ArchiveReadGate const gate(*m);
     ArchiveAccessScope const access(*m);
     if (!access.IsOpen()) return BlockCheck::Unreadable;
     try {

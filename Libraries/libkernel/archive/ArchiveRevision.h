@@ -25,6 +25,7 @@ private:
     friend struct ArchiveImpl;
     friend class ArchiveLoader;
     friend class ArchiveCommit;
+    friend class ArchiveStreamliner;
     ~FileInfo() override;
 
     u32 const m_uid;
@@ -91,6 +92,9 @@ private:
     friend class ArchiveLoader;
     friend class ArchiveCommit;
     friend class ArchiveSession;
+    friend class ArchiveCompactWriter;
+    friend class ArchiveStreamliner;
+    friend class ArchiveVerifier;
     ~Revision() override;
 
     FileRevision* FindI(FileInfo const& info);

@@ -1,6 +1,7 @@
 #include "libkernel/archive/ArchiveThumbnails.h"
 
 #include "libkernel/archive/internal/ArchiveAppender.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/archive/internal/ArchiveThumbnailBlock.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/Endian.h"
@@ -128,6 +129,7 @@ Counted<ArchiveThumbnails> ReadThumbnails(FileInOutStream& stream, u64 position)
 
 Counted<ArchiveThumbnails const> Archive::LoadThumbnails()
 {
+    ArchiveReadGate const gate(*m);
     Counted<ArchiveFile> file;
     {
         CriticalSectionScope const lock(m->m_stateLock);
@@ -151,26 +153,29 @@ Counted<ArchiveThumbnails const> Archive::LoadThumbnails()
     return result;
 }
 
-void CopyThumbnails(OutStream& out, Archive::ArchiveFile& file, void* buffer, u64 size)
+bool CopyThumbnails(OutStream& out, Archive::ArchiveFile& file, void* buffer, u64 size)
 {
     CriticalSectionScope const lock(file.m_lock);
     u64 position = file.m_thumbnailsPos.load();
-    if (position == 0 || !file.m_stream || size == 0) return;
+    if (position == 0 || !file.m_stream || size == 0) return false;
     try {
         u8 header[c_thumbnailHeaderSize];
-        if (file.m_stream->ReadAt(position, header, sizeof(header)) != sizeof(header)) return;
-        if (LoadLittleEndian<u32>(header) != c_blockEnd || LoadLittleEndian<u32>(header + 4) != c_tagThumbnails) return;
-        if (out.WriteBlock(header, sizeof(header)) != sizeof(header)) return;
+        if (file.m_stream->ReadAt(position, header, sizeof(header)) != sizeof(header)) return false;
+        if (LoadLittleEndian<u32>(header) != c_blockEnd || LoadLittleEndian<u32>(header + 4) != c_tagThumbnails)
+            return false;
+        if (out.WriteBlock(header, sizeof(header)) != sizeof(header)) return false;
         position += sizeof(header);
         for (u64 left = LoadLittleEndian<u32>(header + 12); left != 0;) {
             u64 const piece = std::min(left, size);
             if (file.m_stream->ReadAt(position, buffer, piece) != piece || out.WriteBlock(buffer, piece) != piece)
-                return;
+                return false;
             position += piece;
             left -= piece;
         }
+        return true;
     } catch (Exception const&) {
         // Thumbnails are not worth a failed save.
+        return false;
     }
 }
 

@@ -10,6 +10,7 @@
 #include "libkernel/archive/internal/ArchiveLocks.h"
 #include "libkernel/concurrency/MultiSemaphore.h"
 #include "libkernel/concurrency/Semaphore.h"
+#include "libkernel/concurrency/ThreadId.h"
 #include "libkernel/streams/File.h"
 
 #include <map>
@@ -149,6 +150,9 @@ struct ArchiveImpl
     u32 m_readerCount = 0;
     bool m_readInProgress = false;
     u32 m_openInStreams = 0;
+    u32 m_readsInside = 0;              // Threads in a read gate; see ArchiveReadGate.
+    Counted<MultiSemaphore> m_gateWait; // Where they wait while a streamline keeps the gate closed; null while open.
+    ThreadId m_gateOwner{nullptr};      // The streamline's thread, which passes.
     Counted<Archive::OffliningUpdater> m_updater;
     std::unordered_map<Archive::FileInfo const*, Counted<Archive::Revision>> m_offlineQueue;
     u64 m_offlineTotal = 0;
@@ -158,6 +162,8 @@ struct ArchiveImpl
     ArchiveRevisionMap m_revisionsByAddress; // Those of m_revisions.
 
     std::atomic<bool> m_offlineAbort{false}; // Asks the offlining job to end.
+    std::atomic<bool> m_doingStreamline{false};
+    std::atomic<bool> m_alwaysOverwrite{false}; // Streamlining never moves a file over the master.
 
     // Leaf lock.
     mutable CriticalSectionSpin m_flagsLock{c_rankLeaf};
@@ -195,6 +201,9 @@ struct ArchiveImpl
     /// Sets the fields that the bytes of @p fresh stand for, once those have been written. Takes the file's lock and
     /// the state lock.
     void SetFreshFields(Archive::ArchiveFile& file, ArchiveFormat::FreshFile const& fresh);
+    /// Ties the scratch file to the present state of @p master, with no revision of its own. False, and the archive
+    /// goes on without a scratch file, if that fails.
+    bool ResetScratch(Archive::ArchiveFile const& master, u32 nextFreeUID);
 
     // ArchiveMoveTemporary.cpp
     /// Moves a committed temporary over its target and reopens it there. The caller holds the session lock.
@@ -232,8 +241,9 @@ struct ArchiveImpl
     Archive::Revision* AsRevisionCS(NonCounted<FileStoreRevision const> revision) const;
     /// The revision as one of this archive's, or null.
     Counted<Archive::Revision const> FindRevision(NonCounted<FileStoreRevision const> revision) const;
+    /// The item is loaded outside @p gate, which the caller entered before the look-up.
     bool LoadFileI(Archive::FileRevision const& entry, Archive::Revision const& revision, FileStoreItem& item,
-                   bool reportToCallback);
+                   bool reportToCallback, class ArchiveReadGate& gate);
     enum class InStreamResult
     {
         Success = 0,
