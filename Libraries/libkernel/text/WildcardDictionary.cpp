@@ -1,7 +1,5 @@
 #include "libkernel/text/WildcardDictionary.h"
 
-#include <ranges>
-
 namespace Kernel {
 
 WildcardDictionary::~WildcardDictionary() = default;
@@ -26,8 +24,8 @@ void WildcardDictionary::CollateWildcardsOrdered(WildcardVector& wildcards) cons
     wildcards.reserve(wildcards.size() + GetCount());
     std::vector<WildcardDictionary const*> chain;
     for (WildcardDictionary const* at = this; at; at = at->m_parent.Get()) chain.push_back(at);
-    for (WildcardDictionary const* const at : std::views::reverse(chain))
-        wildcards.insert(wildcards.end(), at->m_wildcards.begin(), at->m_wildcards.end());
+    for (auto at = chain.rbegin(); at != chain.rend(); ++at)
+        wildcards.insert(wildcards.end(), (*at)->m_wildcards.begin(), (*at)->m_wildcards.end());
 }
 
 } // namespace Kernel
