@@ -373,6 +373,29 @@ TEST_F(KernelToolTest, StreamDumpShowsWhatWasSaved)
     EXPECT_EQ(report["path"], "Vals");
 }
 
+TEST_F(KernelToolTest, TextIsSortedAsALanguageSorts)
+{
+    std::string const text = "\xC3\xB6l10\r\n\xC3\xB6l9\n\nzebra\nZebra\n\xFF";
+    struct
+    {
+        std::vector<std::string> options;
+        std::string sorted;
+    } const cases[] = {
+        {{"--locale", "sv-SE"}, "\nzebra\nZebra\n\xC3\xB6l10\n\xC3\xB6l9\n\xFF\n"},
+        {{"--locale", "de-DE", "--numeric"}, "\n\xC3\xB6l9\n\xC3\xB6l10\nzebra\nZebra\n\xFF\n"},
+    };
+    for (auto const& c : cases) {
+        std::vector<std::string> words = {"text", "sort", "-"};
+        words.insert(words.end(), c.options.begin(), c.options.end());
+        EXPECT_EQ(Run(words, text).out, c.sorted) << c.options[1];
+    }
+    WriteWhole(m_folder / "lines", "b\na");
+    EXPECT_EQ(RunJson({"text", "sort", m_folder / "lines", "--locale", "en"}),
+              Json::parse(R"({"locale": "en", "lines": ["a", "b"]})"));
+    EXPECT_EQ(Run({"text", "sort", m_folder / "lines", "--locale", "not a locale"}).status, 2);
+    EXPECT_EQ(Run({"text", "sort", m_folder / "none"}).status, 1);
+}
+
 // Help, man page and completions say the same as the table of verbs.
 TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
 {
@@ -390,7 +413,8 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
     } const groups[] = {
         {"archive",
          {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch", "thumbnail"}},
-        {"stream", {"dump", "check"}}};
+        {"stream", {"dump", "check"}},
+        {"text", {"sort"}}};
     for (auto const& group : groups) {
         EXPECT_THAT(Run({group.group, "--help"}).out, HasSubstr("Example:"));
         for (char const* verb : group.verbs) {

@@ -29,6 +29,8 @@ constexpr OptionInfo c_options[] = {
     {Option::Set, "--set", "IMAGE", nullptr, "replace the thumbnails by this file"},
     {Option::Get, "--get", "IMAGE", nullptr, "write the first thumbnail to this file"},
     {Option::Zlib, "--zlib", nullptr, nullptr, "the file is compressed, as settings files are"},
+    {Option::Locale, "--locale", "L", nullptr, "language and country, such as sv-SE (default: your own)"},
+    {Option::Numeric, "--numeric", nullptr, nullptr, "order runs of digits by their value"},
 };
 static_assert(std::size(c_options) == static_cast<size_t>(Option::Count));
 
@@ -39,6 +41,7 @@ static_assert(std::size(c_options) == static_cast<size_t>(Option::Count));
 constexpr GroupInfo c_groups[] = {
     {"archive", "inspect, make and check documents", "kerneltool archive ls drawing.doc"},
     {"stream", "look into property streams", "kerneltool stream dump settings.dat --zlib"},
+    {"text", "work on texts", "kerneltool text sort names.txt --locale sv-SE"},
 };
 
 std::string Quoted(std::string const& word)
@@ -240,6 +243,15 @@ std::vector<VerbInfo> const& CommandLine::GetVerbs()
          1,
          1,
          RunStreamCheck},
+        {"text",
+         "sort",
+         "FILE",
+         "Print the lines of a UTF-8 text in the order of a language; '-' is standard input.",
+         "kerneltool text sort names.txt --locale sv-SE --numeric",
+         {Option::Locale, Option::Numeric, Option::Json},
+         1,
+         1,
+         RunTextSort},
     };
     return s_verbs;
 }

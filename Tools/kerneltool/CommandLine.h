@@ -38,6 +38,8 @@ enum class Option
     Set,
     Get,
     Zlib,
+    Locale,
+    Numeric,
     Count
 };
 

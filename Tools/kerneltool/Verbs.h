@@ -25,5 +25,6 @@ int RunScratch(Arguments const& arguments);
 int RunThumbnail(Arguments const& arguments);
 int RunStreamDump(Arguments const& arguments);
 int RunStreamCheck(Arguments const& arguments);
+int RunTextSort(Arguments const& arguments);
 
 } // namespace KernelTool

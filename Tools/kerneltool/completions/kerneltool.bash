@@ -10,11 +10,12 @@ _kerneltool()
         --predictor) COMPREPLY=($(compgen -W "none 8 16 32" -- "$cur")); return ;;
     esac
     if [ "$COMP_CWORD" -eq 1 ]; then
-        words="archive stream --help --version"
+        words="archive stream text --help --version"
     elif [ "$COMP_CWORD" -eq 2 ]; then
         case "$prev" in
             archive) words="create put rm ls cat extract info history verify test scratch thumbnail --help" ;;
             stream) words="dump check --help" ;;
+            text) words="sort --help" ;;
         esac
     elif [[ "$cur" == -* ]]; then
         case "${COMP_WORDS[1]}/${COMP_WORDS[2]}" in
@@ -32,6 +33,7 @@ _kerneltool()
             archive/thumbnail) words="--help --set --get --json --progress" ;;
             stream/dump) words="--help --zlib --json --progress" ;;
             stream/check) words="--help --zlib --json --progress" ;;
+            text/sort) words="--help --locale --numeric --json" ;;
         esac
     else
         compopt -o filenames 2>/dev/null
