@@ -219,6 +219,82 @@ TEST(OutSerialiserObjects, NearestDefaultOfTheChainLeavesAValueOut)
     EXPECT_EQ(list(save(9, 2)), Show(Bytes("01 [Size] 09 | 01 [Only] 02 | 00 00")));
 }
 
+// A writer expects of each object what the last ones of its class did, which must not show. An object's properties are
+// a text here: a and b are numbers, m an array, o an object of the same class, all others texts. Small letters save the
+// class's defaults, where it has them.
+class LetterObjects
+{
+public:
+    Counted<Thing> Make(std::string const& letters) const
+    {
+        return MakeCounted<Thing>(&m_description, [this, letters](OutSerialiser& out) { Save(out, letters); });
+    }
+    static std::string SaveAll(std::vector<Counted<Thing>> const& objects)
+    {
+        return SaveList([&](OutSerialiser& out) { out.SaveObjects("Objs", objects); });
+    }
+    /// What follows the object's index and class record, which a first object of the class has in between.
+    std::string SaveAlone(std::string const& letters) const
+    {
+        Counted<Thing> const first = Make("");
+        return SaveAll({first, Make(letters)}).substr(SaveAll({first}).size() + 9);
+    }
+
+private:
+    void Save(OutSerialiser& out, std::string const& letters) const
+    {
+        for (size_t i = 0; i < letters.size(); ++i) {
+            char const lower = static_cast<char>(letters[i] | 0x20);
+            bool const other = letters[i] != lower;
+            IDTag const tag(static_cast<u32>(lower));
+            EXPECT_EQ(out.HasProperty(tag), letters.substr(0, i).find(lower) != std::string::npos);
+            if (lower == 'a' || lower == 'b')
+                out.SaveType(tag, other ? u8{2} : u8{1});
+            else if (lower == 'm')
+                out.SaveTypes(tag, std::vector<u16>{1, other ? u16{3} : u16{2}});
+            else if (lower == 'o')
+                out.SaveObject(tag, Make("B"));
+            else
+                out.SaveType(tag, String8(other ? "else" : "text"));
+        }
+    }
+
+    std::vector<Defaults::Item> const m_defaults =
+        Defaults::Make(Defaults::Value(IDTag('a'), u8{1}), Defaults::Text(IDTag('s'), String8("text")),
+                       Defaults::Values(IDTag('m'), std::vector<u16>{1, 2}));
+    ClassProperties const m_description = MakeClass("Thng", m_defaults);
+};
+
+TEST(OutSerialiserObjects, ObjectsBeforeItDoNotChangeHowAnObjectIsSaved)
+{
+    LetterObjects const letters;
+    std::vector<std::string> const rows[] = {
+        {"", "absm", "absm", "ABSM", "aBsM"},
+        {"", "abst", "ab", "abst", "abstm", "abstm", "", "a", "t"},
+        {"", "ab", "ba", "bsa", "sab", "mab", "bma", "abm", "ab", "ba"}, // More orders than are learned.
+        {"", "abcdefghijklnpqrstuvwxyz", "abcdefghijklnpqrstuvwxyzm", "abcdefghijklnpqrstuvwxyzm"},
+    };
+    for (auto const& row : rows) {
+        std::vector<Counted<Thing>> objects;
+        for (std::string const& one : row) objects.push_back(letters.Make(one));
+        std::string const list = letters.SaveAll(objects);
+        size_t at = letters.SaveAll({objects[0]}).size() - 1;
+        for (size_t i = 1; i < row.size(); ++i) {
+            std::string const alone = letters.SaveAlone(row[i]);
+            EXPECT_EQ(Show(list.substr(at + 10, alone.size() - 1)), Show(alone.substr(0, alone.size() - 1))) << row[i];
+            at += 10 + alone.size() - 1;
+        }
+        EXPECT_EQ(at + 1, list.size());
+    }
+    // A tag twice is found out wherever its first use lies, in the order of the objects before or out of it.
+    for (std::string const twice : {"aa", "absota", "abstot", "absoo", "baab", "abstmm", "botB"})
+        EXPECT_EQ(SaveCode([&] {
+                      letters.SaveAll({letters.Make("abso"), letters.Make("abso"), letters.Make(twice)});
+                  }),
+                  3)
+            << twice;
+}
+
 TEST(OutSerialiserObjects, RawAndPlainValuesAreNeverLeftOut)
 {
     u32 const value = 1;

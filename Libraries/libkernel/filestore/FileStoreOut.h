@@ -62,6 +62,8 @@ public:
     Purpose GetPurpose() const { return m_purpose; }
     bool IsFullSave() const { return m_purpose == PurposeSave; }
 
+    /// The flag, which another thread may set; null if none was given.
+    bool const* GetAbortFlag() const { return m_abort; }
     /// True if an abort flag was given and is set. Reads it atomically, since another thread sets it.
     bool IsAbortRequested() const { return m_abort && IsAbortFlagSet(m_abort); }
     /// Throws AbortException if the abort flag is set. Sets nothing: who gives the save up calls SetAborted.

@@ -86,7 +86,7 @@ protected:
                         ClassPropertiesBase const* parent);
 
 private:
-    friend class OutSerialiser;
+    friend class OutSerialiserObjectList;
     friend KERNEL_API void ShutdownSerialisation();
 
     template <class T>

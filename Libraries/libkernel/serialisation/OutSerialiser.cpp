@@ -13,6 +13,7 @@
 #include "libkernel/serialisation/internal/OutSerialiserInline.h"
 #include "libkernel/serialisation/internal/PropWriter.h"
 
+#include <algorithm>
 #include <bit>
 #include <limits>
 
@@ -22,6 +23,17 @@ namespace Kernel {
 static_assert(std::endian::native == std::endian::little);
 
 namespace {
+
+// Most texts are short, and a call costs more than their bytes.
+bool IsSameText(std::string_view a, std::string_view b)
+{
+    size_t const length = a.size();
+    if (length != b.size()) return false;
+    if (length < 4 || length > 8) return a == b;
+    size_t const last = length - 4;
+    return LoadLittleEndian<u32>(a.data()) == LoadLittleEndian<u32>(b.data()) &&
+           LoadLittleEndian<u32>(a.data() + last) == LoadLittleEndian<u32>(b.data() + last);
+}
 
 bool CompareBools(Defaults::DefaultTypeArray const& item, bool const* values, u64 count)
 {
@@ -33,9 +45,14 @@ bool CompareBools(Defaults::DefaultTypeArray const& item, std::vector<bool> cons
     return item.Compare(values);
 }
 
-DefaultTable const* GetTableOrNull(DefaultTable const& table)
+// Stands for the flag of a store that has none.
+bool s_neverAborted = false;
+
+// Small enough to be compiled into each operation.
+template <class Test>
+bool IsDefault(DefaultRow const* row, Test const& test)
 {
-    return table.IsEmpty() ? nullptr : &table;
+    return row && test(*row);
 }
 
 } // namespace
@@ -44,16 +61,20 @@ OutSerialiser::SaveException::~SaveException() = default;
 
 OutSerialiser::Advice const OutSerialiser::s_noAdvice;
 
+OutSerialiserStep const OutSerialiser::s_noStep;
+
 OutSerialiser::OutSerialiser(OutSerialiserTarget& target, FileStoreOut& store, OutSerialiserObjectList& objects)
-    : m_target(target), m_store(store), m_objects(objects), m_defaults(nullptr), m_advice(&s_noAdvice),
-      m_isFullSave(store.IsFullSave()), m_isFileLevel(true)
+    : m_target(target), m_store(store), m_objects(objects), m_step(&s_noStep), m_firstStep(nullptr),
+      m_abort(store.GetAbortFlag() ? store.GetAbortFlag() : &s_neverAborted), m_class(nullptr), m_advice(&s_noAdvice),
+      m_obstacles(store.IsFullSave() ? 0 : Enumerating), m_isFileLevel(true)
 {
 }
 
 OutSerialiser::OutSerialiser(OutSerialiser& parent, ClassPropertiesBase const* description)
-    : m_target(parent.m_target), m_store(parent.m_store), m_objects(parent.m_objects),
-      m_defaults(description ? GetTableOrNull(description->GetDefaultTable()) : nullptr), m_advice(parent.m_advice),
-      m_isFullSave(parent.m_isFullSave), m_isFileLevel(false)
+    : m_target(parent.m_target), m_store(parent.m_store), m_objects(parent.m_objects), m_step(&s_noStep),
+      m_firstStep(nullptr), m_abort(parent.m_abort),
+      m_class(description ? &parent.m_objects.GetClass(*description) : nullptr), m_advice(parent.m_advice),
+      m_obstacles(parent.m_obstacles & Enumerating), m_isFileLevel(false)
 {
     if (description) return;
     m_level.emplace();
@@ -74,10 +95,21 @@ int OutSerialiser::CheckLengthI(u64 length) const
     return static_cast<int>(length);
 }
 
-template <class Test>
-bool OutSerialiser::IsDefaultI(IDTag tag, Test const& test) const
+DefaultRow const* OutSerialiser::StartOutOfSequenceI(IDTag tag)
 {
-    return m_defaults && m_defaults->Matches(tag, test);
+    if (m_firstStep) {
+        for (auto const* used = m_firstStep; used != m_step; ++used) m_usedTags.Add(IDTag(static_cast<u32>(used->tag)));
+        m_firstStep = nullptr;
+        m_step = &s_noStep;
+    }
+    if (!m_usedTags.Add(tag)) Fail(SaveException::TagOrChild);
+    return FindDefaultI(tag);
+}
+
+bool OutSerialiser::HasProperty(IDTag tag) const
+{
+    if (!m_firstStep) return m_usedTags.Contains(tag);
+    return std::any_of(m_firstStep, m_step, [&](OutSerialiserStep const& used) { return used.tag == tag.value; });
 }
 
 void OutSerialiser::AbortI()
@@ -86,22 +118,18 @@ void OutSerialiser::AbortI()
     throw AbortException();
 }
 
-void OutSerialiser::SaveScalarI(IDTag tag, PropType type, u64 bits, u32 size)
+void OutSerialiser::SaveAnyScalarI(IDTag tag, PropType type, u64 bits, u32 size)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
-    if (IsDefaultI(tag, [&](DefaultTable::Row const& row) { return row.EqualsScalar(type, bits, size); })) return;
-    // Two stores whatever the size: each runs past what counts, and what comes next covers the rest.
-    u8* const to = m_target.Reserve(c_tagHeaderSize + sizeof bits);
-    if (!to) Fail(SaveException::ShortWrite);
-    StoreLittleEndian(to, u64{tag.value} << 8 | static_cast<u8>(type));
-    StoreLittleEndian(to + c_tagHeaderSize, bits);
-    m_target.Advance(c_tagHeaderSize + size);
+    if (!IsFullSave()) return;
+    DefaultRow const* const row = StartI(tag);
+    if (row && row->EqualsScalar(type, bits, size)) return;
+    if (!m_target.Reserve(c_scalarRoom)) Fail(SaveException::ShortWrite);
+    PutScalarI(tag, type, bits, size);
 }
 
 void OutSerialiser::SaveTypeI(IDTag tag, PropType type, void const* value, u64 size)
 {
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     u8 const number = static_cast<u8>(type);
     bool const isSound = size != 0 && number < c_propTypeCount && c_propSizes[number] == size;
     if (isSound && size <= sizeof(u64)) {
@@ -109,29 +137,29 @@ void OutSerialiser::SaveTypeI(IDTag tag, PropType type, void const* value, u64 s
         std::memcpy(&bits, value, size);
         return SaveScalarI(tag, type, bits, static_cast<u32>(size));
     }
-    StartI(tag);
+    DefaultRow const* const found = StartI(tag);
     if (!isSound) Fail(SaveException::Misuse);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultType>();
         return item && item->Compare(type, value, size);
     };
-    if (!IsDefaultI(tag, equals)) std::memcpy(PutHeaderI(tag, number, size), value, size);
+    if (!IsDefault(found, equals)) std::memcpy(PutHeaderI(tag, number, size), value, size);
 }
 
 void OutSerialiser::SaveTypeArrayI(IDTag tag, PropType type, void const* values, u64 unitSize, u64 count)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     u8 const number = static_cast<u8>(type);
     bool const isPacked = type == PropType::Bool;
     if (unitSize == 0 || number >= c_propTypeCount || c_propSizes[number] != unitSize || isPacked)
         Fail(SaveException::Misuse);
     u32 const stored = CheckCountI(count);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultTypeArray>();
         return item && item->Compare(type, values, unitSize, count);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     StoreLittleEndian(PutHeaderI(tag, number | c_propArrayBit, 4), stored);
     PutI(values, unitSize * count);
 }
@@ -144,14 +172,14 @@ void OutSerialiser::SaveBoolI(IDTag tag, bool value)
 template <class Bools>
 void OutSerialiser::SaveBoolsI(IDTag tag, Bools const& values, u64 count)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     CheckCountI(count);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultTypeArray>();
         return item && CompareBools(*item, values, count);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     PutHeaderI(tag, static_cast<u8>(PropType::Bool) | c_propArrayBit, 0);
     PropWriter(*this).PutBools(values, count);
 }
@@ -173,37 +201,37 @@ void OutSerialiser::SaveTypes(IDTag tag, std::deque<bool> const& values)
 
 void OutSerialiser::SaveType(IDTag tag, String16 const& text)
 {
-    if (m_isFullSave) SaveType(tag, ConvertedTo<TEncUtf8>(text));
+    if (IsFullSave()) SaveType(tag, ConvertedTo<TEncUtf8>(text));
 }
 
 void OutSerialiser::SaveType(IDTag tag, String32 const& text)
 {
-    if (m_isFullSave) SaveType(tag, ConvertedTo<TEncUtf8>(text));
+    if (IsFullSave()) SaveType(tag, ConvertedTo<TEncUtf8>(text));
 }
 
 void OutSerialiser::SaveStringI(IDTag tag, char const* utf8, u64 length)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     u32 const stored = CheckCountI(length);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultString>();
-        return item && item->GetText().GetView() == std::string_view(utf8, length);
+        return item && IsSameText(item->GetText().GetView(), {utf8, length});
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::String), 4), stored);
     PutI(utf8, length);
 }
 
 void OutSerialiser::SaveTypes(IDTag tag, String8 const* texts, u64 count)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultStringArray>();
         return item && item->Compare(texts, count);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     PropWriter writer(*this);
     u32 const total = writer.CheckTexts(texts, count);
     PutHeaderI(tag, static_cast<u8>(PropType::String) | c_propArrayBit, 0);
@@ -213,7 +241,7 @@ void OutSerialiser::SaveTypes(IDTag tag, String8 const* texts, u64 count)
 template <class Enc>
 void OutSerialiser::SaveForeignTextsI(IDTag tag, StringT<Enc> const* texts, u64 count)
 {
-    if (m_isFullSave) SaveTypes(tag, PropWriter::ConvertTexts(texts, count).data(), count);
+    if (IsFullSave()) SaveTypes(tag, PropWriter::ConvertTexts(texts, count).data(), count);
 }
 
 void OutSerialiser::SaveTypes(IDTag tag, String16 const* texts, u64 count)
@@ -228,13 +256,13 @@ void OutSerialiser::SaveTypes(IDTag tag, String32 const* texts, u64 count)
 
 void OutSerialiser::SavePropertyStructI(IDTag tag, void const* value, u64 size)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultCustom>();
         return item && item->Compare(value, size);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     u16 const stored = CheckShortI(size);
     StoreLittleEndian(PutHeaderI(tag, static_cast<u8>(PropType::Custom), 2), stored);
     PutI(value, size);
@@ -242,15 +270,15 @@ void OutSerialiser::SavePropertyStructI(IDTag tag, void const* value, u64 size)
 
 void OutSerialiser::SavePropertyStructArrayI(IDTag tag, void const* values, u64 unitSize, u64 count)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     u32 const storedCount = CheckCountI(count);
     u16 const storedSize = CheckShortI(unitSize);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultCustomArray>();
         return item && item->Compare(values, unitSize, count);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Custom) | c_propArrayBit, 6);
     StoreLittleEndian(header, storedCount);
     StoreLittleEndian(header + 4, storedSize);
@@ -260,14 +288,14 @@ void OutSerialiser::SavePropertyStructArrayI(IDTag tag, void const* values, u64 
 void OutSerialiser::SaveRawStructI(IDTag tag, void const* value, u64 size)
 {
     if (size < 1 || size > c_maxRawStructSize) Fail(SaveException::TooLarge);
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     StartI(tag);
     std::memcpy(PutHeaderI(tag, static_cast<u8>(RawStructType(size)), size), value, size);
 }
 
 void OutSerialiser::SaveRawData(IDTag tag, void const* bytes, u64 size)
 {
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     StartI(tag);
     PutRawDataI(tag, bytes, size);
 }
@@ -281,7 +309,7 @@ void OutSerialiser::PutRawDataI(IDTag tag, void const* bytes, u64 size)
 
 void OutSerialiser::SaveAlignedRawData(IDTag tag, void const* bytes, u64 size, u64 alignment)
 {
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     StartI(tag);
     if (alignment > c_maxDataAlignment) Fail(SaveException::Misuse);
     u64 const position = m_target.GetSize();
@@ -303,7 +331,7 @@ void OutSerialiser::SaveAlignedRawData(IDTag tag, RawDataT<VoidClass, AllocatorM
 
 void OutSerialiser::SaveFragmentedRawData(IDTag tag, FragmentedRawData const& bytes)
 {
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     StartI(tag);
     u32 const size = CheckCountI(bytes.GetSize());
     u32 const blockSize = CheckCountI(bytes.GetBlockSize());
@@ -318,16 +346,16 @@ void OutSerialiser::SaveFragmentedRawData(IDTag tag, FragmentedRawData const& by
 
 void OutSerialiser::SaveEnumI(IDTag tag, EnumSerialiser const& serialiser, int value)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     unsigned short code = 0;
     unsigned short version = 0;
     if (!serialiser.EncodeToSerial(value, code, version)) Fail(SaveException::NoEncoding);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultEnum>();
         return item && item->Compare(code, version);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     u8* const to = PutHeaderI(tag, static_cast<u8>(PropType::Enum), 4);
     StoreLittleEndian(to, code);
     StoreLittleEndian(to + 2, version);
@@ -335,17 +363,17 @@ void OutSerialiser::SaveEnumI(IDTag tag, EnumSerialiser const& serialiser, int v
 
 void OutSerialiser::SaveEnumsI(IDTag tag, EnumSerialiser const& serialiser, int const* values, u64 count)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     u32 const storedCount = CheckCountI(count);
     std::vector<unsigned short> codes;
     unsigned short version = 0;
     if (!serialiser.EncodeToSerial(values, count, codes, version)) Fail(SaveException::NoEncoding);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultEnumArray>();
         return item && item->Compare(codes.data(), count, version);
     };
-    if (IsDefaultI(tag, equals)) return;
+    if (IsDefault(found, equals)) return;
     u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::Enum) | c_propArrayBit, 6);
     StoreLittleEndian(header, storedCount);
     StoreLittleEndian(header + 4, version);
@@ -354,16 +382,16 @@ void OutSerialiser::SaveEnumsI(IDTag tag, EnumSerialiser const& serialiser, int 
 
 void OutSerialiser::SaveFlagSetI(IDTag tag, FlagSerialiser const& serialiser, u64 flags, unsigned char)
 {
-    if (!m_isFullSave) return;
-    StartI(tag);
+    if (!IsFullSave()) return;
+    DefaultRow const* const found = StartI(tag);
     u64 encoded = 0;
     unsigned short version = 0;
     if (!serialiser.EncodeToSerial(flags, encoded, version)) Fail(SaveException::NoEncoding);
-    auto const equals = [&](DefaultTable::Row const& row) {
+    auto const equals = [&](DefaultRow const& row) {
         auto const* const item = row.As<Defaults::DefaultFlagSet>();
         return item && item->Compare(encoded, version);
     };
-    if (!IsDefaultI(tag, equals)) PutFlagSetI(tag, encoded, version, FlagSerialiser::GetStoredBytes(encoded));
+    if (!IsDefault(found, equals)) PutFlagSetI(tag, encoded, version, FlagSerialiser::GetStoredBytes(encoded));
 }
 
 void OutSerialiser::PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes)
@@ -376,13 +404,14 @@ void OutSerialiser::PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes)
 
 void OutSerialiser::Close()
 {
-    if (m_isClosed) return;
-    if (m_isChildActive) Fail(SaveException::TagOrChild);
-    if (m_isFullSave) {
+    if (IsClosed()) return;
+    if (HaveChildActive()) Fail(SaveException::TagOrChild);
+    if (IsFullSave()) {
         *ClaimI(1) = 0;
         if (m_isFileLevel && !m_target.Flush()) Fail(SaveException::ShortWrite);
     }
-    m_isClosed = true;
+    if (m_class && !m_firstStep) m_objects.Learn(*m_class, m_usedTags.GetShort());
+    m_obstacles |= Closed;
 }
 
 void OutSerialiser::AddProlongedObject(Counted<Countable const> object)

@@ -7,6 +7,8 @@
 #include "libkernel/core/String.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
 #include "libkernel/serialisation/FlagSerialiser.h"
+#include "libkernel/serialisation/OutSerialiserStep.h"
+#include "libkernel/serialisation/OutSerialiserTarget.h"
 #include "libkernel/serialisation/PropType.h"
 #include "libkernel/serialisation/Serialisable.h"
 #include "libkernel/serialisation/SerialisationStrategy.h"
@@ -14,6 +16,7 @@
 #include "libkernel/serialisation/UsedTagSet.h"
 #include "libkernel/streams/OutStream.h"
 
+#include <atomic>
 #include <deque>
 #include <memory>
 #include <optional>
@@ -28,13 +31,14 @@ class DefaultBase;
 }
 class ClassPropertiesBase;
 class DefaultTable;
+struct DefaultRow;
 class DelayLoadHolder;
 class FileStoreCompressionHint;
 class FileStoreOut;
 class FileStoreOutPathGenerator;
 class FragmentedRawData;
 class OutSerialiserObjectList;
-class OutSerialiserTarget;
+struct OutSerialiserClass;
 struct AllocatorMalloc;
 template <class Base, class Allocator>
 class RawDataT;
@@ -230,7 +234,8 @@ public:
     void SaveSharedObjects(IDTag tag, R const& objects)
     {
         StartObjectArrayTestI(tag);
-        if (HasClassI() && TestDefaultObjectsI(tag, {std::ranges::begin(objects), std::ranges::end(objects)})) return;
+        if (HasDefaultI(tag) && TestDefaultObjectsI(tag, {std::ranges::begin(objects), std::ranges::end(objects)}))
+            return;
         StartObjectArrayBeginI(tag, std::ranges::size(objects));
         for (auto const& object : objects) SaveSharedObjectI(object);
     }
@@ -326,17 +331,17 @@ public:
     /// Writes the end of the list; at file level also hands everything to the stream, which is not flushed. Code 3
     /// while a child is open. Further calls do nothing; saving afterwards is code 5.
     void Close();
-    bool IsClosed() const { return m_isClosed; }
-    bool HaveChildActive() const { return m_isChildActive; }
+    bool IsClosed() const { return (m_obstacles & Closed) != 0; }
+    bool HaveChildActive() const { return (m_obstacles & ChildActive) != 0; }
     /// True if the tag was used in this list. While only enumerating, values do not count.
-    bool HasProperty(IDTag tag) const { return m_usedTags.Contains(tag); }
+    bool HasProperty(IDTag tag) const;
     /// Path of the file being written, for classes that store paths relative to it; empty unless somebody set it.
     /// Children inherit it.
     String8 const& GetFilePath() const { return m_advice->path; }
     void SetFilePath(String8 const& path);
     FileStoreOut& GetFileStoreOut() const { return m_store; }
     /// False in a pass that only enumerates paths or holders.
-    bool IsFullSave() const { return m_isFullSave; }
+    bool IsFullSave() const { return (m_obstacles & Enumerating) == 0; }
     /// Keeps an object that might die during the save alive until it ends: objects are told apart by address.
     void AddProlongedObject(Counted<Countable const> object);
 
@@ -367,6 +372,7 @@ private:
         String8 path;
     };
     static Advice const s_noAdvice;
+    static OutSerialiserStep const s_noStep;
     Advice& GetOwnAdvice();
 
     [[noreturn]] void Fail(int code, SourceLocation where = SourceLocation::Current()) const;
@@ -376,20 +382,50 @@ private:
     u32 CheckCountI(u64 count) const;
     u16 CheckShortI(u64 size) const;
     int CheckLengthI(u64 length) const;
-    template <class Test>
-    bool IsDefaultI(IDTag tag, Test const& test) const;
-
-    void StartI(IDTag tag);
+    // What keeps a property from being saved at once.
+    enum Obstacle : u8
+    {
+        ChildActive = 1,
+        Closed = 2,
+        Enumerating = 4
+    };
+    OutSerialiser(OutSerialiser& parent, OutSerialiserClass& known);
+    // Another thread may set the flag.
+    bool IsAbortRequestedI() const
+    {
+        return std::atomic_ref<bool>(const_cast<bool&>(*m_abort)).load(std::memory_order_relaxed);
+    }
+    /// What every property begins with. Gives the default of the tag, or null.
+    DefaultRow const* StartI(IDTag tag);
+    DefaultRow const* StartOutOfSequenceI(IDTag tag);
     void PutRawDataI(IDTag tag, void const* bytes, u64 size);
     void PutFlagSetI(IDTag tag, u64 encoded, u16 version, u8 bytes);
     [[noreturn]] void AbortI();
-    void SaveScalarI(IDTag tag, PropType type, u64 bits, u32 size);
+    void SaveScalarI(IDTag tag, PropType type, u64 bits, u32 size)
+    {
+        OutSerialiserStep const* const step = m_step;
+        if (step->tag != tag.value || m_obstacles || IsAbortRequestedI() || !m_target.HasRoom(c_scalarRoom))
+            return SaveAnyScalarI(tag, type, bits, size);
+        m_step = step + 1;
+        if (step->type != type || step->value != bits) PutScalarI(tag, type, bits, size);
+    }
+    void SaveAnyScalarI(IDTag tag, PropType type, u64 bits, u32 size);
+    // Two stores whatever the size: each runs past what counts, and what comes next covers the rest.
+    static constexpr u64 c_scalarRoom = 13;
+    void PutScalarI(IDTag tag, PropType type, u64 bits, u32 size)
+    {
+        u8* const to = m_target.Reserve(c_scalarRoom);
+        StoreLittleEndian(to, u64{tag.value} << 8 | static_cast<u8>(type));
+        StoreLittleEndian(to + 5, bits);
+        m_target.Advance(5 + size);
+    }
     void SaveBoolI(IDTag tag, bool value);
     template <class Bools>
     void SaveBoolsI(IDTag tag, Bools const& values, u64 count);
     template <class Enc>
     void SaveForeignTextsI(IDTag tag, StringT<Enc> const* texts, u64 count);
-    bool HasClassI() const { return m_defaults != nullptr; }
+    DefaultRow const* FindDefaultI(IDTag tag) const;
+    bool HasDefaultI(IDTag tag) const;
     bool TestDefaultObjectsI(IDTag tag, std::vector<Consolidated<SharedSerialisable>> const& objects) const;
     template <InlineSerialisable T>
     void SaveClassBodyI(T const& value)
@@ -403,6 +439,8 @@ private:
     template <class T>
     void SaveObjectBodyI(T const& object, u32 index);
     template <class T>
+    void SaveMembersI(T const& object, OutSerialiserClass& known);
+    template <class T>
     void EnumerateObjectBodyI(T const& object);
 
     void SaveClassInfoI(ClassPropertiesBase const* description);
@@ -412,12 +450,15 @@ private:
     void SaveClassInfoEnumeratePathsOnlyI(ClassPropertiesBase const* description);
     String8 GetHolderPathI(Counted<DelayLoadHolder> const& holder, FileStoreOutPathGenerator& generator);
 
-    DefaultTable const* m_defaults; // Of the class in hand and its parents; null at file level and in inline classes.
+    // Where the list stands in the sequence of its class: all tags before m_step are used, and no others. Null and the
+    // end of none once a tag was out of sequence; from then on m_usedTags has all.
+    OutSerialiserStep const* m_step;
+    OutSerialiserStep const* m_firstStep;
+    bool const* const m_abort;         // Never null.
+    OutSerialiserClass* const m_class; // Null at file level and in inline classes.
     Advice const* m_advice;
     std::unique_ptr<Advice> m_ownAdvice;
-    bool m_isChildActive = false;
-    bool m_isClosed = false;
-    bool const m_isFullSave;
+    u8 m_obstacles;
     bool const m_isFileLevel;
     std::optional<NestingGuard> m_level; // Of an inline class; that of an object also spans its class record.
     UsedTagSet m_usedTags;

@@ -1,7 +1,7 @@
 #include "libkernel/serialisation/OutSerialiserObjectList.h"
 
-#include <algorithm>
-#include <functional>
+#include "libkernel/serialisation/ClassProperties.h"
+#include "libkernel/serialisation/internal/DefaultTable.h"
 
 namespace Kernel {
 
@@ -23,44 +23,30 @@ void OutSerialiserObjectList::Map::Grow()
     *this = std::move(larger);
 }
 
-OutSerialiserObjectList::Record& OutSerialiserObjectList::FindOrAddI(Map& map, void const* object, u32& index,
-                                                                     bool& isNew)
+OutSerialiserClass& OutSerialiserObjectList::FindClass(ClassPropertiesBase const& description)
 {
-    if (map.used >= map.size / 4 * 3) map.Grow();
-    u32 const hash = GetHash(object);
-    u32 const mask = map.size - 1;
-    u32 at = hash & mask;
-    for (; map.slots[at].place; at = (at + 1) & mask) {
-        if (map.slots[at].hash != hash) continue;
-        index = map.slots[at].place - 1;
-        Record& record = GetRecord(index);
-        if (record.object != object) continue;
-        ++record.references;
-        isNew = false;
-        return record;
+    auto const [at, isNew] = m_classes.try_emplace(&description);
+    OutSerialiserClass& known = at->second;
+    if (isNew) {
+        known.description = &description;
+        DefaultTable const& defaults = description.GetDefaultTable();
+        if (!defaults.IsEmpty()) known.defaults = &defaults;
     }
-    ++map.used;
-    index = m_nextIndex++;
-    map.slots[at] = {hash, index + 1};
-    if (index % c_pieceSize == 0) m_records.push_back(std::make_unique_for_overwrite<Record[]>(c_pieceSize));
-    isNew = true;
-    Record& record = GetRecord(index);
-    record = {object, 1, 0, 0};
-    return record;
+    m_lastClass = &known;
+    return known;
 }
 
-bool OutSerialiserObjectList::IsDescribed(ClassPropertiesBase const* description) const
+void OutSerialiserObjectList::Learn(OutSerialiserClass& known, std::span<u32 const> tags)
 {
-    if (description == m_lastDescribed) return true;
-    if (!std::ranges::binary_search(m_described, description, std::less<>())) return false;
-    m_lastDescribed = description;
-    return true;
-}
-
-void OutSerialiserObjectList::MarkAsDescribed(ClassPropertiesBase const* description)
-{
-    auto const place = std::ranges::lower_bound(m_described, description, std::less<>());
-    if (place == m_described.end() || *place != description) m_described.insert(place, description);
+    if (tags.empty() || known.sequenceCount == OutSerialiserClass::c_maxSequences) return;
+    auto steps = std::make_unique<OutSerialiserStep[]>(tags.size() + 1);
+    for (size_t i = 0; i < tags.size(); ++i) {
+        DefaultRow const* const row = known.defaults ? known.defaults->Find(IDTag(tags[i])) : nullptr;
+        steps[i] = {tags[i], 0, PropType::EndOfList, row};
+        if (row && row->size) steps[i].type = row->type, steps[i].value = row->value;
+    }
+    known.steps = steps.get();
+    known.sequences[known.sequenceCount++] = std::move(steps);
 }
 
 } // namespace Kernel

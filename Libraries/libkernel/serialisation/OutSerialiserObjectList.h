@@ -3,13 +3,33 @@
 #include "libkernel/core/Countable.h"
 #include "libkernel/core/Export.h"
 #include "libkernel/core/Types.h"
+#include "libkernel/serialisation/OutSerialiserStep.h"
 
+#include <array>
+#include <map>
 #include <memory>
+#include <span>
 #include <vector>
 
 namespace Kernel {
 
 class ClassPropertiesBase;
+class DefaultTable;
+
+/// What one save knows of a class.
+struct OutSerialiserClass
+{
+    static constexpr u32 c_maxSequences = 4;
+
+    ClassPropertiesBase const* description = nullptr;
+    DefaultTable const* defaults = nullptr; ///< Of the class and its parents; null if there are none.
+    bool isDescribed = false;
+    /// The tags that an object of the class saved, in its order, or null. Objects that are being saved go by older
+    /// sequences, so these live on too.
+    OutSerialiserStep const* steps = nullptr;
+    std::array<std::unique_ptr<OutSerialiserStep[]>, c_maxSequences> sequences;
+    u32 sequenceCount = 0;
+};
 
 /// The state of one save, shared by all its nested serialisers: which objects were written under which index, and which
 /// classes were described. Objects are told apart by address, so each must live until the save ends. Belongs to the
@@ -47,8 +67,14 @@ public:
         if (m_objects.size) __builtin_prefetch(&m_objects.slots[GetHash(object) & (m_objects.size - 1)]);
     }
 
-    bool IsDescribed(ClassPropertiesBase const* description) const;
-    void MarkAsDescribed(ClassPropertiesBase const* description);
+    /// What is known of a class; made at the first question, and stays good.
+    OutSerialiserClass& GetClass(ClassPropertiesBase const& description)
+    {
+        return m_lastClass && m_lastClass->description == &description ? *m_lastClass : FindClass(description);
+    }
+    /// Notes in which order an object of the class has saved its tags, all different; the next objects are expected to
+    /// do the same. A class whose objects keep no order stays as it is after a few attempts.
+    static void Learn(OutSerialiserClass& known, std::span<u32 const> tags);
 
     /// A save that failed writes nothing more, so that what is destroyed on the way out does no harm.
     void MarkAsHandlingException() { m_isHandlingException = true; }
@@ -86,6 +112,7 @@ private:
         u64 const page = (address >> 12) * 0x9E3779B97F4A7C15ull;
         return static_cast<u32>(page >> 32) + static_cast<u32>(address >> 4 & 0xFF);
     }
+    OutSerialiserClass& FindClass(ClassPropertiesBase const& description);
     Record& FindOrAddI(Map& map, void const* object, u32& index, bool& isNew);
     Record& GetRecord(u32 index) const { return m_records[index / c_pieceSize][index % c_pieceSize]; }
 
@@ -94,9 +121,35 @@ private:
     std::vector<std::unique_ptr<Record[]>> m_records;
     u32 m_nextIndex = 0;
     bool m_isHandlingException = false;
-    mutable ClassPropertiesBase const* m_lastDescribed = nullptr; // Of the last successful question.
-    std::vector<ClassPropertiesBase const*> m_described;          // Sorted by address.
+    std::map<ClassPropertiesBase const*, OutSerialiserClass> m_classes;
+    OutSerialiserClass* m_lastClass = nullptr; // Asked for last: objects of one class come in runs.
     std::vector<Counted<Countable const>> m_keptAlive;
 };
+
+inline OutSerialiserObjectList::Record& OutSerialiserObjectList::FindOrAddI(Map& map, void const* object, u32& index,
+                                                                            bool& isNew)
+{
+    if (map.used >= map.size / 4 * 3) map.Grow();
+    u32 const hash = GetHash(object);
+    u32 const mask = map.size - 1;
+    u32 at = hash & mask;
+    for (; map.slots[at].place; at = (at + 1) & mask) {
+        if (map.slots[at].hash != hash) continue;
+        index = map.slots[at].place - 1;
+        Record& record = GetRecord(index);
+        if (record.object != object) continue;
+        ++record.references;
+        isNew = false;
+        return record;
+    }
+    ++map.used;
+    index = m_nextIndex++;
+    map.slots[at] = {hash, index + 1};
+    if (index % c_pieceSize == 0) m_records.push_back(std::make_unique_for_overwrite<Record[]>(c_pieceSize));
+    isNew = true;
+    Record& record = GetRecord(index);
+    record = {object, 1, 0, 0};
+    return record;
+}
 
 } // namespace Kernel

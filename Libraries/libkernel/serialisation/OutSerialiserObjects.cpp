@@ -24,32 +24,45 @@ constexpr u8 c_classType = static_cast<u8>(PropType::Class);
 
 } // namespace
 
+// Of an object.
+inline OutSerialiser::OutSerialiser(OutSerialiser& parent, OutSerialiserClass& known)
+    : m_target(parent.m_target), m_store(parent.m_store), m_objects(parent.m_objects),
+      m_step(known.steps ? known.steps : &s_noStep), m_firstStep(known.steps), m_abort(parent.m_abort), m_class(&known),
+      m_advice(parent.m_advice), m_obstacles(parent.m_obstacles & Enumerating), m_isFileLevel(false)
+{
+}
+
 void OutSerialiser::SaveObject(IDTag tag, NonCounted<Serialisable const> object, bool isOwner)
 {
     StartI(tag);
-    if (m_isFullSave) PutHeaderI(tag, c_objectType, 0);
+    if (IsFullSave()) PutHeaderI(tag, c_objectType, 0);
     SaveObjectI(object, isOwner);
 }
 
 void OutSerialiser::SaveSharedObject(IDTag tag, Consolidated<SharedSerialisable> const& object)
 {
-    StartI(tag);
-    auto const equals = [&](DefaultTable::Row const& row) {
-        auto const* const item = row.As<Defaults::DefaultSharedObject>();
-        return item && item->Compare(object);
-    };
-    if (m_defaults && m_defaults->Matches(tag, equals)) return;
-    if (m_isFullSave) PutHeaderI(tag, c_objectType, 0);
+    DefaultRow const* const row = StartI(tag);
+    auto const* const item = row ? row->As<Defaults::DefaultSharedObject>() : nullptr;
+    if (item && item->Compare(object)) return;
+    if (IsFullSave()) PutHeaderI(tag, c_objectType, 0);
     SaveSharedObjectI(object);
+}
+
+DefaultRow const* OutSerialiser::FindDefaultI(IDTag tag) const
+{
+    return m_class && m_class->defaults ? m_class->defaults->Find(tag) : nullptr;
+}
+
+bool OutSerialiser::HasDefaultI(IDTag tag) const
+{
+    return FindDefaultI(tag) != nullptr;
 }
 
 bool OutSerialiser::TestDefaultObjectsI(IDTag tag, std::vector<Consolidated<SharedSerialisable>> const& objects) const
 {
-    auto const equals = [&](DefaultTable::Row const& row) {
-        auto const* const item = row.As<Defaults::DefaultSharedObjectArray>();
-        return item && item->Compare(objects);
-    };
-    return m_defaults && m_defaults->Matches(tag, equals);
+    DefaultRow const* const row = FindDefaultI(tag);
+    auto const* const item = row ? row->As<Defaults::DefaultSharedObjectArray>() : nullptr;
+    return item && item->Compare(objects);
 }
 
 void OutSerialiser::StartObjectArrayTestI(IDTag tag)
@@ -59,7 +72,7 @@ void OutSerialiser::StartObjectArrayTestI(IDTag tag)
 
 void OutSerialiser::StartObjectArrayBeginI(IDTag tag, u64 count)
 {
-    if (!m_isFullSave) return;
+    if (!IsFullSave()) return;
     u32 const stored = CheckCountI(count);
     StoreLittleEndian(PutHeaderI(tag, c_objectType | c_propArrayBit, 4), stored);
 }
@@ -81,7 +94,7 @@ void OutSerialiser::PutObjectRecordI(ObjectRecord kind, u32 index)
 
 void OutSerialiser::SaveObjectI(NonCounted<Serialisable const> object, bool isOwner)
 {
-    if (!m_isFullSave) return object ? SaveObjectEnumeratePathsOnlyI(*object) : void();
+    if (!IsFullSave()) return object ? SaveObjectEnumeratePathsOnlyI(*object) : void();
     if (!object) {
         *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
         return;
@@ -98,7 +111,7 @@ void OutSerialiser::SaveObjectI(NonCounted<Serialisable const> object, bool isOw
 
 void OutSerialiser::SaveSharedObjectI(Consolidated<SharedSerialisable> const& object)
 {
-    if (!m_isFullSave) return object ? SaveSharedObjectEnumeratePathsOnlyI(*object) : void();
+    if (!IsFullSave()) return object ? SaveSharedObjectEnumeratePathsOnlyI(*object) : void();
     if (!object) {
         *ClaimI(1) = static_cast<u8>(ObjectRecord::Null);
         return;
@@ -113,22 +126,36 @@ void OutSerialiser::SaveSharedObjectI(Consolidated<SharedSerialisable> const& ob
     record.isWriting = false;
 }
 
-// On an exception the mark of the active child stays, so that nobody writes on behind half an object.
 template <class T>
 void OutSerialiser::SaveObjectBodyI(T const& object, u32 index)
 {
     NestingGuard const level;
     ClassPropertiesBase const* const description = object.GetObjectClassProperties();
     if (!description || !level.IsAllowed()) Fail(SaveException::Misuse);
-    PutObjectRecordI(ObjectRecord::First, index);
-    SaveClassInfoI(description);
-    m_isChildActive = true;
+    OutSerialiserClass& known = m_objects.GetClass(*description);
+    if (known.isDescribed) {
+        u8* const to = ClaimI(10);
+        StoreLittleEndian(to, static_cast<u64>(ObjectRecord::First) | u64{index} << 8 |
+                                  static_cast<u64>(ClassRecord::Known) << 40);
+        StoreLittleEndian(to + 6, description->GetClassUID().value);
+    } else {
+        PutObjectRecordI(ObjectRecord::First, index);
+        SaveClassInfoI(description);
+    }
+    SaveMembersI(object, known);
+}
+
+// On an exception the mark of the active child stays, so that nobody writes on behind half an object.
+template <class T>
+void OutSerialiser::SaveMembersI(T const& object, OutSerialiserClass& known)
+{
+    m_obstacles |= ChildActive;
     {
-        OutSerialiser child(*this, description);
+        OutSerialiser child(*this, known);
         object.Save(child);
         child.Close();
     }
-    m_isChildActive = false;
+    m_obstacles &= static_cast<u8>(~ChildActive);
 }
 
 void OutSerialiser::SaveClassInfoI(ClassPropertiesBase const* description)
@@ -137,15 +164,15 @@ void OutSerialiser::SaveClassInfoI(ClassPropertiesBase const* description)
         *ClaimI(1) = static_cast<u8>(ClassRecord::None);
         return;
     }
-    bool const isKnown = m_objects.IsDescribed(description);
-    u8* const record = ClaimI(isKnown ? 5 : 7);
-    record[0] = static_cast<u8>(isKnown ? ClassRecord::Known : ClassRecord::Described);
+    OutSerialiserClass& known = m_objects.GetClass(*description);
+    u8* const record = ClaimI(known.isDescribed ? 5 : 7);
+    record[0] = static_cast<u8>(known.isDescribed ? ClassRecord::Known : ClassRecord::Described);
     StoreLittleEndian(record + 1, description->GetClassUID().value);
-    if (isKnown) return;
+    if (known.isDescribed) return;
     StoreLittleEndian(record + 5, static_cast<u16>(description->GetSchemaVersion()));
     for (auto const& [tag, item] : description->GetDefaults()) SaveDefaultI(*item);
     *ClaimI(1) = 0;
-    m_objects.MarkAsDescribed(description);
+    known.isDescribed = true;
     NestingGuard const level;
     if (!level.IsAllowed()) Fail(SaveException::Misuse);
     SaveClassInfoI(description->GetParentClassProperties());
@@ -248,19 +275,15 @@ void OutSerialiser::EnumerateObjectBodyI(T const& object)
     ClassPropertiesBase const* const description = object.GetObjectClassProperties();
     if (!description || !level.IsAllowed()) Fail(SaveException::Misuse);
     SaveClassInfoEnumeratePathsOnlyI(description);
-    m_isChildActive = true;
-    {
-        OutSerialiser child(*this, description);
-        object.Save(child);
-        child.Close();
-    }
-    m_isChildActive = false;
+    SaveMembersI(object, m_objects.GetClass(*description));
 }
 
 void OutSerialiser::SaveClassInfoEnumeratePathsOnlyI(ClassPropertiesBase const* description)
 {
     using Defaults::DefaultItemType;
-    if (!description || m_objects.IsDescribed(description)) return;
+    if (!description) return;
+    OutSerialiserClass& known = m_objects.GetClass(*description);
+    if (known.isDescribed) return;
     for (auto const& [tag, item] : description->GetDefaults()) {
         DefaultItemType const kind = item->GetDefaultType();
         if (kind == DefaultItemType::StringArray || kind > DefaultItemType::SharedObjectArray)
@@ -271,7 +294,7 @@ void OutSerialiser::SaveClassInfoEnumeratePathsOnlyI(ClassPropertiesBase const* 
         for (auto const& object : static_cast<Defaults::DefaultSharedObjectArray const&>(*item).GetObjects())
             SaveSharedObjectI(object);
     }
-    m_objects.MarkAsDescribed(description);
+    known.isDescribed = true;
     NestingGuard const level;
     if (!level.IsAllowed()) Fail(SaveException::Misuse);
     SaveClassInfoEnumeratePathsOnlyI(description->GetParentClassProperties());
@@ -284,8 +307,8 @@ void OutSerialiser::StartClassTestI(IDTag tag)
 
 void OutSerialiser::StartClassBeginI(IDTag tag, ClassUID const& classUID, unsigned short version)
 {
-    m_isChildActive = true;
-    if (!m_isFullSave) return;
+    m_obstacles |= ChildActive;
+    if (!IsFullSave()) return;
     u8* const to = PutHeaderI(tag, c_classType, 7);
     to[0] = 1;
     StoreLittleEndian(to + 1, classUID.value);
@@ -294,13 +317,13 @@ void OutSerialiser::StartClassBeginI(IDTag tag, ClassUID const& classUID, unsign
 
 void OutSerialiser::EndPropClassI()
 {
-    m_isChildActive = false;
+    m_obstacles &= static_cast<u8>(~ChildActive);
 }
 
 void OutSerialiser::SaveNullPropClassI(IDTag tag)
 {
     StartI(tag);
-    if (m_isFullSave) *PutHeaderI(tag, c_classType, 1) = 0;
+    if (IsFullSave()) *PutHeaderI(tag, c_classType, 1) = 0;
 }
 
 void OutSerialiser::StartClassArrayTestI(IDTag tag)
@@ -311,8 +334,8 @@ void OutSerialiser::StartClassArrayTestI(IDTag tag)
 void OutSerialiser::StartClassArrayBeginI(IDTag tag, ClassUID const& classUID, unsigned short version, u64 count)
 {
     u32 const stored = CheckCountI(count);
-    m_isChildActive = true;
-    if (!m_isFullSave) return;
+    m_obstacles |= ChildActive;
+    if (!IsFullSave()) return;
     u8* const to = PutHeaderI(tag, c_classType | c_propArrayBit, 10);
     StoreLittleEndian(to, stored);
     StoreLittleEndian(to + 4, classUID.value);
@@ -321,31 +344,31 @@ void OutSerialiser::StartClassArrayBeginI(IDTag tag, ClassUID const& classUID, u
 
 void OutSerialiser::StartClassArrayClassI()
 {
-    if (m_isFullSave) *ClaimI(1) = 1;
+    if (IsFullSave()) *ClaimI(1) = 1;
 }
 
 void OutSerialiser::StartClassArrayClassNullI()
 {
-    if (m_isFullSave) *ClaimI(1) = 0;
+    if (IsFullSave()) *ClaimI(1) = 0;
 }
 
 void OutSerialiser::EndPropClassArrayI()
 {
-    m_isChildActive = false;
+    m_obstacles &= static_cast<u8>(~ChildActive);
 }
 
 void OutSerialiser::SaveDelayLoadObject(IDTag tag, Counted<DelayLoadHolder> const& holder,
                                         FileStoreOutPathGenerator& generator, Counted<FileStoreCompressionHint> hint)
 {
     StartI(tag);
-    if (!holder && !m_isFullSave) return;
+    if (!holder && !IsFullSave()) return;
     ClassUID itemType;
     String8 path;
     if (holder) {
         itemType = holder->GetFileStoreItemType()->GetClassUID();
         if (m_store.GetPurpose() != FileStoreOut::PurposeEnumerateHolders) path = GetHolderPathI(holder, generator);
     }
-    if (m_isFullSave) {
+    if (IsFullSave()) {
         u8* const header = PutHeaderI(tag, static_cast<u8>(PropType::DelayLoad), 8);
         StoreLittleEndian(header, itemType.value);
         StoreLittleEndian(header + 4, static_cast<u32>(path.GetLength()));

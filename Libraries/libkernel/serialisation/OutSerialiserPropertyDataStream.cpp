@@ -28,12 +28,12 @@ OutSerialiserPropertyDataStream::OutSerialiserPropertyDataStream(OutSerialiser& 
         out.StartI(tag);
         StoreLittleEndian(out.PutHeaderI(tag, static_cast<u8>(PropType::DataStream), 2), version);
     }
-    out.m_isChildActive = true;
+    out.m_obstacles |= OutSerialiser::ChildActive;
 }
 
 OutSerialiserPropertyDataStream::~OutSerialiserPropertyDataStream()
 {
-    m_out.m_isChildActive = false;
+    m_out.m_obstacles &= static_cast<u8>(~OutSerialiser::ChildActive);
 }
 
 void OutSerialiserPropertyDataStream::Fail(int code, SourceLocation where) const

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "libkernel/core/Endian.h"
 #include "libkernel/core/Export.h"
 #include "libkernel/core/Types.h"
 
@@ -28,6 +29,8 @@ public:
     /// Room for @p count bytes, at most c_maxClaim; Advance then takes as many of them as were filled. Null when the
     /// stream failed.
     u8* Reserve(u64 count) { return count <= static_cast<u64>(m_end - m_next) || Flush() ? m_next : nullptr; }
+    /// True if Reserve gives that much without handing anything on.
+    bool HasRoom(u64 count) const { return count <= static_cast<u64>(m_end - m_next); }
     void Advance(u64 count) { m_next += count; }
     /// Both at once: the caller fills the whole room.
     u8* Claim(u64 count)
@@ -40,7 +43,7 @@ public:
     bool Put(void const* bytes, u64 count)
     {
         if (count > static_cast<u64>(m_end - m_next)) return PutLarge(bytes, count);
-        if (count) std::memcpy(m_next, bytes, count);
+        Copy(m_next, static_cast<u8 const*>(bytes), count);
         m_next += count;
         return true;
     }
@@ -54,6 +57,16 @@ public:
     void MarkAsFailed();
 
 private:
+    // Most texts are short, and a call costs more than their bytes.
+    static void Copy(u8* to, u8 const* from, u64 count)
+    {
+        if (count >= 8 && count <= 16) {
+            u64 const last = LoadLittleEndian<u64>(from + count - 8);
+            StoreLittleEndian(to, LoadLittleEndian<u64>(from));
+            StoreLittleEndian(to + count - 8, last);
+        } else if (count)
+            std::memcpy(to, from, count);
+    }
     bool PutLarge(void const* bytes, u64 count);
 
     OutStream& m_stream;

@@ -4,6 +4,7 @@
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/Types.h"
 
+#include <span>
 #include <vector>
 
 namespace Kernel {
@@ -13,6 +14,8 @@ namespace Kernel {
 class KERNEL_API UsedTagSet
 {
 public:
+    static constexpr u32 c_inPlace = 24;
+
     UsedTagSet() {}
     UsedTagSet(UsedTagSet const&) = delete;
     UsedTagSet& operator=(UsedTagSet const&) = delete;
@@ -33,9 +36,10 @@ public:
             m_inPlace[m_count++] = tag.value;
         return true;
     }
+    /// The tags in the order of their use, while there are at most c_inPlace; otherwise nothing.
+    std::span<u32 const> GetShort() const { return {m_inPlace, m_count}; }
 
 private:
-    static constexpr u32 c_inPlace = 24;
     bool ContainsSorted(IDTag tag) const;
     void AddSorted(IDTag tag);
 

@@ -1,9 +1,8 @@
 #pragma once
 
 #include "libkernel/core/Endian.h"
-#include "libkernel/filestore/FileStoreOut.h"
 #include "libkernel/serialisation/OutSerialiser.h"
-#include "libkernel/serialisation/OutSerialiserTarget.h"
+#include "libkernel/serialisation/internal/DefaultTable.h"
 
 #include <limits>
 
@@ -46,11 +45,12 @@ inline u16 OutSerialiser::CheckShortI(u64 size) const
     return static_cast<u16>(size);
 }
 
-inline void OutSerialiser::StartI(IDTag tag)
+inline DefaultRow const* OutSerialiser::StartI(IDTag tag)
 {
-    if (m_store.IsAbortRequested()) AbortI();
-    if (m_isClosed) Fail(SaveException::Misuse);
-    if (m_isChildActive || !m_usedTags.Add(tag)) Fail(SaveException::TagOrChild);
+    if (IsAbortRequestedI()) AbortI();
+    if (m_obstacles & Closed) Fail(SaveException::Misuse);
+    if (m_obstacles & ChildActive) Fail(SaveException::TagOrChild);
+    return m_step->tag == tag.value ? (m_step++)->row : StartOutOfSequenceI(tag);
 }
 
 } // namespace Kernel
