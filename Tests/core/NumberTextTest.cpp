@@ -6,19 +6,60 @@
 namespace Kernel {
 namespace {
 
-TEST(NumberTextTest, EveryMagnitudeReadsAsTheCLibraryWritesIt)
+// Units from the last to the first, one by one.
+std::u16string ReadByTheRules(i64 value, SignStyle sign, CharacterGrouping const& grouping, u32 width, PadStyle pad)
 {
+    std::string digits = std::to_string(value);
+    std::u16string text;
+    if (value < 0) digits.erase(0, 1);
+    std::u16string const before = value < 0                  ? u"-"
+                                  : sign == SignStyle::Plus  ? u"+"
+                                  : sign == SignStyle::Space ? u" "
+                                                             : u"";
+    u32 inGroup = 0;
+    auto const put = [&](char digit) {
+        if (grouping.size != 0 && inGroup++ == grouping.size) {
+            text.insert(0, 1, static_cast<char16_t>(grouping.separator));
+            inGroup = 1;
+        }
+        text.insert(0, 1, static_cast<char16_t>(digit));
+    };
+    for (size_t i = digits.size(); i > 0; --i) put(digits[i - 1]);
+    while (pad == PadStyle::ZerosLeft && before.size() + text.size() < width) {
+        put('0');
+        if (before.size() + text.size() > width) text.erase(1, 1); // No separator comes first.
+    }
+    text = before + text;
+    if (text.size() < width) text.insert(pad == PadStyle::SpacesRight ? text.size() : 0, width - text.size(), u' ');
+    return text;
+}
+
+TEST(NumberTextTest, EveryStyleAndWidthReadsByTheRules)
+{
+    constexpr SignStyle signs[] = {SignStyle::None, SignStyle::Plus, SignStyle::Space};
+    constexpr PadStyle pads[] = {PadStyle::SpacesLeft, PadStyle::ZerosLeft, PadStyle::SpacesRight};
+    constexpr CharacterGrouping groupings[] = {{0, ','}, {3, ','}, {1, '.'}, {2, ' '}, {3, 0x202F}, {30, ','}};
     std::mt19937_64 random(1);
+    u64 power = 1;
     for (int round = 0; round < 20000; ++round) {
-        u64 const value = random() >> (random() % 64);
-        ASSERT_EQ(ToString(value), std::to_string(value).c_str());
-        ASSERT_EQ(ToString(static_cast<i64>(value)), std::to_string(static_cast<i64>(value)).c_str());
+        i64 value = static_cast<i64>(random() >> (random() % 64));
+        if (round % 4 == 0) value = static_cast<i64>(power + random() % 3 - 1);
+        if (round % 4 == 0) power = power > UINT64_MAX / 20 ? 1 : power * 10;
+        SignStyle const sign = signs[random() % 3];
+        PadStyle const pad = pads[random() % 3];
+        CharacterGrouping const& grouping = groupings[random() % 6];
+        u32 const width = random() % 4 ? static_cast<u32>(random() % 40) : 0;
+        std::u16string const expected = ReadByTheRules(value, sign, grouping, width, pad);
+        String16 const text = ToStringTPadded<String16>(value, static_cast<int>(width), pad, sign, &grouping);
+        ASSERT_EQ(text, expected.c_str()) << value << " width " << width;
+        if (grouping.separator > 0x7F) continue;
+        ASSERT_EQ(ToStringPadded(value, static_cast<int>(width), pad, sign, &grouping),
+                  std::string(expected.begin(), expected.end()).c_str());
+        ASSERT_EQ(ToString(static_cast<u64>(value)), std::to_string(static_cast<u64>(value)).c_str());
         char hex[32];
         std::snprintf(hex, sizeof hex, "%llx", static_cast<unsigned long long>(value));
-        ASSERT_EQ(ToStringBase(value, 16, false), hex);
+        ASSERT_EQ(ToStringBase(static_cast<u64>(value), 16, false), hex);
     }
-    for (u64 power = 1; power < u64{1} << 60; power *= 10)
-        for (u64 value : {power - 1, power, power + 1}) ASSERT_EQ(ToString(value), std::to_string(value).c_str());
 }
 
 TEST(NumberTextTest, EveryWidthShowsItsLimits)
@@ -46,16 +87,12 @@ TEST(NumberTextTest, SignsAndGroups)
         CharacterGrouping const* grouping;
         char const* expected;
     };
-    CharacterGrouping const none{0, ','};
     for (Case const& c : {Case{1234567, SignStyle::None, CharacterGroupingNumber(), "1,234,567"},
                           Case{100, SignStyle::None, CharacterGroupingNumber(), "100"},
-                          Case{1000, SignStyle::Plus, CharacterGroupingNumber(), "+1,000"},
-                          Case{-999999, SignStyle::Space, CharacterGroupingNumber(), "-999,999"},
                           Case{0, SignStyle::None, nullptr, "0"}, Case{0, SignStyle::Plus, nullptr, "+0"},
                           Case{0, SignStyle::Space, nullptr, " 0"}, Case{-7, SignStyle::Plus, nullptr, "-7"},
                           Case{12345, SignStyle::None, CharacterGroupingHexBytes(), "1 23 45"},
-                          Case{123456789, SignStyle::None, CharacterGroupingHexWords(), "1 2345 6789"},
-                          Case{1234567, SignStyle::None, &none, "1234567"}})
+                          Case{123456789, SignStyle::None, CharacterGroupingHexWords(), "1 2345 6789"}})
     {
         SCOPED_TRACE(c.expected);
         EXPECT_EQ(ToString(c.value, c.sign, c.grouping), c.expected);
@@ -77,14 +114,11 @@ TEST(NumberTextTest, FieldsAreFilled)
     constexpr auto right = PadStyle::SpacesRight;
     for (Case const& c :
          {Case{-5, 6, zeros, SignStyle::None, false, "-00005"}, Case{-5, 6, left, SignStyle::None, false, "    -5"},
-          Case{-5, 6, right, SignStyle::None, false, "-5    "}, Case{5, 3, zeros, SignStyle::Plus, false, "+05"},
-          Case{123456, 3, left, SignStyle::None, false, "123456"}, Case{7, -9, zeros, SignStyle::None, false, "7"},
+          Case{-5, 6, right, SignStyle::None, false, "-5    "}, Case{7, -9, zeros, SignStyle::None, false, "7"},
+          Case{123456, 3, left, SignStyle::None, false, "123456"},
           Case{1234, 9, zeros, SignStyle::None, true, "0,001,234"},
           Case{1234, 8, zeros, SignStyle::None, true, "0001,234"},
-          Case{1234, 7, zeros, SignStyle::None, true, "001,234"}, Case{123, 4, zeros, SignStyle::None, true, "0123"},
-          Case{-123, 6, zeros, SignStyle::None, true, "-0,123"}, Case{-123, 5, zeros, SignStyle::None, true, "-0123"},
-          Case{-1234, 8, left, SignStyle::None, true, "  -1,234"},
-          Case{1234, 8, right, SignStyle::Space, true, " 1,234  "}, Case{0, 5, zeros, SignStyle::None, true, "0,000"}})
+          Case{-123, 5, zeros, SignStyle::None, true, "-0123"}})
     {
         SCOPED_TRACE(c.expected);
         EXPECT_EQ(ToStringPadded(c.value, c.width, c.pad, c.sign, c.grouped ? CharacterGroupingNumber() : nullptr),

@@ -1,5 +1,6 @@
 #include "libkernel/text/TimeText.h"
 
+#include "libkernel/core/CharTraits.h"
 #include "libkernel/core/ConvertEnc.h"
 #include "libkernel/text/internal/IcuLocale.h"
 
@@ -39,6 +40,37 @@ StyleFormats const* FormatsOf(TimeStampStyle style)
     return row < std::size(c_formats) ? &c_formats[row] : nullptr;
 }
 
+// What strftime makes of a format; empty if it does not fit.
+class Printed
+{
+public:
+    Printed(char const* format, std::tm const& fields)
+    {
+        if (std::strftime(m_text, sizeof m_text, format, &fields) == 0) m_text[0] = 0;
+    }
+
+    void FillInMillis(u16 millis)
+    {
+        char* const place = std::strstr(m_text, c_millisPlace);
+        if (!place) return;
+        char digits[8];
+        std::snprintf(digits, sizeof digits, "%03d", millis);
+        std::memcpy(place + 1, digits, 3);
+    }
+
+    // The host's locale may have another encoding than UTF-8, which the conversion must not be given.
+    template <class S>
+    S As() const
+    {
+        int const length = static_cast<int>(std::strlen(m_text));
+        int const valid = CharTraits<TEncUtf8>::GetValidLength(m_text, length, false);
+        return ConvertedTo<typename S::EncodingType>(String8(m_text, valid));
+    }
+
+private:
+    char m_text[c_textSize];
+};
+
 using FormatPtr = std::unique_ptr<icu::DateFormat>;
 
 FormatPtr MakeFormat(TimeStampStyle style, icu::Locale const& locale)
@@ -71,11 +103,8 @@ S ToStringT(TimeStamp const& stamp, TimeStampStyle style, TimeStampLocale zone)
 {
     StyleFormats const* const formats = FormatsOf(style);
     if (!formats) return S();
-    std::tm const fields = stamp.GetAsStructTm(zone);
-    char text[c_textSize];
-    size_t const length =
-        std::strftime(text, sizeof text, zone == TimeStampLocale::Local ? formats->local : formats->utc, &fields);
-    return ConvertedTo<typename S::EncodingType>(String8(text, static_cast<int>(length)));
+    Printed const text(zone == TimeStampLocale::Local ? formats->local : formats->utc, stamp.GetAsStructTm(zone));
+    return text.As<S>();
 }
 
 template <class S>
@@ -83,17 +112,9 @@ S ToStringT(HighResTimeStamp const& stamp, TimeStampStyle style, TimeStampLocale
 {
     StyleFormats const* const formats = FormatsOf(style);
     if (!formats) return S();
-    std::tm const fields = stamp.GetAsStructTm(zone);
-    char text[c_textSize];
-    size_t const length = std::strftime(
-        text, sizeof text, zone == TimeStampLocale::Local ? formats->localMillis : formats->utcMillis, &fields);
-    text[length] = 0;
-    if (char* const place = std::strstr(text, c_millisPlace)) {
-        char digits[8];
-        std::snprintf(digits, sizeof digits, "%03d", stamp.GetMillis());
-        std::memcpy(place + 1, digits, 3);
-    }
-    return ConvertedTo<typename S::EncodingType>(String8(text, static_cast<int>(length)));
+    Printed text(zone == TimeStampLocale::Local ? formats->localMillis : formats->utcMillis, stamp.GetAsStructTm(zone));
+    text.FillInMillis(stamp.GetMillis());
+    return text.As<S>();
 }
 
 template <class S>

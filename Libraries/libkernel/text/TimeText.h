@@ -17,7 +17,7 @@ enum class TimeStampStyle : u32
 };
 
 /// By the C library's strftime, with the formats "%c", "%x" and "%X" of the C library's locale for the first three
-/// styles. Empty for any other style, and for a text of 256 units or more.
+/// styles. Empty for any other style, and for a text of 256 units or more; cut where it stops being UTF-8.
 template <class S>
 S ToStringT(TimeStamp const& stamp, TimeStampStyle style, TimeStampLocale zone);
 template <class S>
