@@ -2,8 +2,10 @@
 
 #include <gtest/gtest.h>
 #include <string>
+#include <thread>
 #include <unicode/uchar.h>
 #include <unicode/ustring.h>
+#include <vector>
 
 namespace Kernel {
 namespace {
@@ -65,6 +67,20 @@ TEST(CaseTableTest, LanguagesKeepTheirOwnRules)
         SCOPED_TRACE(c.locale);
         EXPECT_EQ(Map(c.operation, c.locale, c.codePoint), c.mapped) << c.codePoint;
     }
+}
+
+TEST(CaseTableTest, ThreadsThatComeFirstTogetherShareOneTable)
+{
+    CaseTable const* seen[4] = {};
+    std::vector<std::thread> threads;
+    for (CaseTable const*& place : seen)
+        threads.emplace_back([&place] {
+            place = &CaseTable::Get(Operation::Title, "lt");
+            u32 to[CaseTable::c_longest];
+            EXPECT_EQ(place->Map('a', to), 1);
+        });
+    for (std::thread& thread : threads) thread.join();
+    for (CaseTable const* table : seen) EXPECT_EQ(table, seen[0]);
 }
 
 } // namespace

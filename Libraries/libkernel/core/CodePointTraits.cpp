@@ -88,8 +88,7 @@ IndexRange CodePointTraits<Enc>::FindAnyOf(Unit const* s, int n, Unit const* set
 }
 
 template <class Enc>
-IndexRange CodePointTraits<Enc>::FindAnyOf(Unit const* s, int n, u32 const* set, int m,
-                                           int start) requires(!std::is_same_v<Unit, u32>)
+IndexRange CodePointTraits<Enc>::FindAnyOfCodePoints(Unit const* s, int n, u32 const* set, int m, int start)
 {
     CodePointSet wanted;
     for (u32 const* p = set; p < set + m; ++p) wanted.Add(*p);

@@ -29,12 +29,19 @@ struct CodePointTraits
     /// The first code point at or after @p start that stands in the set: its index and its units. Index -1 and length
     /// 0 if there is none. The set is @p m units of text, or @p m code points.
     static IndexRange FindAnyOf(Unit const* s, int n, Unit const* set, int m, int start);
-    static IndexRange FindAnyOf(Unit const* s, int n, u32 const* set, int m,
-                                int start) requires(!std::is_same_v<Unit, u32>);
+    template <class CodePoint>
+    requires(std::is_same_v<CodePoint, u32> && !std::is_same_v<CodePoint, Unit>) static IndexRange
+        FindAnyOf(Unit const* s, int n, CodePoint const* set, int m, int start)
+    {
+        return FindAnyOfCodePoints(s, n, set, m, start);
+    }
 
     /// Writes the code points of @p src to @p dst from the last to the first, @p n units, each code point with its
     /// units in order. The two must not overlap.
     static void Reverse(Unit* dst, Unit const* src, int n);
+
+private:
+    static IndexRange FindAnyOfCodePoints(Unit const* s, int n, u32 const* set, int m, int start);
 };
 
 extern template struct KERNEL_API CodePointTraits<TEncUtf8>;
