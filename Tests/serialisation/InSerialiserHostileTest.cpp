@@ -5,6 +5,7 @@
 #include "libkernel/serialisation/PropertyStreamDump.h"
 #include "serialisation/AllocationWatch.h"
 #include "serialisation/ReaderClasses.h"
+#include "serialisation/WriterTestSupport.h"
 #include "support/LoadEverything.h"
 
 #include <ctime>
@@ -48,6 +49,13 @@ PropertyBytes Start()
     return b;
 }
 
+// With what follows the header, as WriterTestSupport.h writes bytes.
+PropertyBytes Start(std::string_view more)
+{
+    PropertyBytes b = Start();
+    return b.Text(KernelTest::Bytes(more));
+}
+
 struct Case
 {
     char const* what;
@@ -82,40 +90,15 @@ std::vector<Case> BadStreams()
         {"raw data of 4 GiB in a data stream", Start().Item(0x30, "Strm").U16(1).U8(0x2D).U32(0xFFFFFFFF).U8(1)},
         {"strings of 4 GiB in a data stream",
          Start().Item(0x30, "Strm").U16(1).U8(0xAB).U32(8).U32(1).U32(0x7FFFFFFF).Zeros(9)},
-        {"plain and shared in one array", Start()
-                                              .Item(0xB1, "Arry")
-                                              .U32(2)
-                                              .Object(0)
-                                              .RootClass("RdNo")
-                                              .End()
-                                              .Object(1)
-                                              .RootClass("RdSh")
-                                              .U32Item("Numb", 1)
-                                              .End()
-                                              .End()},
+        {"plain and shared in one array", Start("B1 [Arry] 02000000 | 01 00000000 00 [RdNo] 0100 00 02 00 | 01 "
+                                                "01000000 00 [RdSh] 0100 00 02 03 [Numb] 01000000 00 | 00")},
         {"index used twice",
-         Start().Item(0xB1, "Arry").U32(2).Object(0).RootClass("RdNo").End().Object(0).KnownClass("RdNo").End().End()},
-        {"index of a shared object used inside it", Start()
-                                                        .Item(0x31, "Shar")
-                                                        .Object(0)
-                                                        .RootClass("RdSh")
-                                                        .U32Item("Numb", 1)
-                                                        .Item(0x31, "Next")
-                                                        .Object(0)
-                                                        .KnownClass("RdSh")
-                                                        .U32Item("Numb", 2)
-                                                        .End()
-                                                        .End()
-                                                        .End()},
-        {"shared object that holds itself", Start()
-                                                .Item(0x31, "Shar")
-                                                .Object(0)
-                                                .RootClass("RdSh")
-                                                .U32Item("Numb", 1)
-                                                .Item(0x31, "Next")
-                                                .BackReference(0)
-                                                .End()
-                                                .End()},
+         Start("B1 [Arry] 02000000 | 01 00000000 00 [RdNo] 0100 00 02 00 | 01 00000000 01 [RdNo] 00 | 00")},
+        {"index of a shared object used inside it",
+         Start("31 [Shar] 01 00000000 00 [RdSh] 0100 00 02 03 [Numb] 01000000 | 31 [Next] 01 00000000 01 [RdSh] 03 "
+               "[Numb] 02000000 00 | 00 00")},
+        {"shared object that holds itself",
+         Start("31 [Shar] 01 00000000 00 [RdSh] 0100 00 02 03 [Numb] 01000000 | 31 [Next] 02 00000000 | 00 00")},
         {"index unknown", Start().Item(0x31, "Objt").BackReference(3).End()},
         {"first byte of an object", Start().Item(0x31, "Objt").U8(3).Zeros(20)},
         {"first byte of a class record", Start().Item(0x31, "Objt").Object(0).U8(3).Zeros(20)},
@@ -123,36 +106,12 @@ std::vector<Case> BadStreams()
         {"object without a class", Start().Item(0x31, "Objt").Object(0).U8(2).End().End()},
         {"class never described", Start().Item(0x31, "Objt").Object(0).KnownClass("RdNo").End().End()},
         {"class described twice",
-         Start().Item(0xB1, "Arry").U32(2).Object(0).RootClass("RdNo").End().Object(1).RootClass("RdNo").End().End()},
-        {"class that is its own parent", Start()
-                                             .Item(0x31, "Objt")
-                                             .Object(0)
-                                             .U8(0)
-                                             .Code("RdNo")
-                                             .U16(1)
-                                             .End()
-                                             .KnownClass("RdNo")
-                                             .U32Item("Numb", 1)
-                                             .End()
-                                             .End()},
-        {"classes that are each other's parents through a default object", Start()
-                                                                               .Item(0x31, "Objt")
-                                                                               .Object(0)
-                                                                               .U8(0)
-                                                                               .Code("RdNo")
-                                                                               .U16(1)
-                                                                               .Item(0x31, "Dflt")
-                                                                               .Object(1)
-                                                                               .U8(0)
-                                                                               .Code("RdDv")
-                                                                               .U16(1)
-                                                                               .End()
-                                                                               .KnownClass("RdNo")
-                                                                               .End()
-                                                                               .End()
-                                                                               .U8(2)
-                                                                               .End()
-                                                                               .End()},
+         Start("B1 [Arry] 02000000 | 01 00000000 00 [RdNo] 0100 00 02 00 | 01 01000000 00 [RdNo] 0100 00 02 00 | 00")},
+        {"class that is its own parent",
+         Start("31 [Objt] 01 00000000 | 00 [RdNo] 0100 00 | 01 [RdNo] | 03 [Numb] 01000000 00 00")},
+        {"classes that are each other's parents through a default object",
+         Start("31 [Objt] 01 00000000 | 00 [RdNo] 0100 31 [Dflt] 01 01000000 | 00 [RdDv] 0100 00 01 [RdNo] | 00 00 02 "
+               "00 00")},
         {"header cut at 13 bytes", PropertyBytes().U32(0x534BFF00).U16(2).Code("Test").U16(1).U8(0)},
     };
 }

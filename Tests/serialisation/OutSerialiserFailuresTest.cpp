@@ -128,18 +128,6 @@ TEST(OutSerialiserFailures, LongListRemembersEveryTag)
     }
 }
 
-TEST(OutSerialiserFailures, AbandonedDataStreamDoesNotBlockTheList)
-{
-    std::string const list = SaveList([](OutSerialiser& out) {
-        {
-            OutSerialiserPropertyDataStream const stream(out, "Strm", 1);
-            EXPECT_TRUE(out.HaveChildActive());
-        }
-        out.SaveType("Next", u8{1});
-    });
-    EXPECT_EQ(Show(list), Show(Bytes("30 [Strm] 01 00 | 01 [Next] 01 | 00")));
-}
-
 // Whatever the number of bytes that the stream takes, the save fails with code 0 unless it takes them all, and what it
 // took is the beginning of the file.
 TEST(OutSerialiserFailures, ShortWriteAtAnyByteIsReported)

@@ -75,72 +75,68 @@ struct Item
 constexpr double c_half = 0.5;
 u8 const c_block[] = {1, 2, 3, 4, 5};
 
+std::array<Pair, 2> const c_pairs = {{{1, 2}, {3, 4}}};
+std::array<Point, 2> const c_points = {{{1}, {2}}};
+std::array<Colour, 2> const c_redAndBlue = {Colour::Red, Colour::Blue};
+
+template <class T>
+SaveFunction One(T value)
+{
+    return [=](OutSerialiser& out) { out.SaveType("Tag1", value); };
+}
+
+template <class R>
+SaveFunction Many(R values)
+{
+    return [=](OutSerialiser& out) { out.SaveTypes("Tag1", values); };
+}
+
 std::vector<Item> const& Items()
 {
     static std::vector<Item> const items = {
         {"nothing", [](OutSerialiser&) {}, ""},
-        {"u8", [](OutSerialiser& o) { o.SaveType("Tag1", u8{0xFE}); }, "01 [Tag1] FE"},
-        {"u16", [](OutSerialiser& o) { o.SaveType("Tag1", u16{0x1234}); }, "02 [Tag1] 34 12"},
-        {"u32", [](OutSerialiser& o) { o.SaveType("Tag1", u32{0x12345678}); }, "03 [Tag1] 78 56 34 12"},
-        {"u64", [](OutSerialiser& o) { o.SaveType("Tag1", u64{0x1122334455667788}); },
-         "04 [Tag1] 88 77 66 55 44 33 22 11"},
-        {"i8", [](OutSerialiser& o) { o.SaveType("Tag1", i8{-1}); }, "05 [Tag1] FF"},
-        {"i16", [](OutSerialiser& o) { o.SaveType("Tag1", i16{-2}); }, "06 [Tag1] FE FF"},
-        {"i32", [](OutSerialiser& o) { o.SaveType("Tag1", -3); }, "07 [Tag1] FD FF FF FF"},
-        {"i64", [](OutSerialiser& o) { o.SaveType("Tag1", i64{-4}); }, "08 [Tag1] FC FF FF FF FF FF FF FF"},
-        {"float", [](OutSerialiser& o) { o.SaveType("Tag1", 1.0f); }, "09 [Tag1] 00 00 80 3F"},
-        {"double", [](OutSerialiser& o) { o.SaveType("Tag1", c_half); }, "0A [Tag1] 00 00 00 00 00 00 E0 3F"},
-        {"tag", [](OutSerialiser& o) { o.SaveType("Tag1", IDTag("Item")); }, "2F [Tag1] 'metI'"},
-        {"class code", [](OutSerialiser& o) { o.SaveType("Tag1", ClassUID("Font")); }, "34 [Tag1] 'tnoF'"},
-        {"bool", [](OutSerialiser& o) { o.SaveType("Tag1", true); }, "29 [Tag1] 01"},
+        {"u8", One(u8{0xFE}), "01 [Tag1] FE"},
+        {"u16", One(u16{0x1234}), "02 [Tag1] 34 12"},
+        {"u32", One(u32{0x12345678}), "03 [Tag1] 78 56 34 12"},
+        {"u64", One(u64{0x1122334455667788}), "04 [Tag1] 88 77 66 55 44 33 22 11"},
+        {"i8", One(i8{-1}), "05 [Tag1] FF"},
+        {"i16", One(i16{-2}), "06 [Tag1] FE FF"},
+        {"i32", One(-3), "07 [Tag1] FD FF FF FF"},
+        {"i64", One(i64{-4}), "08 [Tag1] FC FF FF FF FF FF FF FF"},
+        {"float", One(1.0f), "09 [Tag1] 00 00 80 3F"},
+        {"double", One(c_half), "0A [Tag1] 00 00 00 00 00 00 E0 3F"},
+        {"tag", One(IDTag("Item")), "2F [Tag1] 'metI'"},
+        {"class code", One(ClassUID("Font")), "34 [Tag1] 'tnoF'"},
+        {"bool", One(true), "29 [Tag1] 01"},
         {"vector of floats",
          [](OutSerialiser& o) {
              float const values[] = {1, 2};
              o.SaveTypeI("Tag1", static_cast<PropType>(21), values, 8);
          },
          "15 [Tag1] 00 00 80 3F 00 00 00 40"},
-        {"u16 vector",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::vector<u16>{1, 2, 0x300});
-         },
-         "82 [Tag1] 03 00 00 00 | 01 00 02 00 00 03"},
-        {"u8 span", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::span(c_block)); },
-         "81 [Tag1] 05 00 00 00 | 01 02 03 04 05"},
-        {"i32 array", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::array<int, 1>{-1}); },
-         "87 [Tag1] 01 00 00 00 FF FF FF FF"},
-        {"no doubles", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::vector<double>()); }, "8A [Tag1] 00 00 00 00"},
-        {"class codes", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::vector<ClassUID>{"Font"}); },
-         "B4 [Tag1] 01 00 00 00 'tnoF'"},
-        {"no bools", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::vector<bool>()); }, "A9 [Tag1] 00 00 00 00"},
+        {"u16 vector", Many(std::vector<u16>{1, 2, 0x300}), "82 [Tag1] 03 00 00 00 | 01 00 02 00 00 03"},
+        {"u8 span", Many(std::span(c_block)), "81 [Tag1] 05 00 00 00 | 01 02 03 04 05"},
+        {"i32 array", Many(std::array<int, 1>{-1}), "87 [Tag1] 01 00 00 00 FF FF FF FF"},
+        {"no doubles", Many(std::vector<double>()), "8A [Tag1] 00 00 00 00"},
+        {"class codes", Many(std::vector<ClassUID>{"Font"}), "B4 [Tag1] 01 00 00 00 'tnoF'"},
+        {"no bools", Many(std::vector<bool>()), "A9 [Tag1] 00 00 00 00"},
         {"nine bools",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::vector<bool>{true, false, true, true, false, false, false, true, true});
-         },
+         Many(std::vector<bool>{true, false, true, true, false, false, false, true, true}),
          "A9 [Tag1] 09 00 00 00 | 8D 01"},
-        {"deque of bools",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::deque<bool>{false, true});
-         },
-         "A9 [Tag1] 02 00 00 00 02"},
-        {"array of bools",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::array<bool, 3>{true, true, true});
-         },
-         "A9 [Tag1] 03 00 00 00 07"},
+        {"deque of bools", Many(std::deque<bool>{false, true}), "A9 [Tag1] 02 00 00 00 02"},
+        {"array of bools", Many(std::array<bool, 3>{true, true, true}), "A9 [Tag1] 03 00 00 00 07"},
         {"enum in the first set", [](OutSerialiser& o) { o.SaveEnum("Tag1", Colours(), Colour::Green); },
          "2A [Tag1] 01 00 00 00"},
         {"enum of version 1", [](OutSerialiser& o) { o.SaveEnum("Tag1", Colours(), Colour::Blue); },
          "2A [Tag1] 02 00 01 00"},
         {"enums",
          [](OutSerialiser& o) {
-             o.SaveEnums("Tag1", Colours(), std::vector<Colour>{Colour::Red, Colour::Blue});
+             o.SaveEnums("Tag1", Colours(), c_redAndBlue);
          },
          "AA [Tag1] 02 00 00 00 | 01 00 | 00 00 02 00"},
-        {"string", [](OutSerialiser& o) { o.SaveType("Tag1", String8("ab\xC3\xA9")); },
-         "2B [Tag1] 04 00 00 00 'ab' C3 A9"},
-        {"empty string", [](OutSerialiser& o) { o.SaveType("Tag1", ""); }, "2B [Tag1] 00 00 00 00"},
-        {"UTF-16 string", [](OutSerialiser& o) { o.SaveType("Tag1", String16(u"\u00E9")); },
-         "2B [Tag1] 02 00 00 00 C3 A9"},
+        {"string", One(String8("ab\xC3\xA9")), "2B [Tag1] 04 00 00 00 'ab' C3 A9"},
+        {"empty string", One(""), "2B [Tag1] 00 00 00 00"},
+        {"UTF-16 string", One(String16(u"\u00E9")), "2B [Tag1] 02 00 00 00 C3 A9"},
         {"UTF-32 string",
          [](OutSerialiser& o) {
              unsigned int const text[] = {0x1F600, 0};
@@ -148,34 +144,21 @@ std::vector<Item> const& Items()
          },
          "2B [Tag1] 04 00 00 00 F0 9F 98 80"},
         {"strings",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::vector<String8>{"a", "", "bcd"});
-         },
+         Many(std::vector<String8>{"a", "", "bcd"}),
          "AB [Tag1] 10 00 00 00 | 03 00 00 00 | 01 00 00 00 'a' | 00 00 00 00 | 03 00 00 00 'bcd'"},
-        {"UTF-16 strings", [](OutSerialiser& o) { o.SaveTypes("Tag1", std::vector<String16>{u"\u00E9"}); },
+        {"UTF-16 strings", Many(std::vector<String16>{u"\u00E9"}),
          "AB [Tag1] 06 00 00 00 | 01 00 00 00 | 02 00 00 00 C3 A9"},
-        {"JSON", [](OutSerialiser& o) { o.SaveType("Tag1", nlohmann::json::parse("{ \"a\" : [1, true] }")); },
-         "2B [Tag1] 0E 00 00 00 '{\"a\":[1,true]}'"},
+        {"JSON", One(nlohmann::json::parse("{ \"a\" : [1, true] }")), "2B [Tag1] 0E 00 00 00 '{\"a\":[1,true]}'"},
         {"JSON array",
-         [](OutSerialiser& o) {
-             o.SaveTypes("Tag1", std::vector<nlohmann::json>{1, nullptr});
-         },
+         Many(std::vector<nlohmann::json>{1, nullptr}),
          "AB [Tag1] 0D 00 00 00 | 02 00 00 00 | 01 00 00 00 '1' | 04 00 00 00 'null'"},
-        {"struct",
-         [](OutSerialiser& o) {
-             o.SavePropertyStruct("Tag1", Pair{1, 2});
-         },
-         "2C [Tag1] 04 00 | 01 00 02 00"},
+        {"struct", [](OutSerialiser& o) { o.SavePropertyStruct("Tag1", c_pairs[0]); }, "2C [Tag1] 04 00 | 01 00 02 00"},
         {"structs",
          [](OutSerialiser& o) {
-             o.SavePropertyStructs("Tag1", std::vector<Pair>{{1, 2}, {3, 4}});
+             o.SavePropertyStructs("Tag1", c_pairs);
          },
          "AC [Tag1] 02 00 00 00 | 04 00 | 01 00 02 00 03 00 04 00"},
-        {"raw struct",
-         [](OutSerialiser& o) {
-             o.SaveRawStruct("Tag1", Pair{1, 2});
-         },
-         "38 [Tag1] 01 00 02 00"},
+        {"raw struct", [](OutSerialiser& o) { o.SaveRawStruct("Tag1", c_pairs[0]); }, "38 [Tag1] 01 00 02 00"},
         {"smallest raw struct", [](OutSerialiser& o) { o.SaveRawStruct("Tag1", u8{7}); }, "35 [Tag1] 07"},
         {"raw data", [](OutSerialiser& o) { o.SaveRawData("Tag1", c_block, 5); },
          "2D [Tag1] 05 00 00 00 | 01 02 03 04 05"},
@@ -190,13 +173,13 @@ std::vector<Item> const& Items()
          "32 [Tag1] 00"},
         {"inline classes",
          [](OutSerialiser& o) {
-             o.SaveClasses("Tag1", std::vector<Point>{{1}, {2}});
+             o.SaveClasses("Tag1", c_points);
          },
          "B2 [Tag1] 02 00 00 00 [Poin] 03 00 | 01 01 [XXXX] 01 00 | 01 01 [XXXX] 02 00"},
         {"classes with a null",
          [](OutSerialiser& o) {
-             Point const point{1};
-             o.SaveClasses("Tag1", std::vector<Point const*>{nullptr, &point});
+             Point const* const points[] = {nullptr, &c_points[0]};
+             o.SaveClasses("Tag1", points);
          },
          "B2 [Tag1] 02 00 00 00 [Poin] 03 00 | 00 | 01 01 [XXXX] 01 00"},
         {"null object", [](OutSerialiser& o) { o.SaveObject("Tag1", nullptr); }, "31 [Tag1] 00"},
@@ -217,14 +200,6 @@ TEST(OutSerialiserItems, EveryFormIsWrittenAsTheTableSays)
         SCOPED_TRACE(item.what);
         EXPECT_EQ(Show(SaveList(item.save)), Show(Bytes(item.expected) + '\0'));
     }
-}
-
-TEST(OutSerialiserItems, FileBeginsWithItsHeader)
-{
-    auto const stream = MakeCounted<BytesOutStream>();
-    OutSerialiserFile out(*stream, IDTag("Test"), 0x0107);
-    out.Close();
-    EXPECT_EQ(Show(stream->m_bytes), Show(Bytes("00 FF 4B 53 | 02 00 | [Test] | 07 01 | 18 00 00 00 | 00")));
 }
 
 TEST(OutSerialiserItems, FragmentedDataIsWrittenWithItsBlockSize)
@@ -322,9 +297,11 @@ TEST(OutSerialiserItems, DataStreamHoldsUntaggedValuesInOrder)
             stream.AppendI("y", 1);
             stream.StartNewValueCustomPackI(1, 1);
             stream.AppendI("z", 1);
+            EXPECT_TRUE(out.HaveChildActive());
             stream.Close();
             stream.Close();
         }
+        OutSerialiserPropertyDataStream(out, "Aban", 1); // Not closed, which does not block the list.
         out.SaveType("Next", u8{1});
     });
     EXPECT_EQ(Show(list),
@@ -333,7 +310,7 @@ TEST(OutSerialiserItems, DataStreamHoldsUntaggedValuesInOrder)
                          "| AB 0B 00 00 00 02 00 00 00 01 00 00 00 'a' 02 00 00 00 'bc' | 2C 04 00 01 00 02 00"
                          "| AC 01 00 00 00 04 00 03 00 04 00 | 2D 01 00 00 00 AB | 2A 02 00 01 00"
                          "| AA 01 00 00 00 00 00 00 00 | 37 'abc' | 81 02 00 00 00 'xy' | AC 01 00 00 00 01 00 'z' | 00"
-                         "| 01 [Next] 01 | 00")));
+                         "| 30 [Aban] 01 00 | 01 [Next] 01 | 00")));
 }
 
 TEST(OutSerialiserItems, StrategiesAndPathAreInherited)

@@ -61,6 +61,7 @@ bool ReaderNode::Load(InSerialiser const& in, FileStore&, unsigned short v)
 {
     version = v;
     in.LoadType("Numb", number);
+    numberIsDefault = !in.HasProperty("Numb") && in.HasPropertyOrDefault("Numb");
     in.LoadType("Name", name);
     in.LoadObject("Chld", child);
     in.LoadObject("Refr", reference, false);

@@ -35,6 +35,7 @@ public:
     std::vector<Counted<ReaderNode>> kids;
     Consolidated<SharedSerialisable> shared;
     unsigned short version = 0;
+    bool numberIsDefault = false; // The list itself has no Numb.
     bool isLoaded = false;
     bool sawUnloaded = false; // What it refers to was not loaded yet.
     bool tookWrongClass = false;

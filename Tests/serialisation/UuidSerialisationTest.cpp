@@ -11,11 +11,7 @@ TEST(UuidSerialisationTest, IdentifierIsOneRawStructOfItsBytes)
 {
     Uuid const id("00112233-4455-6677-8899-AABBCCDDEEFF");
     auto const save = [&](OutSerialiser& out) { id.Save(out, IDTag("Iden")); };
-    EXPECT_EQ(Show(SaveList(save)), Show(SaveList([](OutSerialiser& out) {
-                  u8 const bytes[16] = {0x33, 0x22, 0x11, 0x00, 0x55, 0x44, 0x77, 0x66,
-                                        0x88, 0x99, 0xAA, 0xBB, 0xCC, 0xDD, 0xEE, 0xFF};
-                  out.SaveRawStruct(IDTag("Iden"), bytes);
-              })));
+    EXPECT_EQ(Show(SaveList(save)), Show(Bytes("44 [Iden] 33221100 5544 7766 8899AABBCCDDEEFF | 00")));
 
     auto const stream = MakeCounted<BytesOutStream>();
     {
