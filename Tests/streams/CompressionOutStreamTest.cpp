@@ -163,7 +163,7 @@ TEST_P(CompressionOutStreamTest, StripingNeedsAPredictor)
 
 TEST_P(CompressionOutStreamTest, ManyThreadsShareThePools)
 {
-    auto const work = [this](u32 seed) {
+    auto const work = [](u32 seed) {
         for (u32 i = 0; i < 20; ++i) {
             Bytes const plain = Testing::MakePixels(1000 + 70000 * (i % 3), seed + i);
             Counted<ByteSink> sink = MakeCounted<ByteSink>();
