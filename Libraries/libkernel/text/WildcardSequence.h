@@ -46,8 +46,8 @@ public:
 
     std::vector<Item> const& GetItems() const { return m_items; }
 
-    /// The text that parses to these items. Delimiters within literals are left out, since nothing could stand for
-    /// them. Empty for a delimiter that has no UTF-8 form.
+    /// The text, if it is UTF-8, that parses to these items. Delimiters within literals are left out, since nothing
+    /// could stand for them. Empty for a delimiter that has no UTF-8 form.
     String8 Reform(unsigned int delimiter) const { return Reform(m_items, delimiter); }
     static String8 Reform(std::vector<Item> const& items, unsigned int delimiter);
 
