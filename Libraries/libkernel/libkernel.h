@@ -110,6 +110,7 @@
 #include "libkernel/serialisation/OutSerialiserFile.h"
 #include "libkernel/serialisation/OutSerialiserObjectList.h"
 #include "libkernel/serialisation/OutSerialiserPropertyDataStream.h"
+#include "libkernel/serialisation/OutSerialiserStep.h"
 #include "libkernel/serialisation/OutSerialiserTarget.h"
 #include "libkernel/serialisation/PropType.h"
 #include "libkernel/serialisation/PropertyStreamDump.h"
