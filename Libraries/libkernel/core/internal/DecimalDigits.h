@@ -6,8 +6,6 @@
 #include <algorithm>
 #include <array>
 #include <bit>
-#include <cstring>
-#include <type_traits>
 
 namespace Kernel::NumberTextDetail {
 
@@ -84,11 +82,7 @@ inline char SignOf(bool negative, SignStyle style)
 template <class Unit>
 Unit* CopyAscii(Unit* to, char const* begin, char const* end)
 {
-    if constexpr (std::is_same_v<Unit, char>) {
-        std::memcpy(to, begin, static_cast<size_t>(end - begin));
-        return to + (end - begin);
-    } else
-        return std::copy(begin, end, to);
+    return std::copy(begin, end, to);
 }
 
 } // namespace Kernel::NumberTextDetail
