@@ -10,7 +10,7 @@ foreach(header IN LISTS kernel_headers)
     install(FILES "Libraries/${header}" DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}/${folder}")
 endforeach()
 if(EXISTS "${PROJECT_SOURCE_DIR}/Resources")
-    install(DIRECTORY Resources/ DESTINATION "${CMAKE_INSTALL_DATADIR}/libkernel" PATTERN "*.py" EXCLUDE)
+    install(DIRECTORY Resources/ DESTINATION "${CMAKE_INSTALL_DATADIR}/libkernel" PATTERN "*.py" EXCLUDE PATTERN "README.md" EXCLUDE PATTERN "__pycache__" EXCLUDE)
 endif()
 
 install(TARGETS libkernel EXPORT libkernel

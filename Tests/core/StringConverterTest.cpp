@@ -1,0 +1,149 @@
+#include "libkernel/core/StringConverter.h"
+
+#include "libkernel/core/ConvertEnc.h"
+#include "support/TempFolder.h"
+
+#include <cstring>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+using namespace Kernel;
+using namespace std::string_literals;
+
+namespace {
+
+String8 Text(std::string const& text)
+{
+    return String8(std::string_view(text));
+}
+
+TEST(StringConverter, EveryRoadGivesTheSameText)
+{
+    struct
+    {
+        char const* charset;
+        std::string bytes;
+        char const* text;
+    } const cases[] = {
+        {"UTF-8", "a\u20AC", "a\u20AC"},
+        {"windows-1252", "a\x80", "a\u20AC"},
+        {"Shift_JIS", "\x82\xA0", "\u3042"},
+        {"ISO-2022-JP", "\x1B$B$\"\x1B(B", "\u3042"},
+        {"gb18030", "\x94\x39\xFC\x36", "\U0001F600"},
+        {"UTF-8", "", ""},
+        {"windows-1252", "", ""},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.charset);
+        EXPECT_EQ(StringConverter(c.charset).Convert(c.bytes.c_str()), c.text);
+        EXPECT_EQ(EncodedToUtf8(c.bytes.c_str(), c.charset), c.text);
+        EXPECT_EQ(EncodedToUtf16(c.bytes.c_str(), c.charset), ConvertedTo<TEncUtf16>(String8(c.text)));
+        EXPECT_STREQ(Utf8ToEncoded(c.text, c.charset).get(), c.bytes.c_str());
+    }
+    auto const wide = Utf8ToEncoded("a", "UTF-32BE");
+    EXPECT_EQ(std::string(wide.get(), 8), "\0\0\0a\0\0\0\0"s);
+}
+
+TEST(StringConverter, OneConverterServesManyTexts)
+{
+    StringConverter converter("ISO-2022-JP");
+    EXPECT_EQ(converter.Convert("\x1B$B$\""), "\u3042"); // Left in the Japanese set.
+    EXPECT_EQ(converter.Convert("a"), "a");
+}
+
+TEST(StringConverter, UnknownCharsetsAndCutTextsHaveTheirAnswers)
+{
+    EXPECT_EQ(StringConverter("no such").Convert("a\u20AC"), "a\u20AC");
+    EXPECT_TRUE(EncodedToUtf8("a", "no such").IsEmpty());
+    EXPECT_TRUE(EncodedToUtf16("a", "no such").IsEmpty());
+    EXPECT_FALSE(Utf8ToEncoded("a", "no such"));
+    for (char const* cut : {"a\xF0", "a\xE2\x82", "a\xC3", "a\x80"}) {
+        EXPECT_EQ(StringConverter("UTF-8").Convert(cut), "a");
+        EXPECT_EQ(EncodedToUtf8(cut, "UTF-8"), "a");
+        EXPECT_EQ(EncodedToUtf16(cut, "UTF-8").GetLength(), 1);
+        EXPECT_STREQ(Utf8ToEncoded(cut, "windows-1252").get(), "a");
+    }
+}
+
+TEST(StringConverter, EachByteKnowsItsUnit)
+{
+    struct
+    {
+        char const* charset;
+        char const* text;
+        std::string bytes;
+        std::vector<int> sources;
+    } const cases[] = {
+        {"windows-1252",
+         "a\u20ACb",
+         "a\x80"
+         "b",
+         {0, 1, 2}},
+        {"Shift_JIS",
+         "a\u3042b",
+         "a\x82\xA0"
+         "b",
+         {0, 1, 1, 2}},
+        {"UTF-8", "\U0001F600b", "\U0001F600b", {0, 0, 0, 0, 2}},
+        {"windows-1252", "", "", {}},
+    };
+    std::vector<char> bytes{'x'};
+    std::vector<int> sources{1};
+    for (auto const& c : cases) {
+        EXPECT_TRUE(Utf16ToEncoded(bytes, sources, ConvertedTo<TEncUtf16>(String8(c.text)), c.charset));
+        EXPECT_EQ(std::string(bytes.begin(), bytes.end()), c.bytes);
+        EXPECT_EQ(sources, c.sources);
+    }
+    EXPECT_FALSE(Utf16ToEncoded(bytes, sources, String16(u"a"), "no such"));
+    EXPECT_TRUE(bytes.empty() && sources.empty());
+}
+
+TEST(StringConverter, CharsetIsGuessedFromFilesAndBytes)
+{
+    TestSupport::TempFolder const folder;
+    std::string const french =
+        "Voil\xE0 l'\xE9t\xE9 qui s'en va, et d\xE9j\xE0 la for\xEAt a des couleurs plus \xE2pres.";
+    struct
+    {
+        std::string bytes;
+        char const* charset;
+    } const cases[] = {{french, "ISO-8859-1"}, {"\u3042\u3044\u3046 \u4E00\u4E8C", "UTF-8"}, {"", ""}};
+    for (auto const& c : cases) {
+        TestSupport::WriteWholeFile(folder / "text", c.bytes);
+        EXPECT_EQ(IcuCharsetDetect(Text(folder / "text")), c.charset);
+        std::unique_ptr<char[]> copy(new char[c.bytes.size()]);
+        if (!c.bytes.empty()) std::memcpy(copy.get(), c.bytes.data(), c.bytes.size());
+        EXPECT_EQ(IcuCharsetDetect(std::move(copy), static_cast<i64>(c.bytes.size())), c.charset);
+    }
+    EXPECT_TRUE(IcuCharsetDetect(nullptr, 5).IsEmpty());
+    EXPECT_TRUE(IcuCharsetDetect("/dev/zero").IsEmpty());
+}
+
+TEST(StringConverter, TextFilesComeWithPlainLineEnds)
+{
+    TestSupport::TempFolder const folder;
+    // The compressed scheme reads two units from each byte here, beyond the room that its shortest character gives.
+    std::string const dense = "\x0B\x07\xEC" + std::string(100, '\x80');
+    struct
+    {
+        std::string bytes;
+        char const* charset;
+        char const* text;
+    } const cases[] = {
+        {"a\x80\r\nb\r", "windows-1252", "a\u20AC\nb\n"},
+        {"a\0\x0D\0\x0A\0"s, "UTF-16LE", "a\n"},
+        {"a", "no such", ""},
+        {"", "windows-1252", ""},
+        {dense, "SCSU", ""},
+    };
+    for (auto const& c : cases) {
+        TestSupport::WriteWholeFile(folder / "text", c.bytes);
+        EXPECT_EQ(IcuLoadTextFile(Text(folder / "text"), c.charset), c.text) << c.charset;
+    }
+    EXPECT_FALSE(EncodedToUtf8(dense.c_str(), "SCSU").IsEmpty());
+    ASSERT_EQ(mkfifo((folder / "fifo").c_str(), 0600), 0);
+    for (std::string const& path : {folder / "fifo", folder.GetPath(), folder / "none"})
+        EXPECT_TRUE(IcuLoadTextFile(Text(path), "windows-1252").IsEmpty()) << path;
+}
+
+} // namespace
