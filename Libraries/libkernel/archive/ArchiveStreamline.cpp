@@ -7,6 +7,7 @@
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/streams/FileIOException.h"
 
+#include <exception>
 #include <new>
 
 // Streamlining in place: what surrounds the writing and the replacing of the file. Holds the session lock throughout,
@@ -167,9 +168,13 @@ Result ArchiveStreamliner::StreamlineFrame(Request const& request, bool& suspend
     }
     m_request = &request;
     Result result = Archive::StreamlineFailed;
+    std::exception_ptr failure;
     try {
         result = StreamlineInner(suspended);
     } catch (std::bad_alloc const&) {
+    } catch (...) {
+        // The host's own, out of its progress object.
+        failure = std::current_exception();
     }
     m_newFile = nullptr;
     bool const masterOpen = m_master && m_master->GetStream();
@@ -190,6 +195,7 @@ Result ArchiveStreamliner::StreamlineFrame(Request const& request, bool& suspend
     m_master = nullptr;
     m_impl.CloseFilesIfUnused();
     m_impl.m_doingStreamline.store(false);
+    if (failure) std::rethrow_exception(failure);
     return result;
 }
 

@@ -6,7 +6,8 @@
 namespace Kernel {
 
 /// Told how Archive::Streamline goes. Calls come on its thread, with the archive's session lock held: the host must not
-/// save, streamline or load from the archive in them.
+/// save, streamline or load from the archive in them. An exception ends the writing and passes on to the caller, with
+/// everything as it was; once the master is being written over it makes that fail.
 class KERNEL_API ArchiveStreamlineProgress : public Countable
 {
 public:

@@ -68,6 +68,9 @@ std::pair<bool, bool> ArchiveStreamliner::StreamlineOverwriteOriginalFile(String
             final = noSpace || e.GetReason() == Reason::FileHandleLost || e.GetReason() == Reason::SocketNotConnected ||
                     e.GetReason() == Reason::NotAllowed;
         } catch (OutStream::WriteException const&) {
+        } catch (...) {
+            // The host's own, out of its progress object; the master is half written over by then.
+            final = true;
         }
     }
     if (!done) {

@@ -94,7 +94,14 @@ Result ArchiveStreamliner::WriteCompactFile(String8 const& tempPath)
     options.abort = m_request->abort;
     options.progress = m_request->progress.Get();
     FileInOutStream& stream = *m_newFile->m_stream;
-    Result result = ArchiveCompactWriter::StreamlineToArchiveFileI(m_impl, *m_newFile, stream, options, m_data);
+    Result result = Archive::StreamlineFailed;
+    try {
+        result = ArchiveCompactWriter::StreamlineToArchiveFileI(m_impl, *m_newFile, stream, options, m_data);
+    } catch (...) {
+        m_newFile->m_stream = nullptr;
+        FileSystem::Delete(tempPath, 0);
+        throw;
+    }
     // What replaces a document is whole on the device, with its name, before anything happens to the document.
     if (result == Archive::StreamlineDone && !(FlushArchiveFile(stream) && FlushFolderOf(tempPath)))
         result = Archive::StreamlineNoAccess;

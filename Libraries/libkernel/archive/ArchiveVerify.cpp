@@ -2,6 +2,7 @@
 #include "libkernel/archive/internal/ArchiveVerifier.h"
 #include "libkernel/core/Endian.h"
 #include "libkernel/core/Format.h"
+#include "libkernel/core/Trace.h"
 #include "libkernel/streams/FileIOException.h"
 
 #include <algorithm>
@@ -418,6 +419,7 @@ Result ArchiveVerifier::VerifyFileState(ArchiveImpl& impl, String8& report)
         ArchiveComparison comparison;
         CompareFileState(impl, comparison);
         if (!comparison.HasDifference()) return Archive::VerifyMatch;
+        Trace(comparison.GetMessage());
         ShuntDeadFiles(impl, comparison.GetMessage(), report);
         return Archive::VerifyMismatch;
     } catch (FileIOException const&) {
@@ -464,6 +466,7 @@ Result ArchiveVerifier::VerifyStreamlinedFileState(ArchiveImpl& impl, Archive::A
         ArchiveComparison comparison;
         CompareStreamlined(impl, file, data, comparison);
         if (!comparison.HasDifference()) return Archive::VerifyMatch;
+        Trace(comparison.GetMessage());
         ShuntDeadStreamlineFiles(impl, path, comparison.GetMessage(), report);
         return Archive::VerifyMismatch;
     } catch (FileIOException const&) {

@@ -1,0 +1,569 @@
+#include "libkernel/archive/ArchiveStreamline.h"
+#include "libkernel/archive/ArchiveThumbnails.h"
+#include "libkernel/filestore/FileStorePostSaveInterface.h"
+#include "libkernel/filesystem/TempFile.h"
+#include "support/ArchiveBuilder.h"
+#include "support/ArchiveFixture.h"
+#include "support/FakeClock.h"
+#include "support/FaultyFiles.h"
+#include "support/TempFolder.h"
+#include "support/TraceCapture.h"
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <gtest/gtest.h>
+#include <regex>
+
+// Each check of a save or a streamline is shown by a file in which the one field that it is about was changed behind
+// the archive's back, between the writing and the check.
+
+namespace KernelTest {
+namespace {
+
+using namespace Kernel;
+using Bytes = std::string;
+
+u64 Read(Bytes const& bytes, u64 at, int size)
+{
+    u64 value = 0;
+    for (int i = size; i-- > 0;) value = value << 8 | static_cast<u8>(bytes[at + static_cast<u64>(i)]);
+    return value;
+}
+
+void Put(Bytes& bytes, u64 at, u64 value, int size)
+{
+    bytes.replace(at, static_cast<size_t>(size), TestSupport::Little(value, size));
+}
+
+void Raise(Bytes& bytes, u64 at, int size)
+{
+    Put(bytes, at, Read(bytes, at, size) + 1, size);
+}
+
+/// A table in the bytes of a file, by the layout alone.
+class TableView
+{
+public:
+    TableView(Bytes& bytes, u64 at) : m_bytes(bytes), m_at(at) {}
+
+    /// The @p n-th from the newest.
+    static TableView FromNewest(Bytes& bytes, int n)
+    {
+        u64 at = Read(bytes, 16, 8);
+        while (n-- > 0) at = Read(bytes, at + 4, 8);
+        return TableView(bytes, at);
+    }
+    u64 GetPosition() const { return m_at; }
+    u64 GetRecordCount() const { return Read(m_bytes, m_at + 44, 4); }
+    /// Behind the last one: the first path count.
+    u64 GetRecord(u64 index) const
+    {
+        u64 at = m_at + 59;
+        while (index-- > 0) at += SizeAt(at);
+        return at;
+    }
+    u64 FindRecord(u32 uid) const
+    {
+        u64 at = m_at + 59;
+        while (Read(m_bytes, at, 4) != uid) at += SizeAt(at);
+        return at;
+    }
+    u64 GetPathCount() const { return GetRecord(GetRecordCount()); }
+    /// Leaves out what lies last before the user data: the size stays the same, so that the table stays whole.
+    void GiveToUserData(u64 countField, int countSize, u64 size)
+    {
+        Put(m_bytes, m_at + countField, Read(m_bytes, m_at + countField, countSize) - 1, countSize);
+        Put(m_bytes, m_at + 48, Read(m_bytes, m_at + 48, 4) + size, 4);
+    }
+
+private:
+    u64 SizeAt(u64 at) const
+    {
+        switch (m_bytes[at + 4]) {
+        case 0: return 44 + Read(m_bytes, at + 42, 2);
+        case 1: return 42;
+        default: return 5;
+        }
+    }
+
+    Bytes& m_bytes;
+    u64 const m_at;
+};
+
+class Spoiler : public FileStorePostSaveInterface
+{
+public:
+    explicit Spoiler(std::function<void()> f) : m_spoil(std::move(f)) {}
+    void PostSave() override { m_spoil(); }
+
+private:
+    std::function<void()> const m_spoil;
+};
+
+constexpr u32 c_uidA = 1, c_uidB = 2, c_uidTilde = 4, c_uidGap = 7;
+
+class ArchiveVerifyTest : public testing::Test
+{
+protected:
+    ArchiveVerifyTest()
+    {
+        std::filesystem::create_directory(m_shunt);
+        Archive::SetShuntPath(Str(m_shunt));
+    }
+    ~ArchiveVerifyTest() override { Archive::SetShuntPath(String8()); }
+
+    /// Where a link would lie, the bytes of the first item make an empty one.
+    static std::string FirstItem() { return std::string("12345678\0\0 and so on", 20); }
+
+    static void CountUp(Archive& archive, Changes const& changes)
+    {
+        ArchiveSessionHandle handle;
+        ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        for (auto const& [path, bytes] : changes) handle->CreateFile(Str(path), MakeCounted<BytesItem>(*bytes));
+        auto const item = MakeCounted<BytesItem>("generated");
+        String8 path;
+        ASSERT_TRUE(handle->GenerateIndexedPath({String8("p/"), String8(".s")}, item.Get(), nullptr, path));
+        handle->CreateFile(path, item);
+        archive.CloseSession(handle, false);
+    }
+    /// A history in which every field that a check looks at can be changed by itself.
+    void MakeHistory(Archive& archive)
+    {
+        CountUp(archive, {{"a", FirstItem()}, {"b", "1"}, {"z", "1"}, {"~", "1"}}); // p/1.s is 5.
+        {
+            ArchiveSessionHandle handle;
+            ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
+            handle->CreateFile(Str("b"), MakeCounted<BytesItem>("22"));
+            handle->CreateFile(Str("c"), MakeCounted<BytesItem>("1"));       // 6.
+            handle->CreateFile(Str("unsaved"), MakeCounted<BytesItem>("1")); // 7, and nobody has it in the end.
+            handle->DeleteFile(Str("unsaved"));
+            handle->DeleteFile(Str("z"));
+            archive.CloseSession(handle, false);
+        }
+        ASSERT_TRUE(Save(archive, {{"c", "33"}, {"~", std::nullopt}}));
+        CountUp(archive, {{"b", "444"}}); // p/2.s is 8.
+        ASSERT_TRUE(Save(archive, {{"~", "5"}}));
+        ASSERT_TRUE(Save(archive, {{"z", "6"}, {"b", "66"}}));
+        ASSERT_TRUE(Save(archive, {{"b", "7"}, {"p/2.s", std::nullopt}}));
+    }
+    // From the newest, with the save that is checked: 0 that save; 1 b and the deletion of p/2.s; 2 b and z again;
+    // 3 "~" again; 4 b, p/2.s and the count; 5 c and the deletion of "~"; 6 b, c and the deletion of z; 7 the first.
+
+    Archive::VerifyResult SaveAndSpoil(Archive& archive, bool scratch, std::string const& path,
+                                       std::function<void(Bytes&)> const& spoil)
+    {
+        ArchiveSessionHandle handle;
+        EXPECT_TRUE(scratch ? archive.CreateScratchSession(handle, Archive::SessionTypeFull, nullptr)
+                            : archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        handle->CreateFile(Str("a"), MakeCounted<BytesItem>(FirstItem() + "!"));
+        auto const thumbnails = MakeCounted<ArchiveThumbnails>();
+        thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, MakeCounted<RawData>(3));
+        if (scratch) handle->SetThumbnails(thumbnails);
+        handle->AddPostSaveObject(MakeCounted<Spoiler>([&] { SpoilFile(path, spoil); }));
+        return archive.CloseSessionAndVerifyFileState(handle, m_report, false);
+    }
+    static void SpoilFile(std::string const& path, std::function<void(Bytes&)> const& spoil)
+    {
+        Bytes bytes = ReadWhole(path);
+        spoil(bytes);
+        WriteWhole(path, bytes);
+    }
+    std::string Log() const { return ReadWhole(m_shunt + "/" + m_report.GetData() + "-log.txt"); }
+    /// The number of the check that failed, as the log has it.
+    int Code() const
+    {
+        std::smatch match;
+        std::string const log = Log();
+        return std::regex_search(log, match, std::regex("E(\\d\\d\\d): ")) ? std::stoi(match[1]) : 0;
+    }
+    void Clear()
+    {
+        for (auto const& entry : std::filesystem::directory_iterator(m_shunt)) std::filesystem::remove(entry.path());
+        m_report = String8();
+    }
+
+    TestSupport::TempFolder m_folder;
+    std::string const m_path = m_folder / "doc";
+    std::string const m_scratchPath = m_folder / "doc.scratch";
+    std::string const m_shunt = m_folder / "shunt";
+    String8 m_report;
+};
+
+struct SpoiledField
+{
+    int code;
+    std::function<void(Bytes&)> spoil;
+};
+
+/// Changes of the info block and header, which both tables share: the check that each sets off, from @p first on.
+std::vector<SpoiledField> FileFields(int first)
+{
+    return {
+        {first + 1, [](Bytes& b) { b += '\0', Raise(b, 24, 8); }}, // FileEnd.
+        {first + 2, [](Bytes& b) { Raise(b, 32, 8); }},
+        {first + 3, [](Bytes& b) { Raise(b, 40, 8); }},
+        {first + 4, [](Bytes& b) { Raise(b, 48, 8); }},
+        {first + 6, [](Bytes& b) { Raise(b, 56, 4); }},
+        {first + 7, [](Bytes& b) { Raise(b, 68, 4); }},
+        {first + 8, [](Bytes& b) { b[4] = 10; }},
+    };
+}
+
+/// Changes of the details of record @p uid in the n-th table from the newest.
+std::vector<SpoiledField> DetailFields(int first, int table, u32 uid)
+{
+    struct Field
+    {
+        int check;
+        u64 offset;
+        int size;
+    };
+    std::vector<SpoiledField> result;
+    for (Field const& field : {Field{0, 5, 8}, {1, 13, 8}, {2, 21, 8}, {3, 29, 4}, {4, 33, 1}, {6, 38, 4}})
+        result.push_back({first + field.check, [=](Bytes& b) {
+                              Raise(b, TableView::FromNewest(b, table).FindRecord(uid) + field.offset, field.size);
+                          }});
+    return result;
+}
+
+void Append(std::vector<SpoiledField>& to, std::vector<SpoiledField> const& more)
+{
+    to.insert(to.end(), more.begin(), more.end());
+}
+
+TEST_F(ArchiveVerifyTest, EachFieldOfTheMasterThatDiffersIsNamed)
+{
+    MakeHistory(*CreateDocument(m_path));
+    Bytes const original = ReadWhole(m_path);
+    auto const view = [](Bytes& b, int n) { return TableView::FromNewest(b, n); };
+    std::vector<SpoiledField> cases = {
+        {0, [](Bytes&) {}},
+        {4, [](Bytes& b) { b[0] = 'x'; }},
+        {5, [](Bytes& b) { b[6] |= 1; }},
+        {6, [](Bytes& b) { Raise(b, 60, 4); }},
+        {16, [&](Bytes& b) { Put(b, 16, view(b, 1).GetPosition(), 8); }},
+        {25,
+         [&](Bytes& b) {
+             for (int n : {3, 7}) b[view(b, n).FindRecord(c_uidTilde) + 44] = 'z';
+         }},
+        {26,
+         [&](Bytes& b) {
+             u64 const record = view(b, 3).FindRecord(c_uidTilde);
+             Put(b, record, c_uidGap, 4);
+             b[record + 44] = '\x7F';
+         }},
+        {27, [&](Bytes& b) { b[view(b, 6).FindRecord(6) + 44] = 'd'; }},
+        {28, [&](Bytes& b) { Put(b, view(b, 7).FindRecord(c_uidB), c_uidGap, 4); }},
+        {29,
+         [&](Bytes& b) {
+             for (int n : {4, 7}) view(b, n).GiveToUserData(56, 2, 16);
+         }},
+        {30, [&](Bytes& b) { b[view(b, 7).GetPathCount() + 12] = 'q'; }},
+        {31, [&](Bytes& b) { b[view(b, 4).GetPosition() + 58] = 1; }},
+        {32,
+         [&](Bytes& b) {
+             for (int n : {4, 7}) b[view(b, n).GetPathCount() + 12] = 'q';
+         }},
+        {33, [&](Bytes& b) { Raise(b, view(b, 4).GetPathCount() + 4, 8); }},
+        {34, [&](Bytes& b) { Put(b, view(b, 2).GetPosition() + 4, view(b, 4).GetPosition(), 8); }},
+        {38, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 12, 8); }},
+        {39, [&](Bytes& b) { b[view(b, 6).GetPosition() + 58] = 2; }},
+        {42, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 28, 8); }},
+        {43, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 36, 8); }},
+        {44, [&](Bytes& b) { view(b, 1).GiveToUserData(44, 4, 5); }},
+        {46, [&](Bytes& b) { Put(b, view(b, 2).FindRecord(c_uidB), c_uidA, 4); }},
+        // Known by its path from an earlier revision, and the only record of its own.
+        {52,
+         [&](Bytes& b) {
+             b[view(b, 3).FindRecord(c_uidTilde) + 4] = 1;
+             Put(b, view(b, 3).GetPosition() + 48, 3, 4);
+         }},
+    };
+    Append(cases, FileFields(16));
+    Append(cases, DetailFields(47, 2, c_uidB));
+    for (SpoiledField const& c : cases) {
+        SCOPED_TRACE(c.code);
+        WriteWhole(m_path, original);
+        Counted<Archive> const archive = OpenDocument(m_path);
+        Archive::VerifyResult const result = SaveAndSpoil(*archive, false, m_path, c.spoil);
+        EXPECT_EQ(result, c.code == 0 ? Archive::VerifyMatch : Archive::VerifyMismatch);
+        EXPECT_EQ(Code(), c.code) << Log();
+        Clear();
+    }
+}
+
+TEST_F(ArchiveVerifyTest, EachFieldOfTheScratchFileThatDiffersIsNamed)
+{
+    {
+        Counted<Archive> const archive = CreateDocument(m_path);
+        ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+        Archive::CreateResult created;
+        ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), created));
+        ASSERT_TRUE(Save(*archive, {{"a", "2"}}, true));
+    }
+    Bytes const master = ReadWhole(m_path);
+    Bytes const scratch = ReadWhole(m_scratchPath);
+    std::vector<SpoiledField> cases = {
+        {0, [](Bytes&) {}},
+        {1, [](Bytes& b) { b[12] = 'x'; }},
+        {2, [](Bytes& b) { b[86] ^= 1; }},
+        {7, [](Bytes& b) { Put(b, 16, TableView::FromNewest(b, 1).GetPosition(), 8); }},
+        {12, [](Bytes& b) { b[b.find("Thmb")] = 'x'; }},
+    };
+    Append(cases, FileFields(7));
+    for (SpoiledField const& c : cases) {
+        // A later FileEnd hides the thumbnails, but is found first.
+        SCOPED_TRACE(c.code);
+        WriteWhole(m_path, master);
+        WriteWhole(m_scratchPath, scratch);
+        Counted<Archive> const archive = OpenDocument(m_scratchPath);
+        SaveAndSpoil(*archive, true, m_scratchPath, c.spoil);
+        EXPECT_EQ(Code(), c.code) << Log();
+        Clear();
+    }
+    // A document that has no master has no link either.
+    std::string const alone = m_folder / "alone";
+    Archive::CreateResult created;
+    Counted<Archive> const archive = Archive::CreateAsScratch(Str(alone), c_documentTag, nullptr, created);
+    ASSERT_TRUE(Save(*archive, {{"a", FirstItem()}}, true));
+    EXPECT_EQ(SaveAndSpoil(*archive, true, alone, [](Bytes&) {}), Archive::VerifyMatch);
+    EXPECT_EQ(SaveAndSpoil(*archive, true, alone, [](Bytes& b) { b[6] |= 1; }), Archive::VerifyMismatch);
+    EXPECT_EQ(Code(), 3);
+}
+
+TEST_F(ArchiveVerifyTest, EachFieldOfAStreamlinedFileThatDiffersIsNamedAndTheMasterStays)
+{
+    std::filesystem::create_directory(m_folder / "temporaries");
+    std::vector<String8> rescued;
+    TempFile::SetTempPath(Str(m_folder / "temporaries"), Str(m_folder / "temporaries"), rescued);
+    MakeHistory(*CreateDocument(m_path));
+    Bytes const original = ReadWhole(m_path);
+    auto const table = [](Bytes& b) { return TableView::FromNewest(b, 0); };
+    std::vector<SpoiledField> cases = {
+        {101, [](Bytes& b) { b[0] = 'x'; }},
+        {102, [](Bytes& b) { b[6] |= 1; }},
+        {103, [](Bytes& b) { Raise(b, 60, 4); }},
+        {104, [](Bytes& b) { Put(b, 16, 0, 8); }},
+        {113, [&](Bytes& b) { b[table(b).FindRecord(c_uidTilde) + 44] = 'a'; }},
+        {115, [&](Bytes& b) { b[table(b).FindRecord(c_uidB) + 44] = 'B'; }},
+        {116, [&](Bytes& b) { Put(b, table(b).FindRecord(c_uidB), c_uidGap, 4); }},
+        {117, [&](Bytes& b) { table(b).GiveToUserData(56, 2, 16); }},
+        {119, [&](Bytes& b) { b[table(b).GetPosition() + 58] = 1; }},
+        {120, [&](Bytes& b) { b[table(b).GetPathCount() + 12] = 'q'; }},
+        {121, [&](Bytes& b) { Raise(b, table(b).GetPathCount() + 4, 8); }},
+        {126, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 12, 8); }},
+        {127, [&](Bytes& b) { b[table(b).GetPosition() + 58] = 0; }},
+        {130, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 28, 8); }},
+        {131, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 36, 8); }},
+    };
+    Append(cases, FileFields(104));
+    Append(cases, DetailFields(135, 0, c_uidB));
+    for (SpoiledField const& c : cases) {
+        for (bool overwrite : {false, true}) {
+            SCOPED_TRACE(testing::Message() << c.code << (overwrite ? " overwriting" : " renaming"));
+            WriteWhole(m_path, original);
+            Counted<Archive> const archive = OpenDocument(m_path);
+            archive->SetAlwaysStreamlineOverwrite(overwrite);
+            TestSupport::FaultyFiles files;
+            bool done = false;
+            files.SetObserver([&](TestSupport::FileCall call, std::string const& path) {
+                bool const temporary = path.find("~tmp") != path.npos || path.find("/temporaries/") != path.npos;
+                if (call != TestSupport::FileCall::Flush || !temporary || done) return;
+                done = true;
+                SpoilFile(path, c.spoil);
+            });
+            EXPECT_EQ(archive->StreamlineAndVerifyFileState(m_report, nullptr, nullptr, nullptr),
+                      Archive::StreamlineNotVerified);
+            files.SetObserver(nullptr);
+            EXPECT_EQ(Code(), c.code) << Log();
+            EXPECT_TRUE(std::filesystem::exists(m_shunt + "/" + m_report.GetData() + "-streamline.corvane"));
+            EXPECT_EQ(ReadWhole(m_path), original);
+            EXPECT_FALSE(std::filesystem::exists(m_path + "~tmp"));
+            EXPECT_TRUE(std::filesystem::is_empty(m_folder / "temporaries"));
+            EXPECT_EQ(Get(*archive, "b"), "7");
+            Clear();
+        }
+    }
+    TempFile::SetTempPath(String8());
+}
+
+TEST_F(ArchiveVerifyTest, ThumbnailsThatCannotBeFoundCountOnlyInAStreamlinedFile)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    auto const saveWithThumbnail = [&](std::function<void()> const& spoil) {
+        ArchiveSessionHandle handle;
+        EXPECT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+        handle->CreateFile(Str("a"), MakeCounted<BytesItem>("1"));
+        auto const thumbnails = MakeCounted<ArchiveThumbnails>();
+        thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, MakeCounted<RawData>(3));
+        handle->SetThumbnails(thumbnails);
+        handle->AddPostSaveObject(MakeCounted<Spoiler>(spoil));
+        return archive->CloseSessionAndVerifyFileState(handle, m_report, false);
+    };
+    auto const hide = [](Bytes& b) { b[b.rfind("Thmb")] = 'x'; };
+    EXPECT_EQ(saveWithThumbnail([&] { SpoilFile(m_path, hide); }), Archive::VerifyMatch);
+    EXPECT_EQ(saveWithThumbnail([] {}), Archive::VerifyMatch);
+    TestSupport::FaultyFiles files;
+    files.SetObserver([&](TestSupport::FileCall call, std::string const& path) {
+        if (call == TestSupport::FileCall::Flush && path.find("~tmp") != path.npos) SpoilFile(path, hide);
+    });
+    EXPECT_EQ(archive->StreamlineAndVerifyFileState(m_report, nullptr, nullptr, nullptr),
+              Archive::StreamlineNotVerified);
+    EXPECT_EQ(Code(), 109);
+}
+
+// Over every way of saving, a sound archive matches what it has written.
+TEST_F(ArchiveVerifyTest, SoundSavesMatchWhateverTheirKind)
+{
+    Counted<Archive> archive = CreateDocument(m_path);
+    Archive::CreateResult created;
+    ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), created));
+    archive->SetKeepOpen(false);
+    int step = 0;
+    for (bool scratch : {false, true, true, false, true}) {
+        for (auto type : {Archive::SessionTypeFull, Archive::SessionTypeIncremental, Archive::SessionTypeRewrite,
+                          Archive::SessionTypeExport})
+        {
+            SCOPED_TRACE(++step);
+            ArchiveSessionHandle handle;
+            ASSERT_TRUE(scratch ? archive->CreateScratchSession(handle, type, nullptr)
+                                : archive->CreateSession(handle, type, nullptr));
+            auto const item = MakeCounted<BytesItem>(std::to_string(step));
+            String8 path;
+            handle->GenerateIndexedPath({String8("g"), String8("")}, item.Get(), nullptr, path);
+            handle->CreateFile(path, item);
+            if (step % 3 == 0) handle->DeleteFile(Str("g1"));
+            if (step % 3 == 1) handle->CreateFile(Str("g1"), MakeCounted<BytesItem>("again"));
+            ASSERT_EQ(archive->CloseSessionAndVerifyFileState(handle, m_report, false), Archive::VerifyMatch) << Log();
+            if (step % 7 != 0) continue;
+            ASSERT_EQ(archive->StreamlineAndVerifyFileState(m_report, nullptr, nullptr, nullptr),
+                      Archive::StreamlineDone)
+                << Log();
+        }
+    }
+    // A version 7 file has a block where later ones have their guard.
+    TestSupport::ArchiveBuilder old(7);
+    old.AddFile(1, "a", "old");
+    WriteWhole(m_folder / "old", old.Build());
+    archive = OpenDocument(m_folder / "old");
+    EXPECT_EQ(SaveAndSpoil(*archive, false, m_folder / "old", [](Bytes&) {}), Archive::VerifyMatch) << Log();
+}
+
+TEST_F(ArchiveVerifyTest, FilesThatCannotBeReachedCannotBeChecked)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    archive->SetKeepOpen(false);
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("a"), MakeCounted<BytesItem>("1"));
+    handle->AddPostSaveObject(MakeCounted<Spoiler>([&] { std::filesystem::rename(m_path, m_path + "2"); }));
+    EXPECT_EQ(archive->CloseSessionAndVerifyFileState(handle, m_report, false), Archive::VerifyNotRun);
+    EXPECT_TRUE(std::filesystem::is_empty(m_shunt));
+}
+
+TEST_F(ArchiveVerifyTest, ShuntedFilesComeWithALogUnderTheTimeOfDay)
+{
+    TestSupport::FakeClock const clock(1'600'000'000);
+    std::tm local{};
+    ASSERT_TRUE(Platform::ToCivilLocal(1'600'000'000, local));
+    char id[40];
+    std::strftime(id, sizeof(id), "%Y%m%d-%H%M%S", &local);
+
+    Counted<Archive> archive = CreateDocument(m_path);
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+    EXPECT_EQ(SaveAndSpoil(*archive, false, m_path, [](Bytes& b) { Put(b, 60, 77, 4); }), Archive::VerifyMismatch);
+    EXPECT_EQ(m_report, String8(id));
+    std::string const base = m_shunt + "/" + id;
+    EXPECT_EQ(ReadWhole(base + "-master.corvane"), ReadWhole(m_path));
+    EXPECT_EQ(Log(), "The newly written files could not be matched back to the in-memory data\n\n"
+                     "E006: NextFreeUID mismatch (2 : 77)\n\nOriginal paths:\nMaster: " +
+                         m_path + "\n\n[No scratch]\n\n");
+
+    // No copies where there are no files, and no log where there is no folder.
+    archive = nullptr;
+    archive = CreateDocument(m_path);
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}, {"b", "1"}}));
+    ASSERT_TRUE(Save(*archive, {{"b", std::nullopt}}));
+    Kernel::Test::TraceCapture trace;
+    EXPECT_FALSE(archive->VerifyExistingFiles({Str("a"), Str("b"), Str("never")}, m_report));
+    EXPECT_EQ(trace.GetText(), "Missing file: b [deleted]\nMissing file: never\n");
+    EXPECT_EQ(Log(), "There are required files missing from the archive\n\nb [deleted]\nnever\n\n\nOriginal paths:\n"
+                     "Master: " +
+                         m_path + "\n\n[No scratch]\n\n");
+    Archive::SetShuntPath(Str(m_folder / "no such folder"));
+    EXPECT_FALSE(archive->VerifyExistingFiles({Str("b")}, m_report));
+    EXPECT_EQ(m_report, Str(std::string(id) + "-NOLOG"));
+    Archive::SetShuntPath(String8());
+    EXPECT_FALSE(archive->VerifyExistingFiles({Str("b")}, m_report));
+    EXPECT_EQ(m_report, Str("NOLOG"));
+    m_report = String8();
+    EXPECT_TRUE(archive->VerifyExistingFiles({}, m_report));
+    EXPECT_TRUE(archive->VerifyExistingFiles({Str("a")}, m_report));
+    EXPECT_TRUE(m_report.IsEmpty());
+    archive->RewindWorkingRevision();
+    EXPECT_TRUE(archive->VerifyExistingFiles({Str("a"), Str("b")}, m_report));
+}
+
+TEST_F(ArchiveVerifyTest, CopiesThatFailAreSaidInTheLog)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    Archive::CreateResult created;
+    ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), created));
+    TestSupport::FaultyFiles files;
+    TestSupport::Fault fault;
+    fault.call = TestSupport::FileCall::Rename;
+    fault.forEver = true;
+    fault.error = ENOSPC;
+    fault.path = ".corvane";
+    files.Plan(fault);
+    EXPECT_FALSE(archive->VerifyExistingFiles({Str("a")}, m_report));
+    EXPECT_EQ(Log(), "There are required files missing from the archive\n\na\n\n\nOriginal paths:\nMaster: " + m_path +
+                         "\nScratch: " + m_scratchPath + "\n\n[Failed to copy master]\n[Failed to copy scratch]\n\n");
+}
+
+TEST_F(ArchiveVerifyTest, StreamlineLogNamesBothFiles)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+    ASSERT_TRUE(Save(*archive, {{"a", "2"}}));
+    TestSupport::FaultyFiles files;
+    files.SetObserver([&](TestSupport::FileCall call, std::string const& path) {
+        if (call == TestSupport::FileCall::Flush && path.find("~tmp") != path.npos)
+            SpoilFile(path, [](Bytes& b) { b[0] = 'x'; });
+    });
+    EXPECT_EQ(archive->StreamlineAndVerifyFileState(m_report, nullptr, nullptr, nullptr),
+              Archive::StreamlineNotVerified);
+    EXPECT_EQ(Log(), "The streamlined file failed verification\n\nE101: Failed to load streamlined file\n"
+                     "Original paths:\nMaster: " +
+                         m_path + "\nStreamline: " + m_path + "~tmp\n\n\n");
+}
+
+TEST_F(ArchiveVerifyTest, AdditionalFilesAreThoseOfAnyRevision)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    EXPECT_FALSE(archive->TestForAdditionalFiles({}));
+    ASSERT_TRUE(Save(*archive, {{"a", "1"}, {"b", "1"}}));
+    EXPECT_FALSE(archive->TestForAdditionalFiles({Str("a"), Str("b"), Str("c")}));
+    ASSERT_TRUE(Save(*archive, {{"b", std::nullopt}}));
+    EXPECT_TRUE(archive->TestForAdditionalFiles({Str("a")}));
+}
+
+// The tables are read, and no block is.
+TEST_F(ArchiveVerifyTest, CheckCostsOneReadOfTheTables)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    for (int i = 0; i < 5; ++i) ASSERT_TRUE(Save(*archive, {{"a" + std::to_string(i), std::string(3'000'000, 'x')}}));
+    TestSupport::FaultyFiles files;
+    int saved = 0;
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->CreateFile(Str("b"), MakeCounted<BytesItem>("1"));
+    handle->AddPostSaveObject(MakeCounted<Spoiler>([&] { saved = files.GetCount(TestSupport::FileCall::Read); }));
+    EXPECT_EQ(archive->CloseSessionAndVerifyFileState(handle, m_report, false), Archive::VerifyMatch);
+    // Header, info, guard, twice six tables (header and body), the place of thumbnails, the guard's tag.
+    EXPECT_LE(files.GetCount(TestSupport::FileCall::Read) - saved, 20);
+}
+
+} // namespace
+} // namespace KernelTest
