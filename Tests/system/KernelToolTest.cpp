@@ -410,11 +410,11 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
     {
         char const* group;
         std::vector<char const*> verbs;
-    } const groups[] = {
-        {"archive",
-         {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch", "thumbnail"}},
-        {"stream", {"dump", "check"}},
-        {"text", {"sort"}}};
+    } const groups[] = {{"archive",
+                         {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch",
+                          "streamline", "thumbnail"}},
+                        {"stream", {"dump", "check"}},
+                        {"text", {"sort"}}};
     for (auto const& group : groups) {
         EXPECT_THAT(Run({group.group, "--help"}).out, HasSubstr("Example:"));
         for (char const* verb : group.verbs) {
@@ -428,6 +428,54 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
             }
         }
     }
+}
+
+TEST_F(KernelToolTest, StreamlineLeavesTheItemsAndDropsTheRest)
+{
+    EXPECT_EQ(RunJson({"archive", "streamline", m_doc})["streamlined"], false);
+    ASSERT_EQ(Run({"archive", "put", m_doc, "a.txt=in/sub/b.txt", "--verify"}).status, 0);
+    ASSERT_EQ(Run({"archive", "rm", m_doc, "empty", "--verify"}).status, 0);
+    struct
+    {
+        std::vector<std::string> options;
+        std::string file;
+        int flags;
+    } const calls[] = {{{"--to", m_folder / "copy"}, m_folder / "copy", 0},
+                       {{"--no-verify", "--to", m_folder / "copy2"}, m_folder / "copy2", 0},
+                       {{}, m_doc, 4},
+                       {{"--overwrite"}, m_doc, 8},
+                       {{"--overwrite", "--no-verify", "--progress", "always"}, m_doc, 8}};
+    for (auto const& call : calls) {
+        SCOPED_TRACE(call.options.empty() ? "in place" : call.options[0]);
+        ASSERT_EQ(Run({"archive", "put", m_doc, "--session", "rewrite", "a.txt=in/sub/b.txt"}).status, 0);
+        std::vector<std::string> words = {"archive", "streamline", m_doc};
+        words.insert(words.end(), call.options.begin(), call.options.end());
+        Json const report = RunJson(words);
+        EXPECT_EQ(KeysOf(report),
+                  (std::vector<std::string>{"streamlined", "path", "sizeBefore", "sizeAfter", "verified"}));
+        EXPECT_LT(report["sizeAfter"], report["sizeBefore"]);
+        EXPECT_EQ(fs::file_size(call.file), report["sizeAfter"]);
+        Json const info = RunJson({"archive", "info", call.file});
+        EXPECT_EQ(info["revisions"], 1);
+        EXPECT_EQ(info["items"], 2);
+        EXPECT_EQ(info["master"]["flags"], call.flags);
+        EXPECT_EQ(Run({"archive", "cat", call.file, "a.txt"}).out, std::string(5000, 'b'));
+        EXPECT_EQ(Run({"archive", "verify", call.file}).status, 0);
+        EXPECT_FALSE(fs::exists(m_doc + "~streamline"));
+    }
+    EXPECT_EQ(Run({"archive", "streamline", m_doc, "--to", m_folder / "copy"}).status, 1);
+    EXPECT_EQ(Run({"archive", "streamline", m_doc, "--to", m_folder / "new", "--overwrite"}).status, 2);
+    EXPECT_FALSE(fs::exists(m_folder / "new"));
+
+    // A block that is not where the table says stops it, and nothing has changed.
+    ASSERT_EQ(Run({"archive", "put", m_doc, "--session", "rewrite", "a.txt=in/sub/b.txt"}).status, 0);
+    std::string bytes = ReadWhole(m_doc);
+    bytes[bytes.rfind("#Fil")] = '?';
+    WriteWhole(m_doc, bytes);
+    ToolResult const failed = Run({"archive", "streamline", m_doc});
+    EXPECT_EQ(failed.status, 1);
+    EXPECT_THAT(failed.err, HasSubstr("failed: StreamlineFailed (2)"));
+    EXPECT_EQ(ReadWhole(m_doc), bytes);
 }
 
 TEST_F(KernelToolTest, ProgressBarStaysOnStandardError)

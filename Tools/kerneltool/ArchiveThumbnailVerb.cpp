@@ -84,7 +84,7 @@ void SetThumbnail(Archive& archive, String8 const& imagePath, Arguments const& a
     WriteSession session(archive, Archive::SessionTypeRewrite, archive.HasScratchFile());
     session->SetThumbnails(thumbnails);
     session->CreateFile(smallest, item, hint);
-    session.Commit();
+    session.Commit(false);
 }
 
 void GetThumbnail(ArchiveThumbnails::Rec const& rec, std::string const& path)

@@ -1,6 +1,7 @@
 #include "Diagnostics.h"
 #include "OpenedArchive.h"
 #include "ProgressBar.h"
+#include "Reservation.h"
 #include "SourceItem.h"
 #include "Verbs.h"
 #include "WriteSession.h"
@@ -10,7 +11,6 @@
 #include "libkernel/filesystem/Path.h"
 #include "libkernel/platform/PlatformFile.h"
 
-#include <cerrno>
 #include <set>
 
 // Verbs that change a document.
@@ -20,34 +20,6 @@ namespace KernelTool {
 using namespace Kernel;
 
 namespace {
-
-/// Takes a path for a new file: nobody else can have it from here on. Gives it back unless the file was made.
-class Reservation
-{
-public:
-    explicit Reservation(String8 const& path) : m_path(path)
-    {
-        Platform::OpenFlags flags;
-        flags.write = flags.create = flags.exclusive = true;
-        Platform::FileHandle handle = Platform::c_noHandle;
-        int const error = Platform::GetFileCalls().open(path.GetData(), flags, handle);
-        std::string const what = "creating '" + ToStd(path) + "'";
-        if (error == EEXIST) throw MakeFailure(what, File::OpenUnmanagedResult::Exists);
-        if (error != 0) throw MakeFailure(what, File::TranslateError(error));
-        Platform::GetFileCalls().close(handle);
-    }
-    Reservation(Reservation const&) = delete;
-    Reservation& operator=(Reservation const&) = delete;
-    ~Reservation()
-    {
-        if (!m_used) FileSystem::Delete(m_path, 0);
-    }
-    void Use() { m_used = true; }
-
-private:
-    String8 const m_path;
-    bool m_used = false;
-};
 
 String8 MakeAbsolute(String8 const& path)
 {
@@ -250,7 +222,7 @@ int RunPut(Arguments const& arguments)
         for (NamedSource const* source : wanted)
             session->CreateFile(String8(std::string_view(source->item)), MakeCounted<SourceItem>(source->source, work),
                                 options.hint);
-        session.Commit();
+        session.Commit(options.verify);
     }
     std::string const text = std::to_string(written.size()) + " items written (" + FormatSize(total) + "), " +
                              std::to_string(unchanged.size()) + " unchanged\n";
@@ -268,7 +240,7 @@ int RunRemove(Arguments const& arguments)
     WriteSession session(*archive, options.type, options.scratch);
     SetUserData(session, options);
     for (std::string const& item : items) session->DeleteFile(String8(std::string_view(item)));
-    session.Commit();
+    session.Commit(options.verify);
     u64 const revisions = GetRevisions(*archive).size();
     return Report(*archive, arguments, options.verify, {{"deleted", items}, {"revisions", revisions}},
                   std::to_string(items.size()) + " items deleted\n");

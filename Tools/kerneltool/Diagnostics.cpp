@@ -105,6 +105,23 @@ constexpr ResultName c_sessionResults[] = {
     {10, "SessionNoMemory", nullptr},
 };
 
+constexpr ResultName c_streamlineResults[] = {
+    {0, "StreamlineDone", nullptr},
+    {1, "StreamlineAborted", nullptr},
+    {2, "StreamlineFailed", "The document is as it was; 'kerneltool archive verify' says whether it is damaged."},
+    {3, "StreamlineNotCreated", c_rights},
+    {4, "StreamlineNoAccess", "The document is as it was; look at the disk and whether it is full."},
+    {6, "StreamlineNotVerified", "The document is as it was: what was written in its place did not match."},
+    {7, "StreamlineOverwriteFailed", nullptr},
+    {8, "StreamlineNoSpace", nullptr},
+};
+
+constexpr ResultName c_verifyResults[] = {
+    {0, "VerifyMatch", nullptr},
+    {1, "VerifyNotRun", "The save was made; 'kerneltool archive verify' checks it."},
+    {2, "VerifyMismatch", "What lies in the file is not what was saved: check the disk, and go back to a copy."},
+};
+
 constexpr ResultName c_fileResults[] = {
     {0, "Opened", nullptr},
     {1, "OpenedToo", nullptr},
@@ -169,6 +186,16 @@ Failure MakeFailure(std::string const& what, Archive::CreateResult const& result
 Failure MakeFailure(std::string const& what, Archive::CreateSessionResult result)
 {
     return FromTable(c_sessionResults, what, static_cast<int>(result));
+}
+
+Failure MakeFailure(std::string const& what, Archive::StreamlineResult result)
+{
+    return FromTable(c_streamlineResults, what, static_cast<int>(result));
+}
+
+Failure MakeFailure(std::string const& what, Archive::VerifyResult result)
+{
+    return FromTable(c_verifyResults, what, static_cast<int>(result));
 }
 
 Failure MakeFailure(std::string const& what, File::OpenUnmanagedResult result)

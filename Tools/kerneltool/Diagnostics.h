@@ -23,6 +23,8 @@ struct Failure
 Failure MakeFailure(std::string const& what, Kernel::Archive::OpenResult result);
 Failure MakeFailure(std::string const& what, Kernel::Archive::CreateResult const& result);
 Failure MakeFailure(std::string const& what, Kernel::Archive::CreateSessionResult result);
+Failure MakeFailure(std::string const& what, Kernel::Archive::StreamlineResult result);
+Failure MakeFailure(std::string const& what, Kernel::Archive::VerifyResult result);
 Failure MakeFailure(std::string const& what, Kernel::File::OpenUnmanagedResult result);
 Failure MakeFailure(std::string const& what, Kernel::FileIOException::Reason reason);
 

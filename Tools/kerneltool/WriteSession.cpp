@@ -79,9 +79,17 @@ u32 WriteSession::GetSaveCount() const
     return m_archive.GetFileState(m_file, state) ? state.saveCount : 0;
 }
 
-void WriteSession::Commit()
+void WriteSession::Commit(bool verify)
 {
-    m_archive.CloseSession(m_handle, true);
+    if (verify) {
+        String8 report;
+        Archive::VerifyResult const result = m_archive.CloseSessionAndVerifyFileState(m_handle, report, true);
+        Failure failure = MakeFailure("verifying the save", result);
+        if (result == Archive::VerifyMismatch) failure.status = ExitDamaged;
+        if (result != Archive::VerifyMatch) throw failure;
+    } else {
+        m_archive.CloseSession(m_handle, true);
+    }
     if (GetSaveCount() != m_saveCount) return;
     StopIfInterrupted();
     throw OutStream::WriteException();

@@ -29,8 +29,10 @@ public:
     WriteSession(Kernel::Archive& archive, Kernel::Archive::SessionType type, bool scratch);
 
     Kernel::ArchiveSession* operator->() const { return m_handle.operator->(); }
-    /// Throws Failure or what the archive throws; AbortException if Ctrl-C came before the save was made.
-    void Commit();
+    /// Throws Failure or what the archive throws; AbortException if Ctrl-C came before the save was made. With @p
+    /// verify the tables are read back before anybody else can save; a difference is a Failure with the status for
+    /// damage.
+    void Commit(bool verify);
 
 private:
     Kernel::u32 GetSaveCount() const;
