@@ -13,7 +13,8 @@ namespace Kernel {
 // Two methods. The tables take 16 bytes a step: table k holds the effect of a byte that k more bytes follow. Carry-less
 // multiplication keeps four 128-bit remainders going and folds 64 bytes a step into them ("Fast CRC Computation for
 // Generic Polynomials Using PCLMULQDQ Instruction", Intel 2009); the last 16 bytes of it go through the tables, which
-// saves the reduction by division and costs some nanoseconds.
+// saves the reduction by division and costs some nanoseconds. Where the processor multiplies two at once, long data
+// folds 128 bytes a step in the same way, in vectors of 256 bits: twice as fast.
 
 namespace {
 
@@ -69,7 +70,9 @@ constexpr u64 FoldConstant(int exponent)
     return reversed << 1;
 }
 
-// What carries the two halves of a remainder over 512 and over 128 bits.
+// What carries the two halves of a remainder over 1024, 512 and 128 bits.
+constexpr u64 c_over1024Low = FoldConstant(1024 + 32);
+constexpr u64 c_over1024High = FoldConstant(1024 - 32);
 constexpr u64 c_over512Low = FoldConstant(512 + 32);
 constexpr u64 c_over512High = FoldConstant(512 - 32);
 constexpr u64 c_over128Low = FoldConstant(128 + 32);
@@ -116,17 +119,58 @@ KERNEL_CLMUL u32 CalcByMultiplication(u8 const* p, u64 count, u32 crc)
 }
 
 #undef KERNEL_CLMUL
+#define KERNEL_WIDE __attribute__((target("vpclmulqdq,avx2,pclmul")))
 
-bool HasMultiplication()
+KERNEL_WIDE inline __m256i LoadWide(u8 const* p)
+{
+    return _mm256_loadu_si256(reinterpret_cast<__m256i const*>(p));
+}
+
+KERNEL_WIDE inline __m256i FoldWide(__m256i remainder, __m256i constants, __m256i next)
+{
+    __m256i const low = _mm256_clmulepi64_epi128(remainder, constants, 0x00);
+    __m256i const high = _mm256_clmulepi64_epi128(remainder, constants, 0x11);
+    return _mm256_xor_si256(_mm256_xor_si256(low, high), next);
+}
+
+KERNEL_WIDE u32 CalcByWideMultiplication(u8 const* p, u64 count, u32 crc)
+{
+    // Below this the narrow steps that end the wide ones are all there is.
+    if (count < 512) return CalcByMultiplication(p, count, crc);
+    __m256i const over1024 = _mm256_set_epi64x(static_cast<i64>(c_over1024High), static_cast<i64>(c_over1024Low),
+                                               static_cast<i64>(c_over1024High), static_cast<i64>(c_over1024Low));
+    __m256i a = _mm256_xor_si256(LoadWide(p), _mm256_zextsi128_si256(_mm_cvtsi32_si128(static_cast<int>(crc))));
+    __m256i b = LoadWide(p + 32);
+    __m256i c = LoadWide(p + 64);
+    __m256i d = LoadWide(p + 96);
+    for (p += 128, count -= 128; count >= 128; p += 128, count -= 128) {
+        a = FoldWide(a, over1024, LoadWide(p));
+        b = FoldWide(b, over1024, LoadWide(p + 32));
+        c = FoldWide(c, over1024, LoadWide(p + 64));
+        d = FoldWide(d, over1024, LoadWide(p + 96));
+    }
+    // 128 bytes with the remainder of all that went before.
+    __m256i rest[4] = {a, b, c, d};
+    crc = CalcByMultiplication(reinterpret_cast<u8 const*>(rest), sizeof rest, 0);
+    return CalcByMultiplication(p, count, crc);
+}
+
+#undef KERNEL_WIDE
+
+using Method = u32 (*)(u8 const* p, u64 count, u32 crc);
+
+Method ChooseMethod()
 {
     __builtin_cpu_init();
-    return __builtin_cpu_supports("pclmul") && __builtin_cpu_supports("sse4.1");
+    if (!__builtin_cpu_supports("pclmul") || !__builtin_cpu_supports("sse4.1")) return CalcByTables;
+    bool const isWide = __builtin_cpu_supports("vpclmulqdq") && __builtin_cpu_supports("avx2");
+    return isWide ? CalcByWideMultiplication : CalcByMultiplication;
 }
 
 u32 Calc(u8 const* p, u64 count, u32 crc)
 {
-    static bool const s_hasMultiplication = HasMultiplication();
-    return s_hasMultiplication ? CalcByMultiplication(p, count, crc) : CalcByTables(p, count, crc);
+    static Method const s_method = ChooseMethod();
+    return s_method(p, count, crc);
 }
 
 #else
