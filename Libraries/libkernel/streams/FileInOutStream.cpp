@@ -18,8 +18,8 @@ constexpr u64 c_highestPosition = static_cast<u64>(std::numeric_limits<i64>::max
 
 } // namespace
 
-FileInOutStream::FileInOutStream(Platform::FileHandle handle, bool readOnly, u64 size, bool lengthChanged)
-    : FileStreamBase(handle), m_readOnly(readOnly), m_knownSize(size), m_lengthChanged(lengthChanged)
+FileInOutStream::FileInOutStream(Platform::FileHandle handle, bool readOnly, bool isNew)
+    : FileStreamBase(handle), m_readOnly(readOnly), m_needsFullFlush(isNew)
 {
 }
 
@@ -27,10 +27,7 @@ FileInOutStream::~FileInOutStream() = default;
 
 Counted<FileInOutStream> FileInOutStream::AdoptI(Platform::FileHandle handle, bool readOnly, bool isNew)
 {
-    // A size that can't be had counts as 0: the flushes to the device are then the fuller ones.
-    u64 size = 0;
-    if (!readOnly && !isNew) Platform::GetFileCalls().getSize(handle, size);
-    return new FileInOutStream(handle, readOnly, size, isNew);
+    return new FileInOutStream(handle, readOnly, isNew);
 }
 
 Counted<FileInOutStream> FileInOutStream::OpenI(char const* path, char const* mode, File::ShareMode share,
@@ -104,8 +101,7 @@ bool FileInOutStream::SetSizeI(u64 size)
         OnErrorI(error);
         return false;
     }
-    m_knownSize = size;
-    m_lengthChanged = true;
+    m_needsFullFlush = true;
     return true;
 }
 
@@ -152,13 +148,6 @@ u64 FileInOutStream::WriteAt(u64 position, void const* from, u64 count)
     else
         result.error = EFBIG;
 
-    u64 const end = position + result.count;
-    u64 known = m_knownSize.load(std::memory_order_relaxed);
-    while (result.count != 0 && end > known) {
-        if (!m_knownSize.compare_exchange_weak(known, end)) continue;
-        m_lengthChanged = true;
-        break;
-    }
     if (result.error != 0) OnErrorI(result.error);
     return result.count;
 }
@@ -216,8 +205,8 @@ u64 FileInOutStream::WriteBlock(void const* from, u64 count)
 bool FileInOutStream::ForceFlush()
 {
     if (!IsUsable()) return true;
-    // Taken first: a length that another thread changes meanwhile is for the next flush.
-    bool const full = m_lengthChanged.exchange(false);
+    // Taken first: a length that another thread sets meanwhile is for the next flush.
+    bool const full = m_needsFullFlush.exchange(false);
     int const error =
         Platform::GetFileCalls().flush(GetHandle(), full ? Platform::FlushKind::Full : Platform::FlushKind::Data);
     if (error != 0) OnErrorI(error);

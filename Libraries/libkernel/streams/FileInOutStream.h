@@ -75,7 +75,10 @@ public:
 
     u64 WriteBlock(void const* from, u64 count) override;
     bool Flush() override { return true; }
-    /// A flush that the device failed is never tried again: the stream is broken.
+    /// Brings contents and length to the device: POSIX.1-2017, "synchronized I/O data integrity completion", by which
+    /// what a reader needs to find the data again goes with it, so that growing by writes asks for no more. The first
+    /// flush after the file was made or its length was set brings the times and attributes as well. A flush that the
+    /// device failed is never tried again: the stream is broken.
     bool ForceFlush() override;
     bool CopyFromStream(InStream& in, StreamCopyProgress* progress = nullptr) override;
     bool WillDelegateCopyFromStream() const override { return true; }
@@ -88,7 +91,7 @@ public:
     bool SeekOutStream(SeekMethod method, i64 offset) override;
 
 private:
-    FileInOutStream(Platform::FileHandle handle, bool readOnly, u64 size, bool lengthChanged);
+    FileInOutStream(Platform::FileHandle handle, bool readOnly, bool isNew);
     ~FileInOutStream() override;
     static Counted<FileInOutStream> OpenI(char const* path, char const* mode, File::ShareMode share,
                                           File::OpenUnmanagedResult& result, String8* errorText);
@@ -99,10 +102,8 @@ private:
 
     bool const m_readOnly;
     bool m_passedEnd = false;
-    u64 m_position = 0; // At most the highest i64.
-    // For the choice between the two flushes to the device; several threads may write at once.
-    std::atomic<u64> m_knownSize;
-    std::atomic<bool> m_lengthChanged;
+    u64 m_position = 0;                 // At most the highest i64.
+    std::atomic<bool> m_needsFullFlush; // Several threads may write at once.
 };
 
 } // namespace Kernel

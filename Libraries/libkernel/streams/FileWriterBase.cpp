@@ -21,7 +21,7 @@ FileWriterBase::FileWriterBase(Platform::FileHandle handle, std::unique_ptr<u8[]
                                Placement placement, u64 size)
     : FileStreamBase(handle), m_buffer(std::move(buffer)), m_bufferSize(bufferSize),
       m_start(placement == Placement::Append ? size : 0), m_fileSize(size), m_placement(placement),
-      m_lengthChanged(placement == Placement::AtPosition) // The file was emptied when it was opened.
+      m_lengthWasSet(placement == Placement::AtPosition) // The file was emptied when it was opened.
 {
 }
 
@@ -45,10 +45,7 @@ Platform::IoResult FileWriterBase::WriteOut(void const* from, u64 count)
         result = calls.writeAt(GetHandle(), from, count, m_start);
         m_start += result.count;
     }
-    if (m_start > m_fileSize) {
-        m_fileSize = m_start;
-        m_lengthChanged = true;
-    }
+    m_fileSize = std::max(m_fileSize, m_start);
     return result;
 }
 
@@ -100,12 +97,13 @@ bool FileWriterBase::ForceFlushI()
 {
     if (!IsUsable()) return true;
     if (!DumpStream()) return false;
-    Platform::FlushKind const kind = m_lengthChanged ? Platform::FlushKind::Full : Platform::FlushKind::Data;
+    // Contents that grew by writes bring their length along in the smaller flush.
+    Platform::FlushKind const kind = m_lengthWasSet ? Platform::FlushKind::Full : Platform::FlushKind::Data;
     if (int const error = Platform::GetFileCalls().flush(GetHandle(), kind)) {
         OnErrorI(error);
         return false;
     }
-    m_lengthChanged = false;
+    m_lengthWasSet = false;
     return true;
 }
 
@@ -135,7 +133,7 @@ bool FileWriterBase::TruncateI(u64 size)
     m_fileSize = std::min(size, end);
     m_start = m_fileSize;
     if (size >= end) return true;
-    m_lengthChanged = true;
+    m_lengthWasSet = true;
     int const error = Platform::GetFileCalls().setSize(GetHandle(), size);
     if (error != 0) OnErrorI(error);
     return error == 0;

@@ -50,7 +50,7 @@ private:
     u64 m_start;    // Where in the file the first of them belongs.
     u64 m_fileSize; // As far as this stream has written.
     Placement const m_placement;
-    bool m_lengthChanged; // Since the last flush to the device.
+    bool m_lengthWasSet; // Since the last flush to the device.
 };
 
 } // namespace Kernel
