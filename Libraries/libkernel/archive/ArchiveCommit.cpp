@@ -210,7 +210,7 @@ void ArchiveCommit::CopyBlock(FileInOutStream& from, Archive::FileRevision const
 // is the master's own, since the scratch revisions end with this commit.
 Archive::FileRevision const* ArchiveCommit::FindEarlier(Archive::FileInfo const& info) const
 {
-    std::vector<Archive::Revision*> const& history = info.m_history;
+    auto const& history = info.m_history;
     for (size_t i = history.size(); i-- > 0;)
         if (m_file.m_isScratch || !history[i]->IsScratch()) return history[i]->Find(info);
     return nullptr;
@@ -286,7 +286,7 @@ void ArchiveCommit::ReserveMemory()
     CriticalSectionScope const lock(m_impl.m_stateLock);
     size_t fresh = 0;
     for (Archive::FileRevision const& entry : m_revision.GetEntries()) {
-        std::vector<Archive::Revision*>& history = const_cast<Archive::FileInfo&>(*entry.info).m_history;
+        auto& history = const_cast<Archive::FileInfo&>(*entry.info).m_history;
         if (history.size() == history.capacity()) history.reserve(std::max<size_t>(2 * history.size(), 1));
         auto const it = m.newPaths.find(entry.info->GetPath());
         if (it == m.newPaths.end()) continue;
@@ -294,8 +294,7 @@ void ArchiveCommit::ReserveMemory()
         ++fresh;
     }
     ArchivePathMap& paths = m_impl.m_paths;
-    auto const room = static_cast<size_t>(static_cast<float>(paths.bucket_count()) * paths.max_load_factor());
-    if (paths.size() + fresh > room) paths.reserve(2 * (paths.size() + fresh));
+    paths.reserve(paths.size() + fresh);
     std::vector<Counted<Archive::Revision>>& revisions = m_impl.m_revisions;
     if (revisions.size() == revisions.capacity()) revisions.reserve(std::max<size_t>(2 * revisions.size(), 8));
     m_impl.m_revisionsByAddress.reserve(revisions.size() + 1);
@@ -454,7 +453,7 @@ void ArchiveCommit::MoveHolders()
     {
         CriticalSectionScope const lock(m_impl.m_stateLock);
         for (Archive::FileInfo const* info : m_rolledDown) {
-            std::vector<Archive::Revision*> const& history = info->m_history;
+            auto const& history = info->m_history;
             // The newest is this revision; the one before it is where the rolled down bytes came from.
             if (history.size() >= 2) moved.emplace(info->GetPath(), history[history.size() - 2]);
         }
@@ -468,7 +467,7 @@ void ArchiveCommit::DropScratchRevisions()
     for (Counted<Archive::Revision> const& revision : m_droppedRevisions) {
         for (Archive::FileRevision const& entry : revision->GetEntries()) {
             auto& info = const_cast<Archive::FileInfo&>(*entry.info);
-            std::erase(info.m_history, revision.Get());
+            info.m_history.Remove(revision.Get());
             if (!info.m_history.empty()) continue;
             // Only the scratch file knew it, and it is deleted: the path is free.
             auto const it = m_impl.m_paths.find(info.GetPath());

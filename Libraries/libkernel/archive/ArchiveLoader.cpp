@@ -205,7 +205,10 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     size_t const before = data.revisions.size();
     Result const result =
         LoadFATChain(source, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
-    if (result != Archive::OpenOk) return result;
+    if (result != Archive::OpenOk) {
+        data.files.clear(); // The revisions that held them have gone.
+        return result;
+    }
 
     // An info block that a crash left half written can lag behind the table it names, or be rubbish; a save that
     // trusted it would write over live bytes or reuse an identifier.
@@ -281,12 +284,12 @@ Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& head
         u8 const recordKind = fixed[4];
         if (recordKind > RecordDeleted) return Archive::OpenCorrupt;
 
-        Counted<Archive::FileInfo>& info = data.files[uid];
-        if (!info) info = MakeCounted<Archive::FileInfo>(uid, String8());
         highestUID = std::max(highestUID, uid);
-
         Archive::FileRevision& entry = revision.m_entries.emplace_back();
-        entry.info = info;
+        NonCounted<Archive::FileInfo>& known = data.files[uid];
+        if (!known) known = new Archive::FileInfo(uid, String8());
+        Archive::FileInfo* const info = known.Get();
+        entry.info = Counted<Archive::FileInfo const>(info);
         if (recordKind == RecordDeleted) continue;
 
         u8 const* const details = cursor.Take(kind.detailsSize);
@@ -305,7 +308,7 @@ Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& head
         else if (info->m_path.GetLength() != length || std::memcmp(info->m_path.GetData(), text, length) != 0)
             return Archive::OpenCorrupt;
         // Newest first: where two files claim one path the newer one has it.
-        data.paths.try_emplace(info->m_path, info);
+        data.paths.try_emplace(info->m_path, Counted<Archive::FileInfo>(info));
     }
     for (u16 i = 0; i < header.pathCountCount; ++i) {
         u8 const* const fixed = cursor.Take(c_pathCountFixedSize);

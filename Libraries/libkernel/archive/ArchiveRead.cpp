@@ -12,6 +12,7 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <cstring>
 #include <memory>
 
 // How a path at a revision becomes bytes. Each file knows the revisions that touched it, so a look-up costs the same
@@ -35,7 +36,7 @@ Archive::FileInfo* ArchiveImpl::FindFileInfoCS(String8 const& path) const
 Archive::FileRevision* ArchiveImpl::FindEntryCS(Archive::FileInfo const& info, Archive::Revision const& revision,
                                                 Archive::Revision** where) const
 {
-    std::vector<Archive::Revision*> const& history = info.m_history;
+    auto const& history = info.m_history;
     auto const later = std::upper_bound(history.begin(), history.end(), revision.m_order,
                                         [](u64 order, Archive::Revision const* r) { return order < r->m_order; });
     if (later == history.begin()) return nullptr;
@@ -99,19 +100,55 @@ bool Archive::HasFileRevision(String8 const& path, NonCounted<FileStoreRevision 
     return info && HasFileRevision(*info, revision);
 }
 
+namespace {
+
+/// A path with its first bytes as a number that sorts like them.
+struct ListedPath
+{
+    u64 key;
+    String8 const* path;
+};
+
+/// Paths of one archive mostly begin alike, so the key is taken from behind what all have in common.
+void SortPaths(std::vector<ListedPath>& listed)
+{
+    if (listed.empty()) return;
+    String8 const& first = *listed.front().path;
+    auto common = static_cast<size_t>(first.GetLength());
+    for (ListedPath const& one : listed) {
+        common = std::min(common, static_cast<size_t>(one.path->GetLength()));
+        char const* const end = first.GetData() + common;
+        common = static_cast<size_t>(std::mismatch(first.GetData(), end, one.path->GetData()).first - first.GetData());
+    }
+    for (ListedPath& one : listed) {
+        u8 bytes[sizeof(u64)] = {};
+        size_t const left = static_cast<size_t>(one.path->GetLength()) - common;
+        std::memcpy(bytes, one.path->GetData() + common, std::min(left, sizeof(bytes)));
+        one.key = 0;
+        for (u8 const byte : bytes) one.key = one.key << 8 | byte;
+    }
+    std::sort(listed.begin(), listed.end(), [](ListedPath const& a, ListedPath const& b) {
+        return a.key != b.key ? a.key < b.key : *a.path < *b.path;
+    });
+}
+
+} // namespace
+
 void Archive::GetFileList(std::vector<String8>& paths) const
 {
     paths.clear();
-    {
-        CriticalSectionScope const lock(m->m_stateLock);
-        Revision* const working = m->GetWorkingRevisionCS();
-        if (!working) return;
-        for (auto const& [path, info] : m->m_paths) {
-            FileRevision* const found = m->FindEntryCS(*info, *working);
-            if (found && !found->IsDeletion()) paths.push_back(path);
-        }
+    CriticalSectionScope const lock(m->m_stateLock);
+    Revision* const working = m->GetWorkingRevisionCS();
+    if (!working) return;
+    std::vector<ListedPath> listed;
+    listed.reserve(m->m_paths.size());
+    for (auto const& [path, info] : m->m_paths) {
+        FileRevision* const found = m->FindEntryCS(*info, *working);
+        if (found && !found->IsDeletion()) listed.push_back({0, &path});
     }
-    std::sort(paths.begin(), paths.end());
+    SortPaths(listed);
+    paths.reserve(listed.size());
+    for (ListedPath const& one : listed) paths.push_back(*one.path);
 }
 
 Counted<Archive::FileInfo const> Archive::GetFileInfo(String8 const& path) const

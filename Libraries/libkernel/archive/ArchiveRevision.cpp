@@ -9,6 +9,30 @@ namespace Kernel {
 
 Archive::FileInfo::~FileInfo() = default;
 
+void Archive::FileInfo::History::reserve(size_t capacity)
+{
+    if (capacity <= m_capacity) return;
+    auto** const many = new Revision*[capacity];
+    std::copy(begin(), end(), many);
+    if (m_capacity > 1) delete[] m_many;
+    m_many = many;
+    m_capacity = static_cast<u32>(capacity);
+}
+
+void Archive::FileInfo::History::Remove(Revision const* revision)
+{
+    auto** const first = const_cast<Revision**>(begin());
+    m_size = static_cast<u32>(std::remove(first, first + m_size, revision) - first);
+}
+
+void Archive::FileInfo::History::clear()
+{
+    if (m_capacity > 1) delete[] m_many;
+    m_one = nullptr;
+    m_size = 0;
+    m_capacity = 1;
+}
+
 Archive::FileRevision::Method Archive::FileRevision::GetMethod() const
 {
     return static_cast<Method>(ArchiveFormat::MethodOf(compressionCode));
@@ -44,6 +68,10 @@ Archive::FileRevision* Archive::Revision::FindI(FileInfo const& info)
         auto const it = m_index.find(uid);
         return it == m_index.end() ? nullptr : &m_entries[it->second];
     }
+    if (m_entries.empty()) return nullptr;
+    // A session that writes everything numbers without gaps, so the place is most often known.
+    u32 const place = uid - m_entries.front().info->GetUID();
+    if (place < m_entries.size() && m_entries[place].info->GetUID() == uid) return &m_entries[place];
     auto const it = std::lower_bound(m_entries.begin(), m_entries.end(), uid,
                                      [](FileRevision const& e, u32 u) { return e.info->GetUID() < u; });
     return it != m_entries.end() && it->info->GetUID() == uid ? &*it : nullptr;

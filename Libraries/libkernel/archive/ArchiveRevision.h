@@ -28,11 +28,46 @@ private:
     friend class ArchiveStreamliner;
     ~FileInfo() override;
 
+    /// Revisions, oldest first. Most files know one only, and that one takes no memory of its own.
+    class History
+    {
+    public:
+        History() : m_one(nullptr) {}
+        ~History() { clear(); }
+        History(History const&) = delete;
+        History& operator=(History const&) = delete;
+
+        Revision* const* begin() const { return m_capacity == 1 ? &m_one : m_many; }
+        Revision* const* end() const { return begin() + m_size; }
+        size_t size() const { return m_size; }
+        size_t capacity() const { return m_capacity; }
+        bool empty() const { return m_size == 0; }
+        Revision* back() const { return begin()[m_size - 1]; }
+        Revision* operator[](size_t i) const { return begin()[i]; }
+        void reserve(size_t capacity);
+        void push_back(Revision* revision)
+        {
+            if (m_size == m_capacity) reserve(size_t{2} * m_capacity);
+            const_cast<Revision**>(begin())[m_size++] = revision;
+        }
+        void Remove(Revision const* revision);
+        void clear();
+
+    private:
+        u32 m_size = 0;
+        u32 m_capacity = 1;
+        union
+        {
+            Revision* m_one;   // With a capacity of 1.
+            Revision** m_many; // Above it.
+        };
+    };
+
     u32 const m_uid;
     String8 m_path; // Set once while loading, when the record that adds the file is met; empty until then.
     // Revisions that have an entry for this file, oldest first, those of the archive's revision vector only. Guarded by
     // the archive's state lock. This is what makes a look-up independent of the number of revisions.
-    std::vector<Revision*> m_history;
+    History m_history;
 };
 
 /// Where and how one version of a file is stored; a position of 0 marks a deletion.

@@ -242,13 +242,12 @@ bool HasGuard(Archive::ArchiveFile const& file)
            LoadLittleEndian<u32>(tag) == c_tagGuard;
 }
 
-template <class TMap>
-std::vector<typename TMap::value_type const*> InOrder(TMap const& map)
+std::vector<Archive::FileInfo const*> InOrder(ArchivePathMap const& map)
 {
-    std::vector<typename TMap::value_type const*> sorted;
+    std::vector<Archive::FileInfo const*> sorted;
     sorted.reserve(map.size());
-    for (auto const& entry : map) sorted.push_back(&entry);
-    std::sort(sorted.begin(), sorted.end(), [](auto const* a, auto const* b) { return a->first < b->first; });
+    for (auto const& [path, info] : map) sorted.push_back(info.Get());
+    std::sort(sorted.begin(), sorted.end(), [](auto const* a, auto const* b) { return a->GetPath() < b->GetPath(); });
     return sorted;
 }
 
@@ -275,8 +274,8 @@ bool ArchiveComparison::Paths(int first, ArchivePathMap const& held, ArchivePath
     for (size_t i = 0; i < std::max(ours.size(), theirs.size()); ++i) {
         if (i == theirs.size()) return Fail(first);
         if (i == ours.size()) return Fail(first + 1);
-        if (ours[i]->first != theirs[i]->first) return Fail(first + 2);
-        if (ours[i]->second->GetUID() != theirs[i]->second->GetUID()) return Fail(first + 3);
+        if (ours[i]->GetPath() != theirs[i]->GetPath()) return Fail(first + 2);
+        if (ours[i]->GetUID() != theirs[i]->GetUID()) return Fail(first + 3);
     }
     return false;
 }

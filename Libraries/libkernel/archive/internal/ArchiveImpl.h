@@ -6,6 +6,7 @@
 #include "libkernel/archive/ArchiveRevision.h"
 #include "libkernel/archive/ArchiveSession.h"
 #include "libkernel/archive/internal/ArchiveFile.h"
+#include "libkernel/archive/internal/ArchiveFileMaps.h"
 #include "libkernel/archive/internal/ArchiveFormat.h"
 #include "libkernel/archive/internal/ArchiveLocks.h"
 #include "libkernel/concurrency/MultiSemaphore.h"
@@ -25,7 +26,6 @@ struct ArchivePathCount
     u8 dirty = 0; // 0 clean, 1 changed since last written, 2 written by an incremental revision.
 };
 using ArchivePathCounts = std::map<std::pair<String8, String8>, ArchivePathCount>;
-using ArchivePathMap = std::unordered_map<String8, Counted<Archive::FileInfo>>;
 using ArchiveRevisionMap = std::unordered_map<FileStoreRevision const*, Archive::Revision*>;
 
 /// What is built up while the files of an archive are read; ArchiveLoader.cpp fills it.
@@ -34,7 +34,7 @@ struct ArchiveLoadData
     ArchivePathMap paths;
     std::vector<Counted<Archive::Revision>> revisions; // Oldest first.
     ArchivePathCounts pathCounts;
-    std::unordered_map<u32, Counted<Archive::FileInfo>> files; // By UID.
+    ArchiveFilesByUID files;
     u32 nextFreeUID = 1;
     bool testLink = false; // The next file must be in the state that the link names.
     bool hasLink = false;
