@@ -106,30 +106,37 @@ namespace {
 struct ListedPath
 {
     u64 key;
-    String8 const* path;
+    String8* path;
 };
 
 /// Paths of one archive mostly begin alike, so the key is taken from behind what all have in common.
-void SortPaths(std::vector<ListedPath>& listed)
+void SortPaths(std::vector<String8>& paths)
 {
-    if (listed.empty()) return;
-    String8 const& first = *listed.front().path;
+    if (paths.empty()) return;
+    String8 const& first = paths.front();
     auto common = static_cast<size_t>(first.GetLength());
-    for (ListedPath const& one : listed) {
-        common = std::min(common, static_cast<size_t>(one.path->GetLength()));
+    for (String8 const& path : paths) {
+        common = std::min(common, static_cast<size_t>(path.GetLength()));
         char const* const end = first.GetData() + common;
-        common = static_cast<size_t>(std::mismatch(first.GetData(), end, one.path->GetData()).first - first.GetData());
+        common = static_cast<size_t>(std::mismatch(first.GetData(), end, path.GetData()).first - first.GetData());
     }
-    for (ListedPath& one : listed) {
+    std::vector<ListedPath> listed;
+    listed.reserve(paths.size());
+    for (String8& path : paths) {
         u8 bytes[sizeof(u64)] = {};
-        size_t const left = static_cast<size_t>(one.path->GetLength()) - common;
-        std::memcpy(bytes, one.path->GetData() + common, std::min(left, sizeof(bytes)));
-        one.key = 0;
-        for (u8 const byte : bytes) one.key = one.key << 8 | byte;
+        std::memcpy(bytes, path.GetData() + common,
+                    std::min(static_cast<size_t>(path.GetLength()) - common, sizeof(bytes)));
+        u64 key = 0;
+        for (u8 const byte : bytes) key = key << 8 | byte;
+        listed.push_back({key, &path});
     }
     std::sort(listed.begin(), listed.end(), [](ListedPath const& a, ListedPath const& b) {
         return a.key != b.key ? a.key < b.key : *a.path < *b.path;
     });
+    std::vector<String8> sorted;
+    sorted.reserve(paths.size());
+    for (ListedPath const& one : listed) sorted.push_back(std::move(*one.path));
+    paths.swap(sorted);
 }
 
 } // namespace
@@ -137,18 +144,17 @@ void SortPaths(std::vector<ListedPath>& listed)
 void Archive::GetFileList(std::vector<String8>& paths) const
 {
     paths.clear();
-    CriticalSectionScope const lock(m->m_stateLock);
-    Revision* const working = m->GetWorkingRevisionCS();
-    if (!working) return;
-    std::vector<ListedPath> listed;
-    listed.reserve(m->m_paths.size());
-    for (auto const& [path, info] : m->m_paths) {
-        FileRevision* const found = m->FindEntryCS(*info, *working);
-        if (found && !found->IsDeletion()) listed.push_back({0, &path});
+    {
+        CriticalSectionScope const lock(m->m_stateLock);
+        Revision* const working = m->GetWorkingRevisionCS();
+        if (!working) return;
+        paths.reserve(m->m_paths.size());
+        for (auto const& [path, info] : m->m_paths) {
+            FileRevision* const found = m->FindEntryCS(*info, *working);
+            if (found && !found->IsDeletion()) paths.push_back(path);
+        }
     }
-    SortPaths(listed);
-    paths.reserve(listed.size());
-    for (ListedPath const& one : listed) paths.push_back(*one.path);
+    SortPaths(paths);
 }
 
 Counted<Archive::FileInfo const> Archive::GetFileInfo(String8 const& path) const
