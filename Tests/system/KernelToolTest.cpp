@@ -414,7 +414,7 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
                          {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch",
                           "streamline", "thumbnail"}},
                         {"stream", {"dump", "check"}},
-                        {"text", {"sort"}}};
+                        {"text", {"sort", "convert", "detect", "chars"}}};
     for (auto const& group : groups) {
         EXPECT_THAT(Run({group.group, "--help"}).out, HasSubstr("Example:"));
         for (char const* verb : group.verbs) {

@@ -34,6 +34,8 @@ constexpr OptionInfo c_options[] = {
     {Option::Zlib, "--zlib", nullptr, nullptr, "the file is compressed, as settings files are"},
     {Option::Locale, "--locale", "L", nullptr, "language and country, such as sv-SE (default: your own)"},
     {Option::Numeric, "--numeric", nullptr, nullptr, "order runs of digits by their value"},
+    {Option::FromEncoding, "--from", "ENC", nullptr, "a charset's name, page:NUMBER, mac:SCRIPT,LANGUAGE or pdfdoc"},
+    {Option::ToEncoding, "--to", "ENC", nullptr, "the same for what is written (default UTF-8, for both)"},
 };
 static_assert(std::size(c_options) == static_cast<size_t>(Option::Count));
 
@@ -44,7 +46,7 @@ static_assert(std::size(c_options) == static_cast<size_t>(Option::Count));
 constexpr GroupInfo c_groups[] = {
     {"archive", "inspect, make and check documents", "kerneltool archive ls drawing.doc"},
     {"stream", "look into property streams", "kerneltool stream dump settings.dat --zlib"},
-    {"text", "work on texts", "kerneltool text sort names.txt --locale sv-SE"},
+    {"text", "convert, sort and look into text", "kerneltool text convert --from mac:0 old.txt"},
 };
 
 std::string Quoted(std::string const& word)
@@ -264,6 +266,33 @@ std::vector<VerbInfo> const& CommandLine::GetVerbs()
          1,
          1,
          RunTextSort},
+        {"text",
+         "convert",
+         "[FILE]",
+         "Convert a file, or standard input, from one encoding to another.",
+         "kerneltool text convert --from page:1252 --to UTF-16LE letter.txt > letter.utf16",
+         {Option::FromEncoding, Option::ToEncoding, Option::Json},
+         0,
+         1,
+         RunTextConvert},
+        {"text",
+         "detect",
+         "FILE",
+         "Tell a file's encoding by its mark or its form, or guess it.",
+         "kerneltool text detect letter.txt",
+         {Option::Json},
+         1,
+         1,
+         RunTextDetect},
+        {"text",
+         "chars",
+         "TEXT",
+         "List the code points of a text with class, bytes and name.",
+         "kerneltool text chars 'naïve'",
+         {Option::Json},
+         1,
+         1,
+         RunTextChars},
     };
     return s_verbs;
 }

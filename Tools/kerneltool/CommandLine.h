@@ -43,10 +43,12 @@ enum class Option
     Zlib,
     Locale,
     Numeric,
+    FromEncoding,
+    ToEncoding,
     Count
 };
 
-/// One option, wherever it is allowed. The parser, the help and the completions read the same row.
+/// One option with one meaning, wherever it is allowed. The parser, the help and the completions read the same row.
 struct OptionInfo
 {
     Option option;

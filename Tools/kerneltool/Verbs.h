@@ -27,5 +27,8 @@ int RunThumbnail(Arguments const& arguments);
 int RunStreamDump(Arguments const& arguments);
 int RunStreamCheck(Arguments const& arguments);
 int RunTextSort(Arguments const& arguments);
+int RunTextConvert(Arguments const& arguments);
+int RunTextDetect(Arguments const& arguments);
+int RunTextChars(Arguments const& arguments);
 
 } // namespace KernelTool

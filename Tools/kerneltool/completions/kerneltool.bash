@@ -15,7 +15,7 @@ _kerneltool()
         case "$prev" in
             archive) words="create put rm ls cat extract info history verify test scratch streamline thumbnail --help" ;;
             stream) words="dump check --help" ;;
-            text) words="sort --help" ;;
+            text) words="sort convert detect chars --help" ;;
         esac
     elif [[ "$cur" == -* ]]; then
         case "${COMP_WORDS[1]}/${COMP_WORDS[2]}" in
@@ -35,6 +35,9 @@ _kerneltool()
             stream/dump) words="--help --zlib --json --progress" ;;
             stream/check) words="--help --zlib --json --progress" ;;
             text/sort) words="--help --locale --numeric --json" ;;
+            text/convert) words="--help --from --to --json" ;;
+            text/detect) words="--help --json" ;;
+            text/chars) words="--help --json" ;;
         esac
     else
         compopt -o filenames 2>/dev/null
