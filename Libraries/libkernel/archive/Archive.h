@@ -307,6 +307,12 @@ public:
                                                  Counted<ArchiveReferenceInfo> const& referenceInfo,
                                                  OpenResult& result);
 
+    /// Opens as Open does, and where the chain of tables cannot be walked or the info block is damaged, at the newest
+    /// state that a search of the file finds. At most what was saved behind that state is lost. Nothing is written; the
+    /// next save makes the state lasting. A master that is reached through a scratch file must be in the state that
+    /// the scratch file names: one that has to be searched gives OpenCorrupt, and can be recovered by its own path.
+    static Counted<Archive> RecoverArchive(String8 const& path, OpenMode mode, IDTag tag, OpenResult& result);
+
     /// Walks header, info block, guard and the chain of tables without making an archive. Both outputs may be null.
     static OpenResult TestArchive(InStreamSeekable& in, IDTag tag, ArchiveHdr* header, ArchiveInfo* info);
     /// The kind of document at @p path, from its first 12 bytes.
@@ -355,6 +361,9 @@ public:
     bool IsDead() const;
     bool IsMainFileDead() const;
     RestoreResult GetLastRestoreResult() const;
+    /// Forgets the failure for which the files could not be opened again, and opens them unless they are not kept open
+    /// and @p openAnyway is false. On success the files count as good again. Waits for a suspension to end.
+    RestoreResult RecoverArchive(bool openAnyway);
     /// Outside a session: reads the file's read-only attribute again; true if it changed.
     bool CheckForReadOnlyChange();
     /// Reads header and info block afresh; true if they differ from those held.

@@ -268,6 +268,24 @@ void ArchiveImpl::DecrementAccessCount()
     CloseFilesIfUnusedCS();
 }
 
+Archive::RestoreResult Archive::RecoverArchive(bool openAnyway)
+{
+    for (;;) {
+        m->WaitWhileSuspended();
+        CriticalSectionScope const lock(m->m_accessLock);
+        if (m->m_suspended) continue; // Again, between the wait and the lock.
+        m->m_lastRestore = RestoreOk;
+        if (!m->m_keepOpen && !openAnyway) return RestoreOk;
+        bool reopened = false;
+        RestoreResult const result = m->OpenFileHandleCS(reopened, false, false);
+        if (result != RestoreOk) return result;
+        CriticalSectionScope const state(m->m_stateLock);
+        for (Counted<ArchiveFile> const& file : {m->m_master, m->m_scratch})
+            if (file) file->m_bad = false;
+        return RestoreOk;
+    }
+}
+
 // The handles.
 
 void ArchiveImpl::CloseFilesCS()
@@ -361,10 +379,13 @@ bool ArchiveImpl::FitsWhatIsHeld(Archive::ArchiveFile& file)
         return false;
     if (found.fileVersion < c_oldestVersion || found.fileVersion > c_version) return false;
     if (found.archiveUID != file.m_archiveUID) return false;
-    if (source.ReadAt(c_infoPos, infoBytes, sizeof(infoBytes)) != sizeof(infoBytes) || !DecodeInfo(infoBytes, info))
+    if (source.ReadAt(c_infoPos, infoBytes, sizeof(infoBytes)) != sizeof(infoBytes) ||
+        DecodeInfo(infoBytes, info) == file.m_infoDamaged)
         return false;
     Archive::ArchiveInfo const& held = file.m_rawInfo;
-    if (file.m_isScratch) {
+    if (file.m_infoDamaged) {
+        // There is nothing to compare but the damage, and the guard below.
+    } else if (file.m_isScratch) {
         if (info.saveTimeStamp < held.saveTimeStamp || info.saveCount < held.saveCount) return false;
     } else if (!(m_keepOpen ? IsEqual(info, held) : IsNoLower(info, held))) {
         return false;

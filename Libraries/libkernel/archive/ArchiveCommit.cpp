@@ -398,6 +398,7 @@ void ArchiveCommit::CopyFields()
     m_file.m_saveCount = m_info.saveCount;
     m_file.m_nextFreeUID = m_info.nextFreeUID;
     m_file.m_rawInfo = m_info;
+    m_file.m_infoDamaged = false;
 }
 
 void ArchiveCommit::AddRevision()

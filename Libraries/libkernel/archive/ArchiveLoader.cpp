@@ -101,9 +101,11 @@ Result CheckVersionAndTag(Archive::ArchiveHdr const& header, IDTag tag)
     return Archive::OpenOk;
 }
 
-/// Reads the table's header at @p position. A table can only point at one that lies before it: a chain that comes back
-/// on itself is damage.
-Result ReadFATHeader(ArchiveSource& source, u64 position, bool newest, FATHeader& header, FATKind const*& kind)
+} // namespace
+
+// A table can only point at one that lies before it: a chain that comes back on itself is damage.
+Result ArchiveLoader::ReadFATHeader(ArchiveSource& source, u64 position, bool newest, FATHeader& header,
+                                    FATKind const*& kind)
 {
     u8 bytes[c_fatHeaderSize];
     if (source.ReadAt(position, bytes, sizeof(bytes)) != sizeof(bytes))
@@ -118,10 +120,10 @@ Result ReadFATHeader(ArchiveSource& source, u64 position, bool newest, FATHeader
     return Archive::OpenOk;
 }
 
-/// True if the file is in the one state that the link names. A power cut can leave an info block that is a mixture of
-/// two commits, and a link must then neither match a newer table nor miss its own. The table at FirstFAT is whole, and
-/// no two commits in a row have the same time stamp, so where the block and its table disagree the table decides.
-bool IsLinkedState(ArchiveSource& source, Archive::ArchiveInfo const& info, ArchiveLoadData const& link)
+// A power cut can leave an info block that is a mixture of two commits; a link must then neither match a newer table
+// nor miss its own. The newest table is whole, and if it alone has the time stamp that the link names, it is the linked
+// one whatever the block says.
+bool ArchiveLoader::IsLinkedState(ArchiveSource& source, Archive::ArchiveInfo const& info, ArchiveLoadData const& link)
 {
     bool const isSame = info.saveTimeStamp == link.linkSaveTimeStamp && info.saveCount == link.linkSaveCount;
     FATHeader newest;
@@ -131,13 +133,15 @@ bool IsLinkedState(ArchiveSource& source, Archive::ArchiveInfo const& info, Arch
     // A compact file is written whole: its save time need not be that of the revision it keeps.
     bool const isCompact = newest.revisionTag == Archive::RevisionTagStreamlined;
     bool const sameTime = isCompact || newest.timeStamp == info.saveTimeStamp;
-    if (newest.fileEnd == info.fileEnd && sameTime) return isSame;
-    return !isCompact && newest.timeStamp == link.linkSaveTimeStamp;
+    if (isSame && newest.fileEnd == info.fileEnd && sameTime) return true;
+    if (isCompact || newest.timeStamp != link.linkSaveTimeStamp || newest.nextFAT == 0) return false;
+    FATHeader previous;
+    return ReadFATHeader(source, newest.nextFAT, false, previous, kind) == Archive::OpenOk &&
+           previous.timeStamp != newest.timeStamp;
 }
 
-} // namespace
-
-Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadData const* expectedLink, Front& front)
+Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadData const* expectedLink, Front& front,
+                                bool tolerant)
 {
     u8 header[c_headerSize];
     if (source.ReadAt(c_headerPos, header, sizeof(header)) != sizeof(header)) return Archive::OpenNotArchive;
@@ -146,16 +150,22 @@ Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadDat
 
     u8 info[c_infoSize];
     if (source.ReadAt(c_infoPos, info, sizeof(info)) != sizeof(info)) return Archive::OpenBadInfo;
-    if (!DecodeInfo(info, front.info)) return Archive::OpenBadInfo;
-    if (expectedLink && !IsLinkedState(source, front.info, *expectedLink)) return Archive::OpenLinkMismatch;
+    if (!DecodeInfo(info, front.info)) {
+        if (!tolerant) return Archive::OpenBadInfo;
+        front.info = {};
+        front.infoDamaged = true;
+    }
+    if (!tolerant && expectedLink && !IsLinkedState(source, front.info, *expectedLink))
+        return Archive::OpenLinkMismatch;
 
     u64 position = c_firstContentPosV7;
     if (front.header.fileVersion >= c_guardVersion) {
         u8 guard[c_guardSize];
         if (source.ReadAt(c_guardPos, guard, sizeof(guard)) != sizeof(guard)) return Archive::OpenBadInfo;
         u32 const guardTag = LoadLittleEndian<u32>(guard);
-        if (guardTag != c_tagGuard && guardTag != c_tagBlock) return Archive::OpenBadInfo;
-        front.writeCounter = LoadLittleEndian<u32>(guard + 4);
+        bool const isGuard = guardTag == c_tagGuard || guardTag == c_tagBlock;
+        if (!isGuard && !tolerant) return Archive::OpenBadInfo;
+        front.writeCounter = isGuard ? LoadLittleEndian<u32>(guard + 4) : 0;
         position = c_firstContentPos;
     }
     if (front.HasLink()) {
@@ -179,10 +189,29 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     Front front;
     if (Result const result = ReadFront(source, tag, data.testLink ? &data : nullptr, front)) return result;
 
+    TakeFront(front, file, data);
+    u32 highestUID = 0;
+    size_t const before = data.revisions.size();
+    Result const result =
+        LoadFATChain(source, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
+    if (result != Archive::OpenOk) {
+        data.files.clear(); // The revisions that held them have gone.
+        return result;
+    }
+
+    bool const hasTable = data.revisions.size() > before;
+    TakeEnd(source, front, hasTable ? data.revisions[data.revisions.size() - before - 1].Get() : nullptr, highestUID,
+            file, data);
+    return Archive::OpenOk;
+}
+
+void ArchiveLoader::TakeFront(Front const& front, Archive::ArchiveFile& file, ArchiveLoadData& data)
+{
     file.m_fileVersion = front.header.fileVersion;
     file.m_flags = front.header.flags;
     file.m_archiveUID = front.header.archiveUID;
     file.m_rawInfo = front.info;
+    file.m_infoDamaged = front.infoDamaged;
     file.m_firstFAT = front.info.firstFAT;
     file.m_fileEnd = front.info.fileEnd;
     file.m_totalBytes = front.info.totalBytes;
@@ -200,23 +229,15 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     data.linkPath = front.linkPath;
     data.linkSaveTimeStamp = front.linkSaveTimeStamp;
     data.linkSaveCount = front.linkSaveCount;
+}
 
-    u32 highestUID = 0;
-    size_t const before = data.revisions.size();
-    Result const result =
-        LoadFATChain(source, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
-    if (result != Archive::OpenOk) {
-        data.files.clear(); // The revisions that held them have gone.
-        return result;
-    }
-
+void ArchiveLoader::TakeEnd(ArchiveSource& source, Front const& front, Archive::Revision const* newest, u32 highestUID,
+                            Archive::ArchiveFile& file, ArchiveLoadData& data)
+{
     // An info block that a crash left half written can lag behind the table it names, or be rubbish; a save that
     // trusted it would write over live bytes or reuse an identifier.
     u64 contentEnd = front.contentPos;
-    if (data.revisions.size() > before) {
-        Archive::Revision const& newest = *data.revisions[data.revisions.size() - before - 1];
-        contentEnd = std::max(contentEnd, newest.m_fatEnd);
-    }
+    if (newest) contentEnd = std::max(contentEnd, newest->m_fatEnd);
     if (file.m_fileEnd < contentEnd || file.m_fileEnd > source.GetSize()) file.m_fileEnd = contentEnd;
     file.m_nextFreeUID = front.info.nextFreeUID;
     if (file.m_nextFreeUID <= highestUID) file.m_nextFreeUID = highestUID == 0xFFFFFFFF ? highestUID : highestUID + 1;
@@ -227,11 +248,10 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
                      LoadLittleEndian<u32>(thumbnails) == c_blockEnd &&
                      LoadLittleEndian<u32>(thumbnails + 4) == c_tagThumbnails;
     file.m_thumbnailsPos = has ? file.m_fileEnd : 0;
-    return Archive::OpenOk;
 }
 
 Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::ArchiveFile> const& file,
-                                   ArchiveLoadData& data, u64 position, u32& highestUID)
+                                   ArchiveLoadData& data, u64 position, u32& highestUID, u64* failedAt)
 {
     // Each table lies whole before the next newer one, as in any append-only log. Without this rule a small file could
     // claim tables that overlap, and take memory by the square of its size.
@@ -240,6 +260,7 @@ Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::Archi
     while (position != 0) {
         FATHeader header;
         FATKind const* kind = nullptr;
+        if (failedAt) *failedAt = position;
         if (Result const result = ReadFATHeader(source, position, newestFirst.empty(), header, kind)) return result;
 
         auto revision = MakeCounted<Archive::Revision>();
@@ -253,7 +274,10 @@ Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::Archi
         revision->m_fatPos = position;
 
         ArchiveTableCursor cursor(source, limit, position + c_fatHeaderSize, header.bodySize);
-        if (Result const result = LoadBody(cursor, header, *kind, *revision, data, highestUID)) return result;
+        if (Result const result = LoadBody(cursor, header, *kind, *revision, data, highestUID)) {
+            if (failedAt && data.contradicts) *failedAt = 0;
+            return result;
+        }
         revision->m_fatEnd = cursor.GetPosition();
         if (kind->tag == c_tagFAT && revision->m_fatEnd != header.fileEnd) return Archive::OpenCorrupt;
         revision->Freeze();
@@ -305,8 +329,10 @@ Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& head
         if (!text) return Archive::OpenCorrupt;
         if (info->m_path.IsEmpty())
             info->m_path = String8(reinterpret_cast<char const*>(text), length);
-        else if (info->m_path.GetLength() != length || std::memcmp(info->m_path.GetData(), text, length) != 0)
+        else if (info->m_path.GetLength() != length || std::memcmp(info->m_path.GetData(), text, length) != 0) {
+            data.contradicts = true;
             return Archive::OpenCorrupt;
+        }
         // Newest first: where two files claim one path the newer one has it.
         data.paths.try_emplace(info->m_path, Counted<Archive::FileInfo>(info));
     }

@@ -175,7 +175,8 @@ Archive::OpenResult ArchiveImpl::TestForReadOnlyArchive(String8 const& path, IDT
 // Follows the chain of links from the file that was asked for to its master. Each file that names a further one moves
 // to the scratch slot, so the chain can have two files at most.
 Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mode, Counted<FileInOutStream> stream,
-                                             Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch)
+                                             Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch,
+                                             bool recover)
 {
     if (path.IsEmpty()) return Archive::OpenBadPath;
     ArchiveLoadData data;
@@ -210,8 +211,8 @@ Archive::OpenResult ArchiveImpl::InitArchive(String8 path, Archive::OpenMode mod
                 scratch = master;
             }
             master = file;
-            if (Archive::OpenResult const result = ArchiveLoader::LoadArchiveFile(*file, m_archiveUID, data))
-                return result;
+            auto const load = recover ? ArchiveLoader::RecoverArchiveFile : ArchiveLoader::LoadArchiveFile;
+            if (Archive::OpenResult const result = load(*file, m_archiveUID, data)) return result;
             if (!linked) m_archiveUID = file->m_archiveUID;
 
             if (!scratch && referenceInfo) {
@@ -279,6 +280,12 @@ Counted<Archive> Archive::Open(String8 const& path, OpenMode mode, IDTag tag, Op
     Counted<Archive> const archive = ArchiveImpl::MakeArchive(tag);
     archive->m->m_adornerFactory = std::move(adornerFactory);
     return Finish(archive, archive->m->InitArchive(path, mode, nullptr, referenceInfo), result);
+}
+
+Counted<Archive> Archive::RecoverArchive(String8 const& path, OpenMode mode, IDTag tag, OpenResult& result)
+{
+    Counted<Archive> const archive = ArchiveImpl::MakeArchive(tag);
+    return Finish(archive, archive->m->InitArchive(path, mode, nullptr, nullptr, false, true), result);
 }
 
 Counted<Archive> Archive::OpenAsScratch(String8 const& path, IDTag tag, OpenResult& result)

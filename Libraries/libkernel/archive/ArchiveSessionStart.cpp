@@ -14,12 +14,17 @@ using namespace ArchiveFormat;
 
 namespace {
 
-/// A scratch file knows its master by the stamp of its save, even where a torn info block shows the older save count;
-/// so two saves of one second get two stamps, in order. A clock that was set back further differs by itself.
-void TellApart(TimeStamp& stamp, TimeStamp const& last)
+/// The time stamp of a session of an archive with a scratch file. The scratch file knows its master by the stamp of its
+/// save, even where a torn info block shows the older save count; and tables that an earlier scratch state left behind
+/// are told from live ones by being older than the link. So a save of the master comes later than everything before it,
+/// though it be in the same second, and one of the scratch file never earlier than its link. A clock that was set back
+/// further than a burst of saves differs by itself.
+TimeStamp StampOf(bool isMaster, TimeStamp const& last, TimeStamp const& link)
 {
     constexpr i64 c_burstSeconds = 60;
-    if (stamp <= last && stamp > last - c_burstSeconds) stamp = last + 1;
+    TimeStamp const now = TimeStamp::GetCurrent();
+    if (!isMaster) return std::max(now, link);
+    return now <= last && now > last - c_burstSeconds ? last + 1 : now;
 }
 
 } // namespace
@@ -130,7 +135,12 @@ Archive::CreateSessionResult ArchiveImpl::TryCreateSession(ArchiveSessionHandle&
             auto revision = MakeCounted<Archive::Revision>();
             revision->m_file = file;
             revision->m_timeStamp = TimeStamp::GetCurrent();
-            if (choice == Archive::ChoiceMaster && m_scratch) TellApart(revision->m_timeStamp, file->m_saveTimeStamp);
+            if (m_scratch) {
+                CriticalSectionScope const lock(m_stateLock);
+                TimeStamp last = file->m_saveTimeStamp;
+                if (!m_revisions.empty()) last = std::max(last, m_revisions.back()->m_timeStamp);
+                revision->m_timeStamp = StampOf(choice == Archive::ChoiceMaster, last, m_scratch->m_linkSaveTimeStamp);
+            }
             revision->m_tag =
                 type == Archive::SessionTypeIncremental ? Archive::RevisionTagIncremental : Archive::RevisionTagFull;
             CriticalSectionScope const lock(file->m_lock);
@@ -182,8 +192,9 @@ bool ArchiveImpl::HasHeldInfo(Archive::ArchiveFile& file) const
     EncodeInfo(held, file.m_rawInfo);
     CriticalSectionScope const lock(file.m_lock);
     try {
-        return file.m_stream && file.m_stream->ReadAt(c_infoPos, found, sizeof(found)) == sizeof(found) &&
-               std::memcmp(held, found, sizeof(held)) == 0;
+        if (!file.m_stream || file.m_stream->ReadAt(c_infoPos, found, sizeof(found)) != sizeof(found)) return false;
+        Archive::ArchiveInfo ignored;
+        return file.m_infoDamaged ? !DecodeInfo(found, ignored) : std::memcmp(held, found, sizeof(held)) == 0;
     } catch (FileIOException const&) {
         return false;
     }

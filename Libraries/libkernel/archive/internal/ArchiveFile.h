@@ -58,6 +58,7 @@ public:
     u32 m_writeCounter = 0;
     bool m_guardMayBeAhead = false;      // The last step of the guard failed, yet its bytes may have arrived.
     std::atomic<u64> m_thumbnailsPos{0}; // 0: there are none.
+    bool m_infoDamaged = false;          // The info block on disk is unreadable; the next commit writes a good one.
     Archive::ArchiveInfo m_rawInfo;      // As the info block has it, for the comparison when the handle is reopened.
     bool m_hasLink = false;
     String8 m_linkPath;

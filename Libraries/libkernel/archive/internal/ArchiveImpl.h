@@ -41,6 +41,7 @@ struct ArchiveLoadData
     String8 linkPath;
     TimeStamp linkSaveTimeStamp;
     u32 linkSaveCount = 0;
+    bool contradicts = false; // Two tables name one file differently.
 };
 
 /// Bytes at a position, from whatever an archive is read out of.
@@ -75,18 +76,37 @@ public:
         u32 linkSaveCount = 0;
         String8 linkPath;
         String8 referencePath;
-        u64 contentPos = 0; ///< Where the first block may lie.
+        u64 contentPos = 0;       ///< Where the first block may lie.
+        bool infoDamaged = false; ///< The info block is unreadable; its fields are 0.
 
         bool HasLink() const { return header.flags & ArchiveFormat::c_flagLink; }
         bool HasReference() const { return header.flags & ArchiveFormat::c_flagReference; }
     };
-    /// Reads it. @p expectedLink, if not null, is the link through which the file was reached.
+    /// Reads it. @p expectedLink, if not null, is the link through which the file was reached. With @p tolerant a
+    /// damaged info block or guard is no failure.
     static Archive::OpenResult ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadData const* expectedLink,
-                                         Front& front);
+                                         Front& front, bool tolerant = false);
+    /// True if a file with that info block is in the one state that the link in @p link names.
+    static bool IsLinkedState(ArchiveSource& source, Archive::ArchiveInfo const& info, ArchiveLoadData const& link);
+    /// LoadArchiveFile for a file whose chain cannot be walked: the newest chain that a search of the file finds.
+    static Archive::OpenResult RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, ArchiveLoadData& data);
+    /// Reads the table's header at @p position, and finds its kind.
+    static Archive::OpenResult ReadFATHeader(ArchiveSource& source, u64 position, bool newest,
+                                             ArchiveFormat::FATHeader& header, ArchiveFormat::FATKind const*& kind);
+
+    /// The walk of LoadArchiveFile without the front: the chain of tables from @p position on. On a failure
+    /// @p failedAt is the table that could not be read, or 0 where two tables contradict each other.
+    static Archive::OpenResult LoadFATChain(ArchiveSource& source, Counted<Archive::ArchiveFile> const& file,
+                                            ArchiveLoadData& data, u64 position, u32& highestUID,
+                                            u64* failedAt = nullptr);
+    /// Sets the fields of @p file and @p data that come from the front.
+    static void TakeFront(Front const& front, Archive::ArchiveFile& file, ArchiveLoadData& data);
+    /// Sets the end of the content, the next free identifier and the place of the thumbnails, raised from the tables;
+    /// @p newest is null for a file without tables.
+    static void TakeEnd(ArchiveSource& source, Front const& front, Archive::Revision const* newest, u32 highestUID,
+                        Archive::ArchiveFile& file, ArchiveLoadData& data);
 
 private:
-    static Archive::OpenResult LoadFATChain(ArchiveSource& source, Counted<Archive::ArchiveFile> const& file,
-                                            ArchiveLoadData& data, u64 position, u32& highestUID);
     static Archive::OpenResult LoadBody(class ArchiveTableCursor& cursor, ArchiveFormat::FATHeader const& header,
                                         ArchiveFormat::FATKind const& kind, Archive::Revision& revision,
                                         ArchiveLoadData& data, u32& highestUID);
@@ -179,7 +199,8 @@ struct ArchiveImpl
     /// With @p asScratch a file that turns out to have no master goes to the scratch slot. After a failure the archive
     /// is as it was.
     Archive::OpenResult InitArchive(String8 path, Archive::OpenMode mode, Counted<FileInOutStream> stream,
-                                    Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch = false);
+                                    Counted<ArchiveReferenceInfo> const& referenceInfo, bool asScratch = false,
+                                    bool recover = false);
     void TakeOver(ArchiveLoadData& data, Counted<Archive::ArchiveFile> master, Counted<Archive::ArchiveFile> scratch);
     /// Moves the only file of an archive that nobody else knows yet to the scratch slot.
     void MakeJustScratch();
