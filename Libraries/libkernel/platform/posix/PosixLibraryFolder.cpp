@@ -1,5 +1,4 @@
 #include "libkernel/platform/LibraryFolder.h"
-
 #include "libkernel/platform/PlatformFile.h"
 
 #include <cstring>
