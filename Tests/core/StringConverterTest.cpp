@@ -51,6 +51,17 @@ TEST(StringConverter, OneConverterServesManyTexts)
     EXPECT_EQ(converter.Convert("a"), "a");
 }
 
+TEST(StringConverter, SurrogatesWithoutPartnerAreReplaced)
+{
+    // One unit in the compressed scheme's Unicode mode, and in the middle and at the end of UTF-7.
+    EXPECT_EQ(EncodedToUtf8("\x0E\xD8\x3D"
+                            "a",
+                            "SCSU"),
+              "\uFFFDa");
+    EXPECT_EQ(EncodedToUtf8("+2D0-a", "UTF-7"), "\uFFFDa");
+    EXPECT_EQ(EncodedToUtf16("a+2D0-", "UTF-7"), String16(u"a\uFFFD"));
+}
+
 TEST(StringConverter, UnknownCharsetsAndCutTextsHaveTheirAnswers)
 {
     EXPECT_EQ(StringConverter("no such").Convert("a\u20AC"), "a\u20AC");

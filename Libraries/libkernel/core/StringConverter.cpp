@@ -48,6 +48,19 @@ String8 TakeUtf8(char const* text, int n)
     return n > 0 ? String8(text, CharTraits<TEncUtf8>::GetValidLength(text, n, true)) : String8();
 }
 
+// Some converters, those of SCSU and UTF-7 among them, let surrogates without a partner through.
+void MendSurrogates(String16& text)
+{
+    int const n = text.GetLength();
+    int i = CharTraits<TEncUtf16>::GetValidLength(text.GetData(), n, true);
+    if (i == n) return;
+    char16_t* const units = text.GetWritable();
+    while (i < n) {
+        units[i++] = 0xFFFD;
+        i += CharTraits<TEncUtf16>::GetValidLength(units + i, n - i, true);
+    }
+}
+
 String16 FromConverter(UConverter* converter, char const* text, int n)
 {
     if (n <= 0) return {};
@@ -58,7 +71,9 @@ String16 FromConverter(UConverter* converter, char const* text, int n)
     String16 result;
     status = U_ZERO_ERROR;
     ucnv_toUChars(converter, result.SetLength(length), length, text, n, &status);
-    return U_FAILURE(status) ? String16() : result;
+    if (U_FAILURE(status)) return {};
+    MendSurrogates(result);
+    return result;
 }
 
 template <class T, class F>
@@ -71,7 +86,6 @@ T EmptyWithoutMemory(F work)
     }
 }
 
-// ICU's own converter gives well-formed text, but for a converter that lets surrogates through.
 String8 ToUtf8(String16 const& text)
 {
     return ConvertedTo<TEncUtf8>(text);
@@ -211,6 +225,7 @@ String8 IcuLoadTextFile(String8 const& path, String8 const& charset)
                                          static_cast<int>(room), bytes.get(), static_cast<int>(size), &status);
         if (U_FAILURE(status)) return {};
         text.SetLength(length);
+        MendSurrogates(text);
         return CanonicaliseLineEnds(ToUtf8(text));
     });
 }
