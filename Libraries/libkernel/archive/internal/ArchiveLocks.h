@@ -19,6 +19,11 @@
 // which starts from the state, notes what it needs under the state lock, lets go, reads the file, and takes the state
 // lock again to publish. Reading never takes the session lock: what it asked there (has the file been moved away, is a
 // session active) is answered under the access and state locks.
+//
+// A streamline holds the session lock throughout, and keeps readers out by a gate (ArchiveReadGate), which is a counter
+// under the state lock and no lock itself: whoever waits at it holds nothing of the archive. While it puts a new file in
+// the master's place it holds the access lock, so that nobody opens what is just being moved. Owners of holders are told
+// afterwards, with only the session lock and the gate held.
 
 namespace Kernel {
 
