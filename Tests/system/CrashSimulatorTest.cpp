@@ -1,3 +1,6 @@
+#include "libkernel/archive/ArchiveStreamline.h"
+#include "libkernel/filesystem/TempFile.h"
+#include "libkernel/platform/PlatformFile.h"
 #include "support/ArchiveFixture.h"
 #include "support/CrashImages.h"
 #include "support/FakeClock.h"
@@ -213,7 +216,8 @@ std::string CheckTrace(MemoryDisk::Recording const& recording, std::string const
     return infos == 1 ? "" : "the info block was written " + std::to_string(infos) + " times";
 }
 
-constexpr size_t c_scratchSave = 6; // In the list above.
+constexpr size_t c_delete = 4; // In the list above.
+constexpr size_t c_scratchSave = 6;
 
 struct Figures
 {
@@ -540,6 +544,81 @@ TEST_F(CrashSimulatorTest, EveryPowerCutOfAReplacementLeavesAWholeDocument)
         ASSERT_TRUE(!returned || image.size() == 1) << image.size();
     });
     EXPECT_GT(images, 20u);
+}
+
+// Streamlining after every operation, on both roads. Either a whole document is at its path, or it says of itself that
+// it was being written over, or it is missing; and then a whole one lies elsewhere.
+TEST_F(CrashSimulatorTest, EveryPowerCutOfAStreamlineLeavesAWholeDocument)
+{
+    Platform::GetFileCalls().makeFolder("/ram/tmp");
+    Platform::GetFileCalls().makeFolder("/ram/tmp/second");
+    std::vector<String8> rescued;
+    TempFile::SetTempPath("/ram/tmp", "/ram/tmp/second", rescued);
+    u64 images = 0;
+    u64 missing = 0;
+    u64 marked = 0;
+    auto const isWhole = [](Image const& image, Items const& items) {
+        return std::any_of(image.begin(), image.end(), [&](auto const& file) {
+            return file.first != c_master && file.first != c_scratch && Look(file.first).items == items;
+        });
+    };
+    for (bool const withScratch : {false, true}) {
+        for (Operation const& operation : GetOperations()) {
+            if (operation.needsScratchFile && !withScratch) continue;
+            Image start = MakeDocument(withScratch);
+            Image before;
+            Record(operation, 1, start, before);
+            Record(GetOperations()[c_delete], 2, before, start); // So that there is always something to drop.
+            for (bool const overwrite : {false, true}) {
+                SCOPED_TRACE(std::string(operation.name) + (overwrite ? " overwrite" : "") +
+                             (withScratch ? " with scratch" : ""));
+                before = start;
+                Image after;
+                Operation const streamline = {"streamline", false, [](int) {},
+                                              [&](int) {
+                                                  Counted<Archive> const archive = OpenDocument(DocumentPath());
+                                                  archive->SetAlwaysStreamlineOverwrite(overwrite);
+                                                  ASSERT_EQ(archive->Streamline(nullptr, nullptr, nullptr),
+                                                            Archive::StreamlineDone);
+                                              }};
+                MemoryDisk::Recording const recording = Record(streamline, 3, before, after);
+                m_disk.Load(before);
+                View const oldMaster = Look(c_master);
+                View const oldPair = withScratch ? Look(c_scratch) : oldMaster;
+                m_disk.Load(after);
+                View const fresh = Look(c_master);
+                ASSERT_TRUE(fresh.IsOpen() && fresh.revisions == 1 && fresh.items == oldPair.items) << Describe(fresh);
+                ASSERT_EQ(after.size(), withScratch ? 2u : 1u);
+                std::unordered_set<u64> seen;
+                TestSupport::ForEachCrashImage(recording, m_plan, [&](Image const& image, u64 steps) {
+                    bool const returned = steps == recording.steps.size();
+                    if (HasFatalFailure() || !seen.insert(TestSupport::HashImage(image) * 2 + returned).second) return;
+                    ++images;
+                    m_disk.Load(image);
+                    View const master = Look(c_master);
+                    bool const isMarked = overwrite && !returned && Archive::IsMidStreamlineFile(Str(c_master));
+                    missing += master.result == Archive::OpenNotFound;
+                    marked += isMarked;
+                    if (isMarked || master.result == Archive::OpenNotFound) {
+                        ASSERT_TRUE(!returned && isWhole(image, fresh.items)) << "behind step " << steps;
+                        return;
+                    }
+                    bool const isOld = !returned && master.IsSame(oldMaster);
+                    ASSERT_TRUE(isOld || master.IsSame(fresh)) << steps << ": " << Describe(master);
+                    if (!withScratch) return;
+                    View const pair = Look(c_scratch);
+                    ASSERT_TRUE(pair.items == oldPair.items || (!pair.IsOpen() && !isOld))
+                        << steps << ": " << Describe(pair);
+                });
+                ASSERT_FALSE(HasFatalFailure());
+            }
+        }
+    }
+    std::printf("streamlining: %llu distinct images, %llu with the document under another name, %llu marked\n",
+                static_cast<unsigned long long>(images), static_cast<unsigned long long>(missing),
+                static_cast<unsigned long long>(marked));
+    EXPECT_GT(missing, 0u);
+    EXPECT_GT(marked, 0u);
 }
 
 // The simulator is only as good as the mistakes it finds: each of these is planted into a record of what was done.
