@@ -412,7 +412,7 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
         std::vector<char const*> verbs;
     } const groups[] = {{"archive",
                          {"create", "put", "rm", "ls", "cat", "extract", "info", "history", "verify", "test", "scratch",
-                          "streamline", "thumbnail"}},
+                          "recover", "streamline", "thumbnail"}},
                         {"stream", {"dump", "check"}},
                         {"text", {"sort", "convert", "detect", "chars"}}};
     for (auto const& group : groups) {
@@ -428,6 +428,30 @@ TEST_F(KernelToolTest, EveryVerbAndOptionIsDocumented)
             }
         }
     }
+}
+
+TEST_F(KernelToolTest, RecoverFindsTheNewestStateAndWritesASoundCopy)
+{
+    std::string const copy = m_folder / "copy";
+    Json const sound = RunJson({"archive", "recover", m_doc});
+    EXPECT_EQ(KeysOf(sound), (std::vector<std::string>{"recovered", "path", "openResult", "revisions", "items", "to",
+                                                       "checked", "damaged"}));
+    EXPECT_EQ(sound["openResult"], 0);
+    std::string file = ReadWhole(m_doc);
+    file.replace(12, 52, std::string(52, 'x'));
+    WriteWhole(m_doc, file);
+    EXPECT_EQ(Run({"archive", "ls", m_doc}).status, 1);
+    Json const found = RunJson({"archive", "recover", m_doc, "--to", copy});
+    EXPECT_EQ(found["openResult"], 13);
+    EXPECT_EQ(found["items"], sound["items"]);
+    EXPECT_EQ(ReadWhole(m_doc), file);
+    EXPECT_EQ(Run({"archive", "verify", copy}).status, 0);
+    EXPECT_EQ(RunJson({"archive", "info", copy})["items"], sound["items"]);
+    EXPECT_EQ(Run({"archive", "recover", m_doc, "--to", copy}).status, 1); // It stands there already.
+    WriteWhole(m_doc, file.substr(0, 80));
+    ToolResult const lost = Run({"archive", "recover", m_doc});
+    EXPECT_EQ(lost.status, 1);
+    EXPECT_THAT(lost.err, HasSubstr("OpenCorrupt (12)"));
 }
 
 TEST_F(KernelToolTest, StreamlineLeavesTheItemsAndDropsTheRest)

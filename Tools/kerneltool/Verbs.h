@@ -22,6 +22,7 @@ int RunHistory(Arguments const& arguments);
 int RunVerify(Arguments const& arguments);
 int RunTest(Arguments const& arguments);
 int RunScratch(Arguments const& arguments);
+int RunRecover(Arguments const& arguments);
 int RunStreamline(Arguments const& arguments);
 int RunThumbnail(Arguments const& arguments);
 int RunStreamDump(Arguments const& arguments);

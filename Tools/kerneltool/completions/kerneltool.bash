@@ -13,7 +13,7 @@ _kerneltool()
         words="archive stream text --help --version"
     elif [ "$COMP_CWORD" -eq 2 ]; then
         case "$prev" in
-            archive) words="create put rm ls cat extract info history verify test scratch streamline thumbnail --help" ;;
+            archive) words="create put rm ls cat extract info history verify test scratch recover streamline thumbnail --help" ;;
             stream) words="dump check --help" ;;
             text) words="sort convert detect chars --help" ;;
         esac
@@ -30,6 +30,7 @@ _kerneltool()
             archive/verify) words="--help --at --json --progress" ;;
             archive/test) words="--help --json --progress" ;;
             archive/scratch) words="--help --json --progress" ;;
+            archive/recover) words="--help --to --json --progress" ;;
             archive/streamline) words="--help --to --overwrite --no-verify --json --progress" ;;
             archive/thumbnail) words="--help --set --get --json --progress" ;;
             stream/dump) words="--help --zlib --json --progress" ;;
