@@ -153,7 +153,7 @@ Base64OutStream::~Base64OutStream()
     FlushTail();
 }
 
-bool Base64OutStream::Encode(OutStream& target, char const* from, u32 count)
+bool Base64OutStream::FlushBase64(OutStream& target, char const* from, u32 count)
 {
     char text[EncodedSize(c_rawBlockSize)];
     u64 const length = EncodedSize(count);

@@ -36,7 +36,8 @@ public:
 
 private:
     ~Base64OutStream() override;
-    bool Encode(OutStream& target, char const* from, u32 count) override;
+    bool Encode(OutStream& target, char const* from, u32 count) override { return FlushBase64(target, from, count); }
+    bool FlushBase64(OutStream& target, char const* from, u32 count);
 };
 
 } // namespace Kernel

@@ -82,7 +82,7 @@ Base85OutStream::~Base85OutStream()
     FlushTail();
 }
 
-bool Base85OutStream::Encode(OutStream& target, char const* from, u32 count)
+bool Base85OutStream::FlushBase85(OutStream& target, char const* from, u32 count)
 {
     return EncodeSlices(target, from, static_cast<int>(count), m_column, m_lineMode);
 }

@@ -37,7 +37,8 @@ public:
 
 private:
     ~Base85OutStream() override;
-    bool Encode(OutStream& target, char const* from, u32 count) override;
+    bool Encode(OutStream& target, char const* from, u32 count) override { return FlushBase85(target, from, count); }
+    bool FlushBase85(OutStream& target, char const* from, u32 count);
 
     int const m_lineMode;
     int m_column = 0;
