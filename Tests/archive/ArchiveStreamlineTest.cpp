@@ -430,6 +430,34 @@ TEST_P(ArchiveStreamlineRoadTest, ReadersOnOtherThreadsNeverNotice)
     EXPECT_EQ(GetAll(*m_archive), items);
 }
 
+// Another document's save takes stored bytes from here; they move between the queueing of the copy and its turn.
+TEST_P(ArchiveStreamlineRoadTest, SaveElsewhereThatCopiesFromTheDocumentFindsTheBytesWhereTheyAreNow)
+{
+    Make();
+    Counted<Archive> const other = CreateDocument(m_folder / "other");
+    Counted<DelayLoadHolder> const holder =
+        m_archive->CreateDelayLoadHolderDirect(Str("b"), &BytesItem::c_type, nullptr);
+    ArchiveSessionHandle handle;
+    ASSERT_TRUE(other->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    handle->AddSourceArchive(m_archive);
+    handle->AssignDelayLoadHolderPath(holder, Str("copied"));
+    class BetweenQueueAndCopy : public ArchiveSessionProgress
+    {
+    public:
+        void OnProgress(u32 done, u32) override
+        {
+            if (done == 0) run();
+        }
+        std::function<void()> run;
+    };
+    auto const progress = MakeCounted<BetweenQueueAndCopy>();
+    progress->run = [&] { ASSERT_EQ(Run(*m_archive, false), Archive::StreamlineDone); };
+    handle->SetProgressCallback(progress);
+    handle->CreateFile(holder);
+    other->CloseSession(handle, false);
+    EXPECT_EQ(GetAll(*other), (Items{{"copied", std::string(300'000, 'b')}}));
+}
+
 TEST_F(ArchiveStreamlineTest, RewoundArchiveKeepsWhatItShows)
 {
     Make();

@@ -1,4 +1,5 @@
 #include "libkernel/archive/internal/ArchiveBackData.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/archive/internal/ArchiveSessionState.h"
 #include "libkernel/core/BuildNumber.h"
 #include "libkernel/core/Endian.h"
@@ -218,19 +219,25 @@ void ArchiveSession::State::CopyStored(ArchiveQueueEntry const& queued)
     Archive::FileRevision source;
     Counted<FileInOutStream> stream;
     Counted<FileStoreBackData const> backData = queued.sourceBackData;
+    std::optional<ArchiveReadGate> gate; // Held over the copy: a streamline of the source would move its bytes.
     if (!backData) {
+        ArchiveImpl& from = *queued.sourceArchive->m;
+        gate.emplace(from);
         String8 sourcePath;
         if (!queued.holder->GetPath(*queued.sourceArchive, sourcePath)) return;
-        ArchiveImpl& from = *queued.sourceArchive->m;
+        // One since the copy was queued has moved the holder on.
+        NonCounted<FileStoreRevision const> present = queued.sourceRevision.Get();
+        queued.holder->IsBackedBy(*queued.sourceArchive, present);
         Counted<Archive::ArchiveFile> sourceFile;
         {
             CriticalSectionScope const scope(from.m_stateLock);
-            // Streamlined away since the copy was queued: to leave the file out without a word would lose it.
-            if (!from.AsRevisionCS(queued.sourceRevision.Get())) throw OutStream::WriteException();
+            Archive::Revision const* at = from.AsRevisionCS(queued.sourceRevision.Get());
+            if (!at) at = from.AsRevisionCS(present);
+            // To leave the file out without a word would lose it.
+            if (!at) throw OutStream::WriteException();
             Archive::FileInfo* const info = from.FindFileInfoCS(sourcePath);
             Archive::Revision* where = nullptr;
-            Archive::FileRevision* const found =
-                info ? from.FindEntryCS(*info, *queued.sourceRevision, &where) : nullptr;
+            Archive::FileRevision* const found = info ? from.FindEntryCS(*info, *at, &where) : nullptr;
             if (!found || found->IsDeletion()) return;
             source = *found;
             sourceFile = where->m_file;

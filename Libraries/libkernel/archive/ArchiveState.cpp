@@ -1,4 +1,4 @@
-#include "libkernel/archive/internal/ArchiveImpl.h"
+#include "libkernel/archive/internal/ArchiveReadGate.h"
 #include "libkernel/filesystem/FileSystem.h"
 #include "libkernel/streams/FileIOException.h"
 
@@ -161,6 +161,7 @@ bool Archive::CheckForReadOnlyChange()
 
 bool Archive::CheckForReplacedFile()
 {
+    ArchiveReadGate const gate(*m); // A streamline has the path empty for a moment.
     String8 path;
     ArchiveInfo held;
     IDTag tag;
