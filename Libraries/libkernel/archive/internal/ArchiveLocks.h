@@ -21,9 +21,9 @@
 // session active) is answered under the access and state locks.
 //
 // A streamline holds the session lock throughout, and keeps readers out by a gate (ArchiveReadGate), which is a counter
-// under the state lock and no lock itself: whoever waits at it holds nothing of the archive. While it puts a new file in
-// the master's place it holds the access lock, so that nobody opens what is just being moved. Owners of holders are told
-// afterwards, with only the session lock and the gate held.
+// under the state lock and no lock itself: whoever waits at it holds nothing of the archive. While it puts a new file
+// in the master's place it holds the access lock, so that nobody opens what is just being moved. Owners of holders are
+// told afterwards, with only the session lock and the gate held.
 
 namespace Kernel {
 
