@@ -2,7 +2,9 @@
 
 #include "libkernel/core/Types.h"
 
+#include <algorithm>
 #include <cstring>
+#include <limits>
 #include <type_traits>
 
 namespace Kernel {
@@ -24,13 +26,15 @@ struct BaseCharTraits
         }
     }
 
+    /// Copies @p n units, which must not overlap; a length below 1 copies nothing.
     static void Copy(T* dst, T const* src, int n)
     {
         if (n > 0) std::memcpy(dst, src, static_cast<size_t>(n) * sizeof(T));
     }
 
     /// Difference of the first differing units, or n minus m. Units of char compare as signed bytes, so that bytes
-    /// above 127 sort before ASCII.
+    /// above 127 sort before ASCII. A difference that does not fit into 32 bits is the nearest number that does; that
+    /// of two code points always fits.
     static int Compare(T const* a, int n, T const* b, int m)
     {
         int const common = n < m ? n : m;
@@ -40,6 +44,7 @@ struct BaseCharTraits
     static int Compare(T const* a, int n, T const* b) { return Compare(a, n, b, GetLength(b)); }
     static int Compare(T const* a, T const* b) { return Compare(a, GetLength(a), b, GetLength(b)); }
 
+    /// True if both have the same length and the same units; without @p m, @p b ends at its terminator.
     static bool IsEqual(T const* a, int n, T const* b, int m)
     {
         return n == m && (n <= 0 || std::memcmp(a, b, static_cast<size_t>(n) * sizeof(T)) == 0);
@@ -56,6 +61,7 @@ struct BaseCharTraits
             if (IsEqual(s + i + 1, m - 1, needle + 1, m - 1)) return i;
         return -1;
     }
+    /// Index of the first such unit at or after @p start, or -1.
     static int Find(T const* s, int n, T unit, int start)
     {
         if (start < 0) start = 0;
@@ -84,24 +90,28 @@ struct BaseCharTraits
         return h;
     }
 
+    /// The space, and nothing else.
     static bool IsSpace(T c) { return c == 32; }
     /// Space, tab or line feed; a carriage return is not white space here.
     static bool IsWhiteSpace(T c) { return c == 32 || c == 9 || c == 10; }
 
-    /// Removes leading IsWhiteSpace units in place and terminates; the new length.
+    /// Removes leading IsWhiteSpace units in place; the new length. Where something was removed a terminator stands
+    /// behind what is left; no unit outside the @p n is touched.
     static int TrimLeft(T* s, int n)
     {
         int first = 0;
         while (first < n && IsWhiteSpace(s[first])) ++first;
+        if (first == 0) return n;
         std::memmove(s, s + first, static_cast<size_t>(n - first) * sizeof(T));
         s[n - first] = 0;
         return n - first;
     }
-    /// Removes trailing IsWhiteSpace units in place and terminates; the new length.
+    /// Removes trailing IsWhiteSpace units, likewise.
     static int TrimRight(T* s, int n)
     {
+        int const old = n;
         while (n > 0 && IsWhiteSpace(s[n - 1])) --n;
-        s[n] = 0;
+        if (n < old) s[n] = 0;
         return n;
     }
 
@@ -120,10 +130,11 @@ private:
     {
         if constexpr (sizeof(T) == 1)
             return static_cast<signed char>(a) - static_cast<signed char>(b);
-        else if constexpr (sizeof(T) == 2)
-            return static_cast<int>(a) - static_cast<int>(b);
-        else
-            return a < b ? -1 : 1; // The difference of two 32-bit units does not fit.
+        else {
+            i64 const difference = static_cast<i64>(a) - static_cast<i64>(b);
+            return static_cast<int>(
+                std::clamp<i64>(difference, std::numeric_limits<int>::min(), std::numeric_limits<int>::max()));
+        }
     }
 };
 
