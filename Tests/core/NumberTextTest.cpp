@@ -1,6 +1,7 @@
 #include "libkernel/core/NumberText.h"
 
 #include <gtest/gtest.h>
+#include <limits>
 #include <random>
 
 namespace Kernel {
@@ -72,6 +73,10 @@ TEST(NumberTextTest, EveryWidthShowsItsLimits)
     EXPECT_EQ(ToString(UINT32_MAX), "4294967295");
     EXPECT_EQ(ToString(INT64_MIN), "-9223372036854775808");
     EXPECT_EQ(ToString(UINT64_MAX), "18446744073709551615");
+    EXPECT_EQ(ToString(std::numeric_limits<long>::min()), "-9223372036854775808");
+    EXPECT_EQ(ToString(std::numeric_limits<unsigned long>::max()), "18446744073709551615");
+    EXPECT_EQ(ToString(std::numeric_limits<long long>::max()), "9223372036854775807");
+    EXPECT_EQ(ToString(std::numeric_limits<unsigned long long>::max()), "18446744073709551615");
     EXPECT_EQ(ToStringNumber(INT64_MIN), "-9,223,372,036,854,775,808");
     EXPECT_EQ(ToStringT<String16>(-12), u"-12");
     unsigned int const wide[] = {'1', ',', '2', '3', '4', 0};
@@ -129,7 +134,7 @@ TEST(NumberTextTest, FieldsAreFilled)
 
 TEST(NumberTextTest, OtherBases)
 {
-    EXPECT_EQ(ToStringTBase<String8>(255u, 16, true), "FF");
+    EXPECT_EQ(ToStringTBase(255u, 16, true), "FF") << "without a string type";
     EXPECT_EQ(ToStringBase(0u, 2, false), "0");
     EXPECT_EQ(ToStringBase(UINT64_MAX, 2, false), String8(std::string(64, '1').c_str()));
     EXPECT_EQ(ToStringBase(35u, 36, false), "z");

@@ -80,7 +80,7 @@ String8 ToString(T value)
 
 /// For traces: as printf has "%*.*f" for magnitudes from 0.001 to below 1e6, and "%*.*e" for all others. Every decimal
 /// asked for is there. Throws std::bad_alloc for a text of 2^31 units or more.
-template <class S>
+template <class S = String8>
 S ToStringDebugT(double value, u32 precision, u32 width)
 {
     return DoubleTextDetail::DebugText<S>(value, precision, width);

@@ -11,7 +11,7 @@ namespace Kernel {
 /// @p maxDenominator parts. Lowest terms are sought from max(@p minDenominator, 2) on by doubling; where none of these
 /// denominators gives the value exactly, the fraction stays in @p maxDenominator parts. @p sign goes before the whole
 /// number, or before the fraction if there is none.
-template <class S>
+template <class S = String8>
 S ToStringImperialT(double value, u32 maxDenominator, u32 minDenominator, SignStyle sign);
 inline String8 ToStringImperial(double value, u32 maxDenominator, u32 minDenominator, SignStyle sign)
 {
@@ -20,7 +20,7 @@ inline String8 ToStringImperial(double value, u32 maxDenominator, u32 minDenomin
 
 /// The same in eighths, with one character for the fraction (U+00BC to U+00BE, U+215B to U+215E) straight behind the
 /// whole number.
-template <class S>
+template <class S = String8>
 S ToStringImperialSpecialT(double value, SignStyle sign);
 inline String8 ToStringImperialSpecial(double value, SignStyle sign)
 {
@@ -36,14 +36,14 @@ KERNEL_API bool ToStringImperialSpecialWillBeApproximate(double value, u32 extra
 /// are those of the number of points, as ToString has them, of which sign and padding do not show. A fraction of a
 /// point stands behind the points, "1p6.25", unless it is 0. The sign stands before the picas, so it is lost where
 /// there are none: -0.5 gives "0p6".
-template <class S>
+template <class S = String8>
 S ToPicaStringT(double value, u32 precision, u32 width, SignStyle sign, TruncateStyle truncate);
 inline String8 ToPicaString(double value, u32 precision, u32 width, SignStyle sign, TruncateStyle truncate)
 {
     return ToPicaStringT<String8>(value, precision, width, sign, truncate);
 }
 /// Precision 6, width 3, no sign before positive numbers, one decimal kept.
-template <class S>
+template <class S = String8>
 S ToPicaStringT(double value)
 {
     return ToPicaStringT<S>(value, 6, 3, SignStyle::None, TruncateStyle::KeepOne);

@@ -8,7 +8,8 @@
 namespace Kernel {
 
 // Whole numbers as text. Each operation exists as a template over the string type, named with a T, and in a plain form
-// that gives a String8. The text is written once, into a block of its final size.
+// that gives a String8, as the template does where no type is named. The text is written once, into a block of its
+// final size.
 
 /// What stands before a number that is not negative; zero counts as positive. Negative numbers always show "-".
 enum class SignStyle : u32
@@ -107,13 +108,13 @@ String8 ToString(T value, SignStyle sign = SignStyle::None, CharacterGrouping co
 }
 
 /// Decimal text in a field of @p width units. Signed and unsigned numbers differ in the sign style.
-template <class S, SignedTextInteger T>
+template <class S = String8, SignedTextInteger T>
 S ToStringTPadded(T value, int width, PadStyle pad, SignStyle sign = SignStyle::None,
                   CharacterGrouping const* grouping = nullptr)
 {
     return NumberTextDetail::Decimal<S>(NumberTextDetail::Split(value), sign, grouping, width, pad);
 }
-template <class S, UnsignedTextInteger T>
+template <class S = String8, UnsignedTextInteger T>
 S ToStringTPadded(T value, int width, PadStyle pad, CharacterGrouping const* grouping = nullptr)
 {
     return NumberTextDetail::Decimal<S>(NumberTextDetail::Split(value), SignStyle::None, grouping, width, pad);
@@ -131,7 +132,7 @@ String8 ToStringPadded(T value, int width, PadStyle pad, CharacterGrouping const
 }
 
 /// Decimal text in groups of 3 with ",".
-template <class S, TextInteger T>
+template <class S = String8, TextInteger T>
 S ToStringTNumber(T value, SignStyle sign = SignStyle::None)
 {
     return ToStringT<S>(value, sign, CharacterGroupingNumber());
@@ -142,9 +143,8 @@ String8 ToStringNumber(T value, SignStyle sign = SignStyle::None)
     return ToStringTNumber<String8>(value, sign);
 }
 
-/// Digits in a base of 2 to 36, in lower or upper case; any other base gives the empty string. A signed number shows
-/// the bits of its own width.
-template <class S, UnsignedTextInteger T>
+/// Digits in a base of 2 to 36, in lower or upper case; any other base gives the empty string.
+template <class S = String8, UnsignedTextInteger T>
 S ToStringTBase(T value, u32 base, bool upper)
 {
     return NumberTextDetail::InBase<S>(value, base, 0, PadStyle::SpacesLeft, upper);
@@ -154,8 +154,8 @@ String8 ToStringBase(T value, u32 base, bool upper)
 {
     return ToStringTBase<String8>(value, base, upper);
 }
-/// The same in a field of @p width units.
-template <class S, UnsignedTextInteger T>
+/// The same in a field of @p width units. In the plain form a signed number shows the bits of its own width.
+template <class S = String8, UnsignedTextInteger T>
 S ToStringTBasePadded(T value, u32 base, int width, PadStyle pad, bool upper)
 {
     return NumberTextDetail::InBase<S>(value, base, width, pad, upper);
@@ -167,12 +167,12 @@ String8 ToStringBase(T value, u32 base, int width, PadStyle pad, bool upper)
 }
 
 /// An address in base 16; padded, in a field of 16 units.
-template <class S>
+template <class S = String8>
 S ToStringTPointer(void const* p, bool upper)
 {
     return ToStringTBase<S>(reinterpret_cast<std::uintptr_t>(p), 16, upper);
 }
-template <class S>
+template <class S = String8>
 S ToStringTPointerPadded(void const* p, PadStyle pad, bool upper)
 {
     return ToStringTBasePadded<S>(reinterpret_cast<std::uintptr_t>(p), 16, 16, pad, upper);
@@ -187,7 +187,7 @@ inline String8 ToStringPointerPadded(void const* p, PadStyle pad, bool upper)
 }
 
 /// Lower-case hexadecimal, zero-filled to at least @p width digits.
-template <class S>
+template <class S = String8>
 S ToStringTUnicode(u32 value, u32 width)
 {
     return ToStringTBasePadded<S>(value, 16, static_cast<int>(width < 0x7FFFFFFF ? width : 0x7FFFFFFF),

@@ -17,7 +17,7 @@ extern template KERNEL_API String32 Superscript<String32>(Magnitude, SignStyle);
 
 /// Decimal text in raised digits (U+2070, U+00B9, U+00B2, U+00B3, U+2074 to U+2079) with raised signs (U+207A, U+207B);
 /// the sign style Space puts a plain space.
-template <class S, TextInteger T>
+template <class S = String8, TextInteger T>
 S ToStringSuperscriptT(T value, SignStyle sign = SignStyle::None)
 {
     return NumberTextDetail::Superscript<S>(NumberTextDetail::Split(value), sign);
