@@ -108,6 +108,7 @@ struct KERNEL_API CharTraits<TEncUtf16> : BaseCharTraits<char16_t>, CodePointTra
 {
     static constexpr TEncUtf16 Enc{}; ///< Tag value.
 
+    /// First half of a pair, D800 to DBFF; second half, DC00 to DFFF; either.
     static bool IsLeadSurrogate(u32 unit) { return (unit & 0xFFFFFC00u) == 0xD800; }
     static bool IsTrailSurrogate(u32 unit) { return (unit & 0xFFFFFC00u) == 0xDC00; }
     static bool IsSurrogate(u32 unit) { return (unit & 0xFFFFF800u) == 0xD800; }
@@ -162,16 +163,23 @@ struct KERNEL_API CharTraits<TEncUtf32> : BaseCharTraits<unsigned int>, CodePoin
 {
     static constexpr TEncUtf32 Enc{}; ///< Tag value.
 
+    /// Gives the unit at @p p and moves p behind it.
     static u32 NextCodePoint(unsigned int const*& p) { return *p++; }
+    /// Writes @p codePoint; gives the position behind it.
     static unsigned int* AppendCodePoint(unsigned int* to, u32 codePoint)
     {
         *to++ = codePoint;
         return to;
     }
+    /// 1, of a code point and by its unit.
     static int GetCodePointLength(u32) { return 1; }
+    /// False: every unit is a code point's first.
     static bool IsContinuation(unsigned int) { return false; }
+    /// Gives @p i.
     static int GetCodePointBegin(unsigned int const*, int i) { return i; }
+    /// True: no text stops within a code point.
     static bool IsCodePointEnd(unsigned int const*, int) { return true; }
+    /// Gives @p n, and 0 for less.
     static int GetLengthInCodePoints(unsigned int const*, int n) { return n > 0 ? n : 0; }
     /// Units from the start that are code points: a surrogate or a value above 0x10FFFF ends them, and so does a zero
     /// unit without @p allowZero. Any units may be given.

@@ -20,6 +20,7 @@ struct CodePointTraits
 
     /// Order by folded code points: below zero, zero or above zero.
     static int CompareNoCase(Unit const* a, int n, Unit const* b, int m);
+    /// True if the text begins, or ends, with a match; always for an empty one.
     static bool BeginsWithNoCase(Unit const* s, int n, Unit const* prefix, int m);
     static bool EndsWithNoCase(Unit const* s, int n, Unit const* suffix, int m);
     /// Index of the first match at or after @p start, or -1. An empty needle matches at @p start. With a match and
@@ -27,8 +28,9 @@ struct CodePointTraits
     static int FindNoCase(Unit const* s, int n, Unit const* needle, int m, int start, int* matched = nullptr);
 
     /// The first code point at or after @p start that stands in the set: its index and its units. Index -1 and length
-    /// 0 if there is none. The set is @p m units of text, or @p m code points.
+    /// 0 if there is none. The set is @p m units of text.
     static IndexRange FindAnyOf(Unit const* s, int n, Unit const* set, int m, int start);
+    /// The same with the set given as code points.
     template <class CodePoint>
     requires(std::is_same_v<CodePoint, u32> && !std::is_same_v<CodePoint, Unit>) static IndexRange
         FindAnyOf(Unit const* s, int n, CodePoint const* set, int m, int start)

@@ -53,6 +53,7 @@ public:
         if (m_hasString) m_string.text.~S();
     }
 
+    /// The units that stand for the argument, without a terminator.
     Unit const* GetData() const { return m_data; }
     int GetLength() const { return m_length; }
 
@@ -115,6 +116,7 @@ int AppendFormatT(S& out, typename S::Unit const* format, Args const&... args)
         return AppendFormatVT<S>(out, format, holders, sizeof...(Args));
     }
 }
+/// FormatVT likewise.
 template <class S, class... Args>
 S FormatT(typename S::Unit const* format, Args const&... args)
 {
@@ -126,6 +128,7 @@ S FormatT(typename S::Unit const* format, Args const&... args)
     }
 }
 
+/// AppendFormatT for String8.
 template <class... Args>
 int AppendFormat(String8& out, char const* format, Args const&... args)
 {

@@ -32,6 +32,7 @@ public:
         bool isEmpty = true;
     };
 
+    /// Without keywords, items are plain numbers.
     explicit SimpleParser(char separator);
     SimpleParser(std::vector<String8> const& keywords, char separator);
 
@@ -45,6 +46,7 @@ public:
 
     /// The items of the last parse. Behind a last separator stands an empty item.
     std::vector<ResultPair> const& GetResults() const { return m_results; }
+    /// What stopped the last parse.
     ErrorCode GetErrorCode() const { return m_errorCode; }
     /// Where the error lies in the text, in bytes; both 0 without one.
     int GetErrorPos() const { return m_errorPos; }

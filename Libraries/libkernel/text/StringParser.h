@@ -12,6 +12,7 @@ namespace Kernel {
 class KERNEL_API StringParser
 {
 public:
+    /// The number as a double.
     static bool ParseAsDouble(String8 const& text, Counted<Locale const> const& locale, double& value);
     /// Drops a fraction. False also for a number that needs more than 32 bits, which is as far as ICU goes here.
     static bool ParseAsLong(String8 const& text, Counted<Locale const> const& locale, long& value);

@@ -11,9 +11,11 @@ namespace Kernel {
 // "SS" in upper case, while a last "Σ" is "σ" in lower case like any other. Text that stays as it is comes back with
 // its own block. Valid text is taken for granted. The locale is borrowed for the call.
 
+/// Every code point to lower case.
 template <class Enc>
 StringT<Enc> ToLowerCase(StringT<Enc> const& text, NonCounted<Locale const> locale = nullptr);
 
+/// Every code point to upper case.
 template <class Enc>
 StringT<Enc> ToUpperCase(StringT<Enc> const& text, NonCounted<Locale const> locale = nullptr);
 
