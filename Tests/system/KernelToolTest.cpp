@@ -394,6 +394,9 @@ TEST_F(KernelToolTest, TextIsSortedAsALanguageSorts)
               Json::parse(R"({"locale": "en", "lines": ["a", "b"]})"));
     EXPECT_EQ(Run({"text", "sort", m_folder / "lines", "--locale", "not a locale"}).status, 2);
     EXPECT_EQ(Run({"text", "sort", m_folder / "none"}).status, 1);
+    ToolResult const unshown = Run({"text", "sort", "-", "--json"}, "b\xFF\n");
+    EXPECT_EQ(unshown.status, 1);
+    EXPECT_THAT(unshown.err, HasSubstr("kerneltool: reading standard input failed: IllFormed (1)\n"));
 }
 
 // Help, man page and completions say the same as the table of verbs.

@@ -135,7 +135,7 @@ constexpr ResultName c_fileResults[] = {
     {9, "Refused", nullptr},
     {11, "ReadOnlyVolume", nullptr},
     {12, "NoMemory", nullptr},
-    {13, "IsDirectory", "Give a file; --tree takes a folder."},
+    {13, "IsDirectory", "Give a file; only archive put takes a folder, by --tree."},
     {14, "TooManyFiles", nullptr},
     {15, "TooLarge", nullptr},
     {16, "NoSpace", c_space},

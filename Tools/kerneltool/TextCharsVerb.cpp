@@ -39,7 +39,7 @@ std::string Label(u32 codePoint)
 int RunTextChars(Arguments const& arguments)
 {
     String8 const text = arguments.At(0);
-    int const valid = CharTraits<TEncUtf8>::GetValidLength(text.GetData(), text.GetLength(), true);
+    int const valid = static_cast<int>(GetWellFormedLength(text.GetView()));
     Json list = Json::array();
     Table table("lllll");
     table.Add({"code", "class", "bytes", "name", ""});

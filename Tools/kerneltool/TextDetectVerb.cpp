@@ -1,7 +1,6 @@
 #include "Output.h"
 #include "TextInput.h"
 #include "Verbs.h"
-#include "libkernel/core/CharTraits.h"
 #include "libkernel/core/StringConverter.h"
 #include "libkernel/core/UnicodeFile.h"
 
@@ -31,7 +30,7 @@ int RunTextDetect(Arguments const& arguments)
     std::string const bytes = ReadInput(arguments.At(0));
     int const mark =
         static_cast<int>(GetByteOrderMark(reinterpret_cast<u8 const*>(bytes.data()), static_cast<i64>(bytes.size())));
-    bool const isUtf8 = CharTraits<TEncUtf8>::IsValid(bytes.data(), static_cast<int>(bytes.size()), false);
+    bool const isUtf8 = bytes.find('\0') == std::string::npos && GetWellFormedLength(bytes) == bytes.size();
     std::string guess;
     if (mark == 0 && !bytes.empty()) {
         std::unique_ptr<char[]> copy(new char[bytes.size()]);

@@ -2,6 +2,7 @@
 
 #include "Diagnostics.h"
 #include "Output.h"
+#include "TextInput.h"
 #include "libkernel/core/CharTraits.h"
 #include "libkernel/core/ConvertEnc.h"
 #include "libkernel/core/StringConverter.h"
@@ -103,19 +104,55 @@ String8 DecodeUnicode(TextEncodingName const& encoding, std::string const& bytes
     UnicodeRow const& row = *FindUnicode(encoding.name);
     u8 const* const data = reinterpret_cast<u8 const*>(bytes.data());
     i64 const size = static_cast<i64>(bytes.size());
-    UnicodeEncoding const mark = GetByteOrderMark(data, size);
+    // In 16 bits a zero character behind the mark is no part of it.
+    UnicodeEncoding const mark = GetByteOrderMark(data, row.unitSize == 2 ? std::min<i64>(size, 2) : size);
     // A mark of another form is text in this one.
     bool const isMarked = mark != UnicodeEncoding::None && (mark == row.marked[0] || mark == row.marked[1]);
     String8 const text = ConvertToUtf8(isMarked ? mark : row.encoding, data, size, true);
     size_t const markSize = !isMarked ? 0 : row.unitSize == 1 ? 3 : row.unitSize;
-    size_t const units = static_cast<size_t>(row.unitSize == 1   ? text.GetLength()
-                                             : row.unitSize == 2 ? ConvertedTo<TEncUtf16>(text).GetLength()
-                                                                 : ConvertedTo<TEncUtf32>(text).GetLength());
+    size_t const units = row.unitSize == 1   ? GetWellFormedLength(text.GetView())
+                         : row.unitSize == 2 ? static_cast<size_t>(ConvertedTo<TEncUtf16>(text).GetLength())
+                                             : static_cast<size_t>(ConvertedTo<TEncUtf32>(text).GetLength());
     size_t const read = markSize + units * row.unitSize;
     if (read != bytes.size())
         throw Failure{"reading " + encoding.name, "IllFormed", static_cast<int>(read),
                       "The text goes wrong at byte " + std::to_string(read) + ".", ExitFailed};
     return text;
+}
+
+size_t Count(String8 const& text, u32 codePoint)
+{
+    size_t count = 0;
+    for (char const* p = text.begin(); p < text.end();) count += CharTraits<TEncUtf8>::NextCodePoint(p) == codePoint;
+    return count;
+}
+
+std::vector<char> EncodeByIcu(String8 const& text, std::string const& name, char const* charset)
+{
+    std::vector<char> bytes;
+    std::vector<int> sources;
+    if (!Utf16ToEncoded(bytes, sources, ConvertedTo<TEncUtf16>(text), charset))
+        throw Describe(name, EncodingProblem::Unknown);
+    return bytes;
+}
+
+// Characters that do not survive the way to a charset and back, and so have no code there.
+size_t CountLost(String8 text, std::string const& charset)
+{
+    std::string units(text.GetView());
+    std::replace(units.begin(), units.end(), '\0', ' '); // The way back ends at a zero.
+    text = String8(units);
+    std::vector<char> bytes = EncodeByIcu(text, charset, charset.c_str());
+    if (std::find(bytes.begin(), bytes.end(), '\0') != bytes.end()) return 0; // Units of 16 or 32 bits: it has all.
+    bytes.push_back('\0');
+    String8 const back = EncodedToUtf8(bytes.data(), charset.c_str());
+    size_t lost = 0;
+    char const* q = back.begin();
+    for (char const* p = text.begin(); p < text.end();) {
+        u32 const wanted = CharTraits<TEncUtf8>::NextCodePoint(p);
+        lost += q >= back.end() || CharTraits<TEncUtf8>::NextCodePoint(q) != wanted;
+    }
+    return lost;
 }
 
 } // namespace
@@ -132,25 +169,33 @@ TextEncodingName TextEncodingName::Parse(std::string const& name)
     return result;
 }
 
-String8 Decode(TextEncodingName const& encoding, std::string const& bytes)
+String8 Decode(TextEncodingName const& encoding, std::string const& bytes, size_t& undefined)
 {
-    switch (encoding.kind) {
-    case TextEncodingName::Kind::Unicode: return DecodeUnicode(encoding, bytes);
-    case TextEncodingName::Kind::MappingFile:
-        return encoding.mappingFile->ToUnicode(bytes.data(), static_cast<int>(bytes.size()));
-    case TextEncodingName::Kind::Charset: break;
+    undefined = 0;
+    if (encoding.kind == TextEncodingName::Kind::Unicode) return DecodeUnicode(encoding, bytes);
+    if (encoding.kind == TextEncodingName::Kind::MappingFile) {
+        String8 const text = encoding.mappingFile->ToUnicode(bytes.data(), static_cast<int>(bytes.size()));
+        undefined = Count(text, StringEncoding::c_noCode);
+        return text;
     }
     if (bytes.find('\0') != std::string::npos) throw Describe(encoding.name, EncodingProblem::HoldsZero);
     if (!Utf8ToEncoded("", encoding.name.c_str())) throw Describe(encoding.name, EncodingProblem::Unknown);
-    return EncodedToUtf8(bytes.c_str(), encoding.name.c_str());
+    String8 const text = EncodedToUtf8(bytes.c_str(), encoding.name.c_str());
+    undefined = Count(text, 0xFFFD);
+    if (undefined != 0) {
+        // Unless the text itself says so, in a charset that has the replacement character.
+        std::vector<char> const back = EncodeByIcu(text, encoding.name, encoding.name.c_str());
+        if (std::equal(back.begin(), back.end(), bytes.begin(), bytes.end())) undefined = 0;
+    }
+    return text;
 }
 
 std::string Encode(TextEncodingName const& encoding, String8 const& text, size_t& unmapped)
 {
     unmapped = 0;
-    std::vector<char> bytes;
     if (encoding.kind == TextEncodingName::Kind::MappingFile) {
         using Policy = StringEncoding::ErrorPolicy;
+        std::vector<char> bytes;
         encoding.mappingFile->FromUnicode(bytes, text, Policy::WriteFallback, '?');
         for (char const* p = text.begin(); p < text.end();)
             unmapped +=
@@ -159,20 +204,9 @@ std::string Encode(TextEncodingName const& encoding, String8 const& text, size_t
     }
     UnicodeRow const* const unicode = FindUnicode(encoding.name);
     char const* const charset = unicode ? unicode->charset : encoding.name.c_str();
-    std::vector<int> sources;
-    if (!Utf16ToEncoded(bytes, sources, ConvertedTo<TEncUtf16>(text), charset))
-        throw Describe(encoding.name, EncodingProblem::Unknown);
-    std::string const result(bytes.begin(), bytes.end());
-    if (!unicode && result.find('\0') == std::string::npos) {
-        // What did not survive the way back has no code there.
-        String8 const back = EncodedToUtf8(result.c_str(), charset);
-        char const* q = back.begin();
-        for (char const* p = text.begin(); p < text.end();) {
-            u32 const wanted = CharTraits<TEncUtf8>::NextCodePoint(p);
-            unmapped += q >= back.end() || CharTraits<TEncUtf8>::NextCodePoint(q) != wanted;
-        }
-    }
-    return result;
+    std::vector<char> const bytes = EncodeByIcu(text, encoding.name, charset);
+    if (!unicode) unmapped = CountLost(text, encoding.name);
+    return {bytes.begin(), bytes.end()};
 }
 
 } // namespace KernelTool

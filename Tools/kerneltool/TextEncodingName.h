@@ -27,8 +27,9 @@ struct TextEncodingName
     static TextEncodingName Parse(std::string const& name);
 };
 
-/// The text of @p bytes. Throws Failure where they are ill-formed or the charset is unknown.
-Kernel::String8 Decode(TextEncodingName const& encoding, std::string const& bytes);
+/// The text of @p bytes; @p undefined is the number of codes that stand for nothing and came out as a stand-in. Throws
+/// Failure where the bytes are ill-formed Unicode or the charset is unknown.
+Kernel::String8 Decode(TextEncodingName const& encoding, std::string const& bytes, size_t& undefined);
 
 /// The bytes of @p text; @p unmapped is the number of characters that have none and came out as a stand-in. Throws
 /// Failure where the charset is unknown.

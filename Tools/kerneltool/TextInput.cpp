@@ -2,6 +2,7 @@
 
 #include "Diagnostics.h"
 #include "Output.h"
+#include "libkernel/core/CharTraits.h"
 #include "libkernel/streams/File.h"
 
 #include <cstdio>
@@ -43,6 +44,21 @@ std::string ReadInput(String8 const& path)
     }
     if (std::ferror(from)) throw MakeFailure(what, File::OpenUnmanagedResult::Other);
     return bytes;
+}
+
+size_t GetWellFormedLength(std::string_view text)
+{
+    using Traits = CharTraits<TEncUtf8>;
+    char const* p = text.data();
+    char const* const end = p + Traits::GetValidLength(p, static_cast<int>(text.size()), true);
+    while (p < end) {
+        char const* next = p;
+        u32 const codePoint = Traits::NextCodePoint(next);
+        bool const isSurrogate = (codePoint & 0xFFFFF800) == 0xD800;
+        if (isSurrogate || codePoint > 0x10FFFF || Traits::GetCodePointLength(codePoint) != next - p) break;
+        p = next;
+    }
+    return static_cast<size_t>(p - text.data());
 }
 
 std::string FormatHex(std::string const& bytes)

@@ -3,6 +3,7 @@
 #include "libkernel/core/String.h"
 
 #include <string>
+#include <string_view>
 
 namespace KernelTool {
 
@@ -11,6 +12,10 @@ std::string ReadInput(Kernel::String8 const& path);
 
 /// The name that the person is told of that input.
 std::string DescribeInput(Kernel::String8 const& path);
+
+/// Bytes of @p text from its start that are well-formed UTF-8 (The Unicode Standard, table 3-7): neither surrogates nor
+/// overlong forms, and nothing above U+10FFFF.
+size_t GetWellFormedLength(std::string_view text);
 
 /// Bytes as pairs of lower-case hexadecimal digits.
 std::string FormatHex(std::string const& bytes);

@@ -1,5 +1,7 @@
+#include "Diagnostics.h"
 #include "Output.h"
 #include "SourceItem.h"
+#include "TextInput.h"
 #include "Verbs.h"
 #include "libkernel/text/Collator.h"
 #include "libkernel/text/Locale.h"
@@ -47,7 +49,14 @@ int RunTextSort(Arguments const& arguments)
 
     Source const source =
         arguments.positional[0] == "-" ? Source::FromStandardInput() : Source::FromPath(arguments.At(0));
-    std::vector<String8> lines = SplitLines(ReadAll(source));
+    std::string const text = ReadAll(source);
+    if (arguments.Has(Option::Json))
+        if (size_t const good = GetWellFormedLength(text); good != text.size())
+            throw Failure{"reading " + DescribeInput(arguments.At(0)), "IllFormed", static_cast<int>(good),
+                          "The text goes wrong at byte " + std::to_string(good) +
+                              ", which JSON can't show; without --json its lines are sorted as they are.",
+                          ExitFailed};
+    std::vector<String8> lines = SplitLines(text);
     // Lines that the language does not tell apart keep their order.
     std::stable_sort(lines.begin(), lines.end(),
                      [&](String8 const& a, String8 const& b) { return collator->Collate(a, b) < 0; });
