@@ -209,6 +209,7 @@ TEST(InSerialiserHostileTest, UnsizedSourceTakesMemoryAsBytesCome)
         Start().Item(0x2B, "Text").U32(0x7FFFFFFF).Zeros(c_there),
         Start().Item(0x84, "Nums").U32(0x0FFFFFFF).Zeros(c_there),
         Start().Item(0x76, "Frag").U32(0x7FFFFFFF).U32(65536).Zeros(c_there),
+        Start().Item(0x76, "Frag").U32(0x7FFFFFFF).U32(0x7FFFFFFF).Zeros(c_there),
         Start().Item(0x30, "Strm").U16(1).U8(0x2D).U32(0x7FFFFFFF).Zeros(c_there),
         Start().Item(0xB1, "Arry").U32(0x7FFFFFFF).Zeros(c_there),
     };

@@ -288,14 +288,27 @@ bool InSerialiserLoader::ParseFragments(InSerialiserProperty& property, u32 size
         property.fragments->bytes = GetPool().AllocateRead(m_source, 0, size);
         return property.fragments->bytes != nullptr;
     }
-    // One block takes all there is at most, whatever the stream says.
-    Counted<FragmentedRawData> data(new FragmentedRawData(std::min(size, blockSize)));
+    // One block takes all there is at most, whatever the stream says. Where nobody knows how much is left, a large
+    // block is not asked for until its bytes have come.
+    u32 const block = std::min(size, blockSize);
+    bool const isStaged = !m_source.IsSized() && block > c_unsizedReadAhead;
+    Counted<FragmentedRawData> data(new FragmentedRawData(isStaged ? c_unsizedReadAhead : block));
     InSerialiserSourceStream* const rest = new InSerialiserSourceStream(m_source);
     Counted<InStream> const keep(rest);
     for (u64 at = 0; at < size;) {
         u64 const piece = m_source.IsSized() ? size - at : std::min(size - at, c_unsizedReadAhead);
         if (data->SetDataFromStream(at, *rest, piece, false) != piece) return false;
         at += piece;
+    }
+    if (isStaged) {
+        Counted<FragmentedRawData> whole(new FragmentedRawData(block));
+        u8 piece[16384];
+        for (u64 at = 0; at < size;) {
+            u64 const got = data->GetData(at, piece, sizeof(piece));
+            if (!whole->SetData(at, piece, got, false)) return false;
+            at += got;
+        }
+        data = std::move(whole);
     }
     property.fragments->data = std::move(data);
     return true;
