@@ -607,6 +607,43 @@ TEST_F(ArchiveStreamlineTest, AbortAtAnyPollLeavesEverythingAsItWas)
     EXPECT_TRUE(Save(*m_archive, {{"a", "4"}}));
 }
 
+TEST_F(ArchiveStreamlineTest, AbortBeforeTheThumbnailsDoesNotLoseThem)
+{
+    Items const items = Make();
+    SaveWithThumbnail(*m_archive, {{"a", items.at("a")}}, "picture");
+    std::string const before = ReadWhole(m_path);
+    bool abort = false;
+    auto const progress = MakeCounted<Progress>();
+    TestSupport::FaultyFiles files;
+    files.SetObserver([&](TestSupport::FileCall call, std::string const&) {
+        if (call == TestSupport::FileCall::Write && progress->calls.size() == items.size()) abort = true;
+    });
+    EXPECT_EQ(m_archive->Streamline(&abort, progress, nullptr), Archive::StreamlineAborted);
+    EXPECT_TRUE(abort);
+    EXPECT_TRUE(ReadWhole(m_path) == before);
+    EXPECT_EQ(Listing(), "doc ");
+}
+
+TEST_F(ArchiveStreamlineTest, BackupNameOfAHostThatIsInUseIsNotTaken)
+{
+    for (std::string const& backup : {m_path, m_scratchPath, m_folder / "host.new"}) {
+        SCOPED_TRACE(backup);
+        Items items = Make();
+        Archive::CreateResult created;
+        ASSERT_TRUE(m_archive->AddScratchFile(Str(m_scratchPath), created));
+        ASSERT_TRUE(Save(*m_archive, {{"a", "scratch"}}, true));
+        items["a"] = "scratch";
+        Archive::MarshalledFileAccess const marshalled{Str(m_folder / "host.new"), Str(backup), true};
+        EXPECT_EQ(m_archive->Streamline(nullptr, nullptr, &marshalled), Archive::StreamlineDone);
+        ExpectCompact(*m_archive, items, c_streamlined);
+        m_archive = nullptr;
+        ExpectCompact(*OpenDocument(m_path), items, c_streamlined);
+        EXPECT_EQ(Listing(), "doc doc.scratch ");
+        std::filesystem::remove(m_path);
+        std::filesystem::remove(m_scratchPath);
+    }
+}
+
 TEST_F(ArchiveStreamlineTest, NamesThatAreTakenArePassedOver)
 {
     Items const items = Make();

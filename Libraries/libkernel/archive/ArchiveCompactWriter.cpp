@@ -53,7 +53,11 @@ Result ArchiveCompactWriter::Run(Archive::StreamlineData& data)
     WriteTable();
     FlushBuffer();
     Describe(data);
-    if (m_options.copyThumbnails && !IsAborted()) CopyThumbnailBlock();
+    if (m_options.copyThumbnails) {
+        // Without its thumbnails the file is not what was asked for.
+        if (IsAborted()) return Archive::StreamlineAborted;
+        CopyThumbnailBlock();
+    }
     return m_targetFile && m_targetFile->IsBroken() ? Archive::StreamlineNoAccess : Archive::StreamlineDone;
 }
 

@@ -54,6 +54,8 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
         backup = FindBackupName(final);
     // What lies where is what counts here, whether or not it is known to last.
     bool isBackup = false;
+    // A backup under the name of one of the two files would take the other one's place.
+    if (IsSamePlace(backup, final) || IsSamePlace(backup, file.m_path)) backup = String8();
     if (!backup.IsEmpty()) FileSystem::RenameFile(final, backup, c_renameRetries, &isBackup);
     if (!isBackup) backup = String8();
 

@@ -82,7 +82,7 @@ private:
         std::vector<u8> block(std::min(c_searchBlock, m_source.GetSize()) + patternSize);
         u64 kept = 0; // Bytes of the last block that a pattern may begin in.
         for (u64 at = 0;;) {
-            u64 const got = m_source.ReadAt(at, block.data() + kept, block.size() - kept);
+            u64 const got = m_source.ReadAt(at, block.data() + kept, std::min(c_searchBlock, block.size() - kept));
             u64 const held = kept + got;
             for (u64 i = 0; i + patternSize <= held; ++i) {
                 u8 const* const p = block.data() + i;

@@ -36,14 +36,8 @@ bool ArchiveStreamliner::IsOwnFile(String8 const& path) const
         if (m_impl.m_master) own[0] = m_impl.m_master->m_path;
         if (m_impl.m_scratch) own[1] = m_impl.m_scratch->m_path;
     }
-    for (String8 const& mine : own) {
-        try {
-            if (!mine.IsEmpty() && FileSystem::IsSameFile(mine, path)) return true;
-        } catch (std::exception const&) {
-            // Nothing stands there yet.
-        }
-    }
-    return false;
+    return std::any_of(std::begin(own), std::end(own),
+                       [&](String8 const& mine) { return !mine.IsEmpty() && IsSamePlace(mine, path); });
 }
 
 namespace {

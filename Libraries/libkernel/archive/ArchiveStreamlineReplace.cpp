@@ -58,7 +58,10 @@ std::pair<bool, Result> ArchiveStreamliner::StreamlineReplacement()
 {
     if (m_request->marshalled && !m_request->marshalled->path.IsEmpty()) {
         Archive::MarshalledFileAccess const& marshalled = *m_request->marshalled;
-        if (IsOwnFile(marshalled.path)) return {false, Archive::StreamlineFailed};
+        // To move the master to its own name, to that of its scratch file or to the new file's would lose one of them.
+        if (IsOwnFile(marshalled.path) || IsOwnFile(marshalled.backupPath) ||
+            IsSamePlace(marshalled.path, marshalled.backupPath))
+            return {false, Archive::StreamlineFailed};
         m_newFile->m_stream = CreateStream(marshalled.path, false);
         if (!m_newFile->m_stream) return {false, Archive::StreamlineFailed};
         FileSystem::SetFileHidden(marshalled.path, true);

@@ -2,6 +2,8 @@
 
 #include "libkernel/filesystem/FileSystem.h"
 
+#include <exception>
+
 namespace Kernel {
 
 Archive::ArchiveFile::ArchiveFile(OpenMode mode, IDTag archiveUID) : m_mode(mode), m_archiveUID(archiveUID) {}
@@ -39,6 +41,15 @@ void Archive::ArchiveFile::BecomeScratch()
 {
     m_isScratch = true;
     m_lock = CriticalSection(c_rankScratch);
+}
+
+bool IsSamePlace(String8 const& a, String8 const& b)
+{
+    try {
+        return FileSystem::IsSameFile(a, b);
+    } catch (std::exception const&) {
+        return false; // Nothing stands at one of them.
+    }
 }
 
 } // namespace Kernel

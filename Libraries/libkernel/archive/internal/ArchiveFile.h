@@ -71,4 +71,7 @@ private:
     ~ArchiveFile() override; // Deletes the file if it is throw-away or a temporary never saved into.
 };
 
+/// True when both names are the same or one file stands at both; false also when that cannot be told.
+bool IsSamePlace(String8 const& a, String8 const& b);
+
 } // namespace Kernel
