@@ -1,3 +1,4 @@
+#include "libkernel/archive/ArchiveStreamline.h"
 #include "libkernel/streams/InStream.h"
 #include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
@@ -208,6 +209,95 @@ TEST(ArchiveOldFilesTest, LinkAndReferencePathOutliveASaveThatRaisesTheVersion)
             }
             EXPECT_EQ(GetAll(*OpenDocument(path)), expected);
         }
+    }
+}
+
+TEST(ArchiveOldFilesTest, TwoHundredRevisionsOfVersion8VerifyRecoverAndStreamlineWithTheSameItems)
+{
+    TestSupport::TempFolder const folder;
+    constexpr u32 c_revisions = 200;
+    constexpr u32 c_pages = 17;
+    ArchiveBuilder builder(8);
+    std::map<std::string, std::string> items;
+    std::map<std::string, std::string> halfWay;
+    for (u32 i = 0; i < c_revisions; ++i) {
+        ArchiveBuilder::Table table;
+        table.tag = "#FT2";
+        table.revisionTag = i % 10 == 0 ? 0 : 1;
+        table.time = 1'300'000'000 + 3600 * i;
+        // A page that is there goes at every fifth turn, and is added again at its next one.
+        u32 const uid = i % c_pages + 1;
+        std::string const path = "pages/page" + std::to_string(uid);
+        std::string const bytes = Pixels(2000 + 40 * i);
+        u8 const code = CodesOf("#FT2")[i % 5];
+        bool const isThere = items.count(path) != 0;
+        if (isThere && i % 5 == 0) {
+            table.records = {{uid, 2}};
+            items.erase(path);
+        } else {
+            table.records = {{uid, isThere ? u8{1} : u8{0}, path, builder.AddBlock(bytes, code)}};
+            items[path] = bytes;
+        }
+        builder.AddTable(table);
+        if (i + 1 == c_revisions / 2) halfWay = items;
+    }
+    std::string const original = builder.Build();
+    std::string const path = folder / "old";
+    WriteWhole(path, original);
+
+    Counted<Archive> archive = OpenDocument(path, Archive::OpenModeReadOnly);
+    ASSERT_TRUE(archive);
+    EXPECT_EQ(StateOf(*archive).fileVersion, 8);
+    u32 const nextFreeUID = StateOf(*archive).nextFreeUID;
+    EXPECT_TRUE(archive->StreamliningAdviseable() && archive->RequiresStreamlining());
+    EXPECT_TRUE(GetAll(*archive) == items);
+    std::vector<Counted<Archive::Revision const>> revisions;
+    archive->GetRevisions(revisions);
+    ASSERT_EQ(revisions.size(), c_revisions);
+    for (auto const& revision : revisions)
+        for (Archive::FileRevision const& entry : revision->GetEntries())
+            EXPECT_TRUE(entry.IsDeletion() || archive->CheckStoredBlock(*revision, entry) == Archive::BlockCheck::Ok);
+    for (u32 i = 0; i < c_revisions / 2; ++i) archive->RewindWorkingRevision();
+    EXPECT_TRUE(GetAll(*archive) == halfWay);
+    EXPECT_EQ(archive->StreamlineToNew(Str(folder / "half")), Archive::StreamlineDone);
+    EXPECT_TRUE(GetAll(*OpenDocument(folder / "half")) == halfWay);
+
+    std::string smashed = original;
+    smashed.replace(16, 8, 8, '\x11'); // FirstFAT
+    WriteWhole(folder / "smashed", smashed);
+    Archive::OpenResult result{};
+    archive = Archive::RecoverArchive(Str(folder / "smashed"), Archive::OpenModeReadOnly, c_documentTag, result);
+    ASSERT_TRUE(archive) << result;
+    archive->GetRevisions(revisions);
+    EXPECT_EQ(revisions.size(), c_revisions);
+    EXPECT_TRUE(GetAll(*archive) == items);
+
+    // As it is and after a save of today, which makes the old tables part of a new file.
+    for (bool const saved : {false, true}) {
+        archive = nullptr;
+        WriteWhole(path, original);
+        archive = OpenDocument(path);
+        ASSERT_TRUE(archive);
+        String8 report;
+        if (saved) {
+            ArchiveSessionHandle handle;
+            ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeIncremental, nullptr));
+            handle->CreateFile(Str("today"), MakeCounted<BytesItem>("new"));
+            EXPECT_EQ(archive->CloseSessionAndVerifyFileState(handle, report, false), Archive::VerifyMatch)
+                << report.GetData();
+            items["today"] = "new";
+        }
+        EXPECT_EQ(archive->StreamlineAndVerifyFileState(report, nullptr, nullptr, nullptr), Archive::StreamlineDone)
+            << report.GetData();
+        archive = nullptr;
+        archive = OpenDocument(path);
+        ASSERT_TRUE(archive);
+        EXPECT_TRUE(GetAll(*archive) == items);
+        archive->GetRevisions(revisions);
+        EXPECT_EQ(revisions.size(), 1u);
+        EXPECT_EQ(StateOf(*archive).fileVersion, 11);
+        EXPECT_EQ(StateOf(*archive).nextFreeUID, nextFreeUID + (saved ? 1 : 0));
+        EXPECT_FALSE(archive->StreamliningAdviseable() || archive->RequiresStreamlining());
     }
 }
 
