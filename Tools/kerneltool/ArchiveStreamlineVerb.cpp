@@ -80,14 +80,18 @@ u64 SizeOf(String8 const& path)
     return size < 0 ? 0 : static_cast<u64>(size);
 }
 
-void ThrowIfFailed(Archive::StreamlineResult result, std::string const& what, String8 const& temporaries)
+void ThrowIfFailed(Archive::StreamlineResult result, std::string const& what, String8 const& document,
+                   String8 const& temporaries)
 {
     if (result == Archive::StreamlineDone) return;
     if (result == Archive::StreamlineAborted) throw AbortException();
     Failure failure = MakeFailure(what, result);
     if (result == Archive::StreamlineNotVerified) failure.status = ExitDamaged;
-    if (result == Archive::StreamlineOverwriteFailed || result == Archive::StreamlineNoSpace)
-        failure.advice = "The only whole copy of the document may be the file in '" + ToStd(temporaries) + "'.";
+    if (!FileSystem::Exists(document))
+        failure.advice = "The document lies beside its name, with '~backup' behind it: rename it back.";
+    else if (result == Archive::StreamlineOverwriteFailed || result == Archive::StreamlineNoSpace)
+        failure.advice = "The only whole copy of the document may be the file in '" + ToStd(temporaries) + "', or '" +
+                         ToStd(document) + "~tmp'.";
     throw failure;
 }
 
@@ -113,7 +117,7 @@ int StreamlineTo(Arguments const& arguments, bool verify)
     Counted<Archive> const archive = OpenForReading(arguments);
     Reservation reservation(to);
     std::string const what = "writing '" + ToStd(to) + "'";
-    ThrowIfFailed(archive->StreamlineToNew(to), what, String8());
+    ThrowIfFailed(archive->StreamlineToNew(to), what, from, String8());
     reservation.Use();
     Json damaged = Json::array();
     u64 checked = 0;
@@ -159,7 +163,7 @@ int RunStreamline(Arguments const& arguments)
             verify ? archive->StreamlineAndVerifyFileState(report, GetAbortFlag(), progress, nullptr)
                    : archive->Streamline(GetAbortFlag(), progress, nullptr);
         progress->End();
-        ThrowIfFailed(result, what, temporaries.GetPath());
+        ThrowIfFailed(result, what, path, temporaries.GetPath());
     }
     u64 const after = SizeOf(path);
     return Report(arguments,
