@@ -193,6 +193,7 @@ ArchiveBackDataBucket::~ArchiveBackDataBucket()
 {
     try {
         m_stream->Close();
+        if (m_writer) m_writer->Close();
     } catch (FileIOException const&) {
     }
     FileSystem::Delete(m_path, 0);
@@ -295,11 +296,15 @@ Counted<ArchiveBackData> ArchiveBackDataBucketStore::Copy(ArchiveImpl& impl, Arc
         } catch (ArchiveException const&) {
             throw;
         } catch (BackstoreException const&) {
+            Remove(*bucket);
             throw;
         } catch (FileIOException const& e) {
-            // What comes from the source was turned into an archive's exception on the way: this is the bucket.
+            // What comes from the source was turned into an archive's exception on the way: this is the bucket. It
+            // takes no more copies, and those that it has can still be read.
+            Remove(*bucket);
             throw BackstoreException(e.GetReason() == FileIOException::Reason::OutOfSpace);
         } catch (...) {
+            Remove(*bucket);
             throw BackstoreException(false);
         }
     }
@@ -318,6 +323,15 @@ bool IsSoundBlockStart(FileInOutStream& stream, u64 position)
     return tag == c_tagBlock || (tag == 0 && got == sizeof(start) && LoadLittleEndian<u32>(start + 4) != 0);
 }
 
+/// Opens a bucket's file for the copies to come.
+Counted<FileInOutStream> OpenWriter(String8 const& path)
+{
+    File::OpenUnmanagedResult result{};
+    Counted<FileInOutStream> stream = FileInOutStream::Open(path.GetData(), File::ShareMode::DenyNone, result, nullptr);
+    if (!stream) throw BackstoreException(false);
+    return stream;
+}
+
 } // namespace
 
 Counted<ArchiveBackData> ArchiveBackDataBucketStore::CopyInto(ArchiveBackDataBucket& bucket, ArchiveImpl& impl,
@@ -331,6 +345,7 @@ Counted<ArchiveBackData> ArchiveBackDataBucketStore::CopyInto(ArchiveBackDataBuc
     Counted<FileInOutStream> const from = file.GetStream();
     if (!from) impl.ThrowFileException(file, Reason::FileError);
     CriticalSectionScope const lock(bucket.m_lock);
+    if (!bucket.m_writer) bucket.m_writer = OpenWriter(bucket.GetPath());
     ArchiveCopyBuffer const buffer;
     u32 crc = 0;
     CRC32::BeginCRC32(crc);
@@ -354,7 +369,7 @@ Counted<ArchiveBackData> ArchiveBackDataBucketStore::CopyInto(ArchiveBackDataBuc
         }
         if (got != piece) throw BackstoreException(false);
         CRC32::CalcCRC32(buffer.GetData(), piece, crc);
-        if (bucket.m_stream->WriteAt(bucket.m_position + at, buffer.GetData(), piece) != piece)
+        if (bucket.m_writer->WriteAt(bucket.m_position + at, buffer.GetData(), piece) != piece)
             throw BackstoreException(false);
         at += piece;
     }

@@ -204,6 +204,8 @@ Result ArchiveStreamliner::StreamlineInner(bool& suspended)
     {
         CriticalSectionScope const lock(m_impl.m_stateLock);
         if (!m_master || m_master->m_readOnly || m_master->m_readOnlyFallback) return Archive::StreamlineFailed;
+        // One whose replacement failed half way has no tables left: that nothing needs doing would not be true.
+        if (m_master->m_bad) return Archive::StreamlineFailed;
         if (m_master->m_path.IsEmpty()) return Archive::StreamlineFailed;
     }
     if (!RequiresStreamliningCS()) return Archive::StreamlineDone;

@@ -31,10 +31,11 @@ private:
 
     CriticalSection m_lock{c_rankBucket};
     std::atomic<u32> m_readers{0};
-    Counted<FileInOutStream> const m_stream;
+    Counted<FileInOutStream> const m_stream; // For reading only: no failed write may cost the copies that are there.
     String8 const m_path;
-    u64 m_position = 0;  // Where the next copy goes. Guarded by m_lock.
-    u64 m_deadBytes = 0; // Guarded by m_lock.
+    Counted<FileInOutStream> m_writer; // The same file, opened for the first copy. Guarded by m_lock.
+    u64 m_position = 0;                // Where the next copy goes. Guarded by m_lock.
+    u64 m_deadBytes = 0;               // Guarded by m_lock.
 };
 
 /// All buckets of the process, made at first use.
