@@ -22,6 +22,7 @@ struct OpenFile
     std::string path;
     std::string flushed;
     bool known = false;
+    bool canKnow = false; // Open for reading and writing.
 };
 
 struct State
@@ -79,7 +80,7 @@ std::string Text(char const* path)
 std::string Content(FileHandle handle)
 {
     u64 size = 0;
-    FileCalls const& calls = GetSystemFileCalls();
+    FileCalls const& calls = *s.next;
     if (calls.getSize(handle, size)) return {};
     std::string text(size, '\0');
     text.resize(calls.readAt(handle, text.data(), size, 0).count);
@@ -121,8 +122,8 @@ int Open(char const* path, OpenFlags const& flags, FileHandle& out)
         return error;
     }
     std::lock_guard const lock(s.mutex);
-    OpenFile& file = s.files[out] = {Text(path), {}, false};
-    if (s.keepsFlushed && flags.write && flags.read) file.flushed = Content(out), file.known = true;
+    OpenFile& file = s.files[out] = {Text(path), {}, false, flags.write && flags.read};
+    if (s.keepsFlushed && file.canKnow) file.flushed = Content(out), file.known = true;
     ++s.openHandles;
     return 0;
 }
@@ -149,17 +150,18 @@ int Flush(FileHandle handle, FlushKind kind)
     OpenFile& file = s.files[handle];
     if (!error && file.known) file.flushed = Content(handle);
     if (strikes && fault.loseWrites && file.known) {
-        FileCalls const& calls = GetSystemFileCalls();
+        FileCalls const& calls = *s.next;
         calls.setSize(handle, file.flushed.size());
         calls.writeAt(handle, file.flushed.data(), file.flushed.size(), 0);
     }
     return error;
 }
 
-FileCalls MakeTable()
+// What has no kind here goes straight to the table that was in place.
+FileCalls MakeTable(FileCalls const& next)
 {
     using C = FileCall;
-    FileCalls t = GetSystemFileCalls();
+    FileCalls t = next;
     t.open = Open;
     t.close = Close;
     t.read = [](FileHandle h, void* d, u64 n) { return Move(C::Read, h, d, n, s.next->read); };
@@ -208,9 +210,10 @@ FileCalls MakeTable()
 
 FaultyFiles::FaultyFiles()
 {
-    static FileCalls const table = MakeTable();
+    static FileCalls table;
     std::lock_guard const lock(s.mutex);
     s.next = &GetFileCalls();
+    table = MakeTable(*s.next);
     s.plans.clear();
     s.files.clear();
     std::fill(std::begin(s.counts), std::end(s.counts), 0);
@@ -230,7 +233,10 @@ void FaultyFiles::Plan(Fault const& fault)
     std::lock_guard const lock(s.mutex);
     s.plans.push_back({fault});
     s.fired = false;
-    s.keepsFlushed |= fault.loseWrites;
+    if (!fault.loseWrites || s.keepsFlushed) return;
+    s.keepsFlushed = true;
+    for (auto& [handle, file] : s.files)
+        if (file.canKnow) file.flushed = Content(handle), file.known = true;
 }
 
 void FaultyFiles::Clear()

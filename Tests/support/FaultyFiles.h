@@ -54,8 +54,8 @@ struct Fault
     std::string path = {};   ///< Only calls on paths that hold this text; empty for all.
 };
 
-/// Puts a faulty table of file calls in place for its life. Without faults it only counts. One at a time; calls may
-/// come from any thread.
+/// Puts a faulty table of file calls in place for its life, before the one that is in place. Without faults it only
+/// counts. One at a time; calls may come from any thread.
 class FaultyFiles
 {
 public:
@@ -64,6 +64,7 @@ public:
     FaultyFiles(FaultyFiles const&) = delete;
     FaultyFiles& operator=(FaultyFiles const&) = delete;
 
+    /// What is written by now counts as flushed.
     void Plan(Fault const& fault);
     /// Takes the faults away; what was counted stays.
     void Clear();

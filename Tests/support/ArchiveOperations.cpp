@@ -1,0 +1,547 @@
+#include "support/ArchiveOperations.h"
+
+#include "libkernel/archive/ArchiveExceptions.h"
+#include "libkernel/archive/ArchiveStreamline.h"
+#include "libkernel/filestore/BackstoreException.h"
+#include "libkernel/filestore/DelayLoadHolder.h"
+#include "libkernel/filestore/FileStoreBackData.h"
+#include "libkernel/filesystem/TempFile.h"
+#include "libkernel/platform/PlatformFile.h"
+#include "libkernel/serialisation/InSerialiser.h"
+#include "libkernel/serialisation/SerialiseFrom.h"
+#include "libkernel/serialisation/SerialiseTo.h"
+#include "libkernel/streams/FileIOException.h"
+#include "libkernel/streams/MemoryStreams.h"
+#include "libkernel/streams/OutStream.h"
+
+#include <condition_variable>
+#include <cstring>
+#include <mutex>
+#include <sstream>
+
+namespace KernelTest {
+
+using namespace Kernel;
+using TestSupport::MemoryDisk;
+
+namespace {
+
+char const* const c_doc = "/ram/doc";
+char const* const c_scratch = "/ram/scratch";
+char const* const c_new = "/ram/new";
+char const* const c_moved = "/ram/moved";
+char const* const c_settings = "/ram/settings";
+
+std::string Numbered(char const* what, int n)
+{
+    return n == 0 ? "ok" : std::string(what) + " " + std::to_string(n);
+}
+
+std::string Kept(Counted<Archive>& place, Counted<Archive> const& archive, Archive::OpenResult result)
+{
+    place = archive;
+    if (!archive == (result == Archive::OpenOk)) return "result and archive disagree";
+    return Numbered("open", result);
+}
+
+std::string Kept(Counted<Archive>& place, Counted<Archive> const& archive, Archive::CreateResult const& result)
+{
+    place = archive;
+    if (!archive == (result.GetCode() == Archive::CreateResult::Code::Ok)) return "result and archive disagree";
+    return Numbered("create", static_cast<int>(result.GetCode()));
+}
+
+Counted<ArchiveThumbnails> MakeThumbnails(char fill)
+{
+    auto thumbnails = MakeCounted<ArchiveThumbnails>();
+    auto data = MakeCounted<RawData>(200);
+    std::memset(data->GetData(), fill, data->GetSize());
+    thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, data);
+    return thumbnails;
+}
+
+void OpenIn(World& world, char const* path)
+{
+    world.archive = OpenDocument(path);
+    world.item = MakeCounted<BytesItem>(std::string(1500, 'n'));
+}
+
+std::function<void(World&)> Opened(char const* path)
+{
+    return [path](World& world) { OpenIn(world, path); };
+}
+
+enum class How
+{
+    Plain,
+    Verified,
+    Thumbnails
+};
+
+// One save of the world's item, beside a packed one, a deletion and user data.
+std::string SaveInto(World& world, Archive::SessionType type, bool scratch, How how = How::Plain)
+{
+    ArchiveSessionHandle handle;
+    Archive& archive = *world.archive;
+    if (scratch) {
+        if (!archive.CreateScratchSession(handle, type, &world.abort)) return "no session";
+    } else if (int const result = archive.CreateSessionAdv(handle, type, &world.abort, false)) {
+        return Numbered("session", result);
+    }
+    handle->CreateFile(Str("a"), world.item);
+    handle->CreateFile(Str("packed"), MakeCounted<BytesItem>(std::string(700, 'p')), Compressed());
+    handle->DeleteFile(Str("b"));
+    if (!handle->SetUserData("user", 4)) return "no memory";
+    if (how == How::Thumbnails) handle->SetThumbnails(MakeThumbnails('n'));
+    if (how == How::Verified) {
+        String8 report;
+        return Numbered("verify", archive.CloseSessionAndVerifyFileState(handle, report, false));
+    }
+    archive.CloseSession(handle, true);
+    return "ok";
+}
+
+std::string SaveNew(World& world, std::string const& result)
+{
+    if (result != "ok") return result;
+    world.item = MakeCounted<BytesItem>(std::string(900, 'f'));
+    return SaveInto(world, Archive::SessionTypeFull, false);
+}
+
+std::function<std::string(World&)> Saving(Archive::SessionType type, bool scratch, How how = How::Plain)
+{
+    return [=](World& world) { return SaveInto(world, type, scratch, how); };
+}
+
+std::function<std::string(World&)> Opening(Archive::OpenMode mode, char const* path)
+{
+    return [=](World& world) {
+        Archive::OpenResult result{};
+        Counted<Archive> const archive = Archive::Open(Str(path), mode, c_documentTag, result);
+        return Kept(world.archive, archive, result);
+    };
+}
+
+template <class T>
+std::string Streamlined(T result)
+{
+    return Numbered("streamline", result);
+}
+
+class Waiter : public Archive::OffliningUpdater
+{
+public:
+    void Progress(u64, u64) override {}
+    void Complete() override { Set("ok"); }
+    void Aborted() override { Set("offlining aborted"); }
+    void Failed(int reason) override { Set(reason == 1 ? "offlining 1" : "offlining 2"); }
+    std::string Wait()
+    {
+        std::unique_lock lock(m_mutex);
+        m_changed.wait(lock, [this] { return m_result != nullptr; });
+        return m_result;
+    }
+
+private:
+    void Set(char const* result)
+    {
+        std::lock_guard const lock(m_mutex);
+        m_result = result;
+        m_changed.notify_all();
+    }
+    std::mutex m_mutex;
+    std::condition_variable m_changed;
+    char const* m_result = nullptr;
+};
+
+std::string Offlined(World& world)
+{
+    // One that has failed is over, and one that finds no file does not begin: neither calls anybody.
+    if (world.archive->GetOffliningState() != Archive::OffliningNotStarted) return "offlining 1";
+    auto const waiter = MakeCounted<Waiter>();
+    world.archive->StartOffline(waiter);
+    if (world.archive->GetOffliningState() == Archive::OffliningNotStarted) return "offlining 2";
+    std::string const result = waiter->Wait();
+    world.archive->AbortOfflining();
+    return result;
+}
+
+std::string BackData(World& world)
+{
+    for (char const* path : {"a", "packed"}) {
+        Counted<Archive::Revision const> const revision = world.archive->GetHeadRevisionForFile(Str(path));
+        Counted<FileStoreBackData const> const data = world.archive->CreateBackData(revision, Str(path));
+        if (!data) return "no back data";
+        if (!data->LoadItem(*MakeCounted<BytesItem>())) return "not loaded";
+    }
+    return "ok";
+}
+
+std::string Migrated(World& world)
+{
+    if (int const result = world.archive->MigratePrepare(Str(c_moved))) return Numbered("migrate", result);
+    return Numbered("open", world.archive->MigrateRestore(Str(c_moved)));
+}
+
+std::string ReadAll(World& world)
+{
+    for (auto const& [path, bytes] : GetAll(*world.archive))
+        if (bytes == "(unreadable)") return "unreadable";
+    return world.archive->LoadThumbnails() ? "ok" : "no thumbnails";
+}
+
+std::string ReadStream(World& world)
+{
+    char bytes[700];
+    Counted<InStream> const stream = world.archive->OpenFileInStream(Str("packed"));
+    return !stream ? "no stream" : stream->ReadBlock(bytes, sizeof(bytes)) == sizeof(bytes) ? "ok" : "short";
+}
+
+std::string Settings(World&)
+{
+    auto const save = [](OutSerialiser& out, IDTag tag) { out.SaveType(tag, 2); };
+    return SerialiseToFile(c_settings, "Sett", 1, save, 6) ? "ok" : "false";
+}
+
+std::string SettingsBack(World&)
+{
+    auto const load = [](InSerialiser& in, IDTag tag) {
+        int value = 0;
+        return in.LoadType(tag, value) && value == 1;
+    };
+    return SerialiseFromFile(c_settings, "Sett", 1, load, true) ? "ok" : "false";
+}
+
+void Nothing(World&) {}
+
+// What any file of a save may fail with, by name: no session for want of a file, or the session's own exceptions.
+char const* const c_saveFailures = "session 9 no session file 0 file 1 file 2 file 3 file 4 file 5 file 7 file 8 write";
+
+std::vector<ArchiveOperation> MakeOperations()
+{
+    using Type = Archive::SessionType;
+    std::string const save = c_saveFailures;
+    std::vector<ArchiveOperation> list = {
+        {"create", StartState::Nothing, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = Archive::Create(Str(c_new), c_documentTag, result);
+             return Kept(w.archive, archive, result);
+         },
+         "create *"},
+        {"create as scratch", StartState::Nothing, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = Archive::CreateAsScratch(Str(c_new), c_documentTag, nullptr, result);
+             return Kept(w.archive, archive, result);
+         },
+         "create *"},
+        {"create throw-away and save", StartState::Nothing, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = Archive::CreateAsThrowAway(c_documentTag, result);
+             return SaveNew(w, Kept(w.archive, archive, result));
+         },
+         "create * " + save},
+        {"create with temporary and save", StartState::Document, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = Archive::CreateWithTemporary(Str(c_doc), c_documentTag, result);
+             return SaveNew(w, Kept(w.archive, archive, result));
+         },
+         "create * " + save},
+        {"create new with temporary and save", StartState::Nothing, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = Archive::CreateWithTemporary(Str(c_new), c_documentTag, result);
+             return SaveNew(w, Kept(w.archive, archive, result));
+         },
+         "create * " + save},
+        {"create with adjacent temporary and save", StartState::Document, Nothing,
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive =
+                 Archive::CreateWithAdjacentTemporary(Str(c_doc), c_documentTag, result, {});
+             return SaveNew(w, Kept(w.archive, archive, result));
+         },
+         "create * " + save},
+        {"replace and save", StartState::Document, [](World& w) { w.other = OpenDocument(c_doc); },
+         [](World& w) {
+             Archive::CreateResult result;
+             Counted<Archive> const archive = w.other->CreateReplacementWithTemporary(result, {});
+             return SaveNew(w, Kept(w.archive, archive, result));
+         },
+         "create * " + save},
+        {"add scratch file", StartState::Document, Opened(c_doc),
+         [](World& w) {
+             Archive::CreateResult result;
+             bool const added = w.archive->AddScratchFile(Str(c_scratch), result);
+             if (added != (result.GetCode() == Archive::CreateResult::Code::Ok)) return std::string("disagree");
+             return Numbered("create", static_cast<int>(result.GetCode()));
+         },
+         "create 2 create 6"},
+        {"open", StartState::Pair, Nothing, Opening(Archive::OpenModeReadWrite, c_scratch), "open *"},
+        {"open read-only", StartState::Pair, Nothing, Opening(Archive::OpenModeReadOnly, c_scratch), "open *"},
+        {"open either way", StartState::Document, Nothing, Opening(Archive::OpenModeReadWriteOrReadOnly, c_doc),
+         "open *"},
+        {"open coordinated", StartState::Document, Nothing, Opening(Archive::OpenModeCoordinated, c_doc), "open *"},
+        {"open as scratch", StartState::Alone, Nothing,
+         [](World& w) {
+             Archive::OpenResult result{};
+             Counted<Archive> const archive = Archive::OpenAsScratch(Str(c_scratch), c_documentTag, result);
+             return Kept(w.archive, archive, result);
+         },
+         "open *"},
+        {"open throw-away", StartState::Document, [](World& w) { w.other = OpenDocument(c_doc); },
+         [](World& w) {
+             auto const data = MakeCounted<FragmentedRawData>(4096);
+             if (int const result = w.other->StreamlineToFragmentedRawData(*data)) return Streamlined(result);
+             Archive::OpenResult result{};
+             Counted<Archive> const archive = Archive::OpenAsThrowaway(*data, c_documentTag, result);
+             return Kept(w.archive, archive, result);
+         },
+         "open * streamline 2 streamline 4"},
+        {"open migrate", StartState::Document, Nothing,
+         [](World& w) {
+             Archive::OpenResult result{};
+             Counted<Archive> const archive = Archive::OpenMigrate(Str(c_doc), Str(c_moved), c_documentTag, result);
+             return Kept(w.archive, archive, result);
+         },
+         "open *"},
+        {"recover", StartState::Damaged, Nothing,
+         [](World& w) {
+             Archive::OpenResult result{};
+             Counted<Archive> const archive =
+                 Archive::RecoverArchive(Str(c_doc), Archive::OpenModeReadWrite, c_documentTag, result);
+             return Kept(w.archive, archive, result);
+         },
+         "open *"},
+        {"look at links", StartState::Pair, Nothing,
+         [](World&) {
+             IDTag tag;
+             Archive::LinkInfo info;
+             if (int const result = Archive::GetArchiveUID(Str(c_doc), tag)) return Numbered("open", result);
+             if (int const result = Archive::TestForScratchLinkAndReferenceInfo(Str(c_scratch), false, info))
+                 return Numbered("open", result);
+             if (Archive::IsMidStreamlineFile(Str(c_doc))) return std::string("mid-streamline");
+             return std::string(Archive::VerifyLinks(Str(c_scratch)) ? "ok" : "links differ");
+         },
+         "open * links differ"},
+        {"full save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeFull, false), save},
+        {"incremental save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeIncremental, false), save},
+        {"rewrite save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeRewrite, false), save},
+        {"export save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeExport, false), save},
+        {"full scratch save", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeFull, true), save},
+        {"incremental scratch save", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeIncremental, true),
+         save},
+        {"rewrite scratch save", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeRewrite, true), save},
+        {"export scratch save", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeExport, true), save},
+        {"roll down", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeFull, false), save},
+        {"close and verify", StartState::Pair, Opened(c_scratch), Saving(Type::SessionTypeFull, false, How::Verified),
+         save + " verify 1 verify 2"},
+        {"thumbnails", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeFull, false, How::Thumbnails),
+         save},
+        {"streamline", StartState::Pair, Opened(c_scratch),
+         [](World& w) { return Streamlined(w.archive->Streamline(&w.abort, nullptr, nullptr)); },
+         "streamline 2 streamline 3 streamline 4 streamline 7 streamline 8"},
+        {"streamline and verify", StartState::Document, Opened(c_doc),
+         [](World& w) {
+             String8 report;
+             return Streamlined(w.archive->StreamlineAndVerifyFileState(report, &w.abort, nullptr, nullptr));
+         },
+         "streamline 2 streamline 3 streamline 4 streamline 6 streamline 7 streamline 8"},
+        {"streamline by overwriting", StartState::Document,
+         [](World& w) {
+             OpenIn(w, c_doc);
+             w.archive->SetAlwaysStreamlineOverwrite(true);
+         },
+         [](World& w) { return Streamlined(w.archive->Streamline(&w.abort, nullptr, nullptr)); },
+         "streamline 2 streamline 3 streamline 4 streamline 7 streamline 8"},
+        {"streamline to new", StartState::Document, Opened(c_doc),
+         [](World& w) { return Streamlined(w.archive->StreamlineToNew(Str(c_new))); },
+         "streamline 2 streamline 3 streamline 4 streamline 8"},
+        {"streamline to stream", StartState::Pair, Opened(c_scratch),
+         [](World& w) { return Streamlined(w.archive->StreamlineToOutStream(*MakeCounted<MemoryInOutStream>())); },
+         "streamline 2 streamline 4"},
+        {"streamline and switch", StartState::Document, Opened(c_doc),
+         [](World& w) { return Streamlined(w.archive->StreamlineAndSwitch(Str(c_new))); },
+         "streamline 2 streamline 3 streamline 4 streamline 8"},
+        {"streamline and switch as scratch", StartState::Document, Opened(c_doc),
+         [](World& w) { return Streamlined(w.archive->StreamlineAndSwitchAsScratch(Str(c_new))); },
+         "streamline 2 streamline 3 streamline 4 streamline 8"},
+        {"capture to throw-away", StartState::Document, Opened(c_doc),
+         [](World& w) { return Numbered("capture", w.archive->CaptureToThrowaway()); }, "capture 1 capture 2"},
+        {"convert to throw-away", StartState::Document, Opened(c_doc),
+         [](World& w) { return Numbered("convert", w.archive->ConvertToThrowAway()); },
+         "convert 1 convert 2 convert 3"},
+        {"extract", StartState::Document, Opened(c_doc),
+         [](World& w) { return std::string(w.archive->ExtractToRawData() ? "ok" : "null"); }, "null"},
+        {"back data", StartState::Document, Opened(c_doc), BackData,
+         "no back data not loaded backstore file 0 file 8 corrupt"},
+        {"offlining", StartState::Document, Opened(c_doc), Offlined, "offlining 1 offlining 2"},
+        {"migrate", StartState::Pair, Opened(c_scratch), Migrated, "migrate 4 migrate 6 open *"},
+        {"external update", StartState::Document, Opened(c_doc),
+         [](World& w) {
+             if (int const result = w.archive->ExternalUpdatePrepare()) return Numbered("prepare", result);
+             return std::string(w.archive->ExternalUpdateRestore() ? "ok" : "not restored");
+         },
+         "not restored"},
+        {"read all", StartState::Pair, Opened(c_scratch), ReadAll, "unreadable no thumbnails"},
+        {"read a stream", StartState::Document, Opened(c_doc), ReadStream, "no stream short corrupt file 8"},
+        {"save settings", StartState::Settings, Nothing, Settings, "false"},
+        {"load settings", StartState::Settings, Nothing, SettingsBack, "false"},
+    };
+    return list;
+}
+
+} // namespace
+
+std::vector<ArchiveOperation> const& GetArchiveOperations()
+{
+    static std::vector<ArchiveOperation> const list = MakeOperations();
+    return list;
+}
+
+std::string RunOperation(ArchiveOperation const& operation, World& world)
+{
+    try {
+        return operation.run(world);
+    } catch (ArchiveFileException const& e) {
+        return Numbered("file", static_cast<int>(e.GetReason())) == "ok"
+                   ? "file 0"
+                   : "file " + std::to_string(static_cast<int>(e.GetReason()));
+    } catch (OutStream::WriteException const&) {
+        return "write";
+    } catch (AbortException const&) {
+        return "abort";
+    } catch (ArchiveCorruptionException const&) {
+        return "corrupt";
+    } catch (BackstoreException const&) {
+        return "backstore";
+    } catch (FileIOException const&) {
+        return "stray FileIOException";
+    } catch (MemoryException const&) {
+        return "memory";
+    } catch (std::bad_alloc const&) {
+        return "memory";
+    } catch (...) {
+        return "stray exception";
+    }
+}
+
+bool IsNamed(ArchiveOperation const& operation, std::string const& result)
+{
+    std::string const list = " " + operation.failures + " ";
+    if (result == "ok" || list.find(" " + result + " ") != list.npos) return true;
+    size_t const blank = result.find(' ');
+    return blank != result.npos && list.find(" " + result.substr(0, blank) + " * ") != list.npos;
+}
+
+OperationDisk::OperationDisk()
+{
+    auto const& calls = Platform::GetFileCalls();
+    for (char const* folder : {"/ram/temp", "/ram/second"}) calls.makeFolder(folder);
+    std::vector<String8> rescued;
+    TempFile::SetTempPath(Str("/ram/temp"), Str("/ram/second"), rescued);
+    m_starts[StartState::Nothing] = {};
+    {
+        Counted<Archive> const archive = CreateDocument(c_doc);
+        Save(*archive, {{"a", std::string(1300, 'a')}, {"b", "short"}, {"gone", "x"}});
+        Save(*archive, {{"gone", std::nullopt}, {"b", std::string(300, 'b')}});
+        Save(*archive, {{"packed", std::string(700, 'o')}}, false, Archive::SessionTypeFull, true);
+        ArchiveSessionHandle handle;
+        archive->CreateSession(handle, Archive::SessionTypeFull, nullptr);
+        handle->CreateFile(Str("d"), MakeCounted<BytesItem>("d"));
+        handle->SetThumbnails(MakeThumbnails('o'));
+        archive->CloseSession(handle, false);
+        m_starts[StartState::Document] = m_disk.GetImage();
+        Archive::CreateResult result;
+        archive->AddScratchFile(Str(c_scratch), result);
+        Save(*archive, {{"a", std::string(1200, 's')}, {"e", "scratch"}}, true);
+    }
+    m_starts[StartState::Pair] = m_disk.GetImage();
+    m_starts[StartState::Damaged] = m_starts[StartState::Document];
+    std::string damaged = *m_starts[StartState::Document].at(c_doc);
+    damaged.replace(12, 40, 40, '\xff');
+    m_starts[StartState::Damaged][c_doc] = std::make_shared<std::string const>(damaged);
+    m_disk.Load({});
+    {
+        Archive::CreateResult result;
+        Counted<Archive> const archive = Archive::CreateAsScratch(Str(c_scratch), c_documentTag, nullptr, result);
+        Save(*archive, {{"a", "alone"}}, true);
+    }
+    m_starts[StartState::Alone] = m_disk.GetImage();
+    m_disk.Load({});
+    SerialiseToFile(
+        c_settings, "Sett", 1, [](OutSerialiser& out, IDTag tag) { out.SaveType(tag, 1); }, 6);
+    m_starts[StartState::Settings] = m_disk.GetImage();
+}
+
+OperationDisk::~OperationDisk()
+{
+    TempFile::SetTempPath(String8());
+}
+
+DiskView LookAtDisk(MemoryDisk& disk)
+{
+    DiskView view;
+    for (char const* path : {c_doc, c_scratch, c_new, c_moved}) {
+        PathView& one = view[path];
+        Archive::OpenResult result{};
+        Counted<Archive> archive = Archive::Open(Str(path), Archive::OpenModeReadOnly, c_documentTag, result);
+        one.recovered =
+            result == Archive::OpenCorrupt || result == Archive::OpenTruncated || result == Archive::OpenBadInfo;
+        if (one.recovered)
+            archive = Archive::RecoverArchive(Str(path), Archive::OpenModeReadOnly, c_documentTag, result);
+        one.result = result;
+        if (archive) one.items = GetAll(*archive);
+    }
+    MemoryDisk::Image const image = disk.GetImage();
+    auto const settings = image.find(c_settings);
+    if (settings != image.end()) view[c_settings].bytes = *settings->second;
+    return view;
+}
+
+std::string DescribeView(DiskView const& view)
+{
+    std::ostringstream text;
+    for (auto const& [path, one] : view) {
+        if (one.result == Archive::OpenNotFound) continue;
+        text << path << " result " << one.result << ":";
+        for (auto const& [name, bytes] : one.items) text << " " << name << "=" << bytes.substr(0, 3) << bytes.size();
+        text << (one.bytes.empty() ? "; " : " bytes; ");
+    }
+    return text.str();
+}
+
+// A whole copy under a name that is made up on the way.
+bool HasCopy(MemoryDisk& disk, PathView const& of)
+{
+    for (auto const& [path, bytes] : disk.GetImage()) {
+        if (path.find("/doc") == path.npos && path.find("/second/") == path.npos) continue;
+        Archive::OpenResult result{};
+        Counted<Archive> const archive = Archive::Open(Str(path), Archive::OpenModeReadOnly, c_documentTag, result);
+        if (archive && GetAll(*archive) == of.items) return true;
+    }
+    return false;
+}
+
+std::string CompareViews(DiskView const& found, DiskView const& before, DiskView const& after, bool succeeded)
+{
+    bool const masterMoved = !(found.at(c_doc) == before.at(c_doc)) || !(before.at(c_doc) == after.at(c_doc));
+    for (auto const& [path, one] : found) {
+        PathView const& old = before.at(path);
+        if (one == after.at(path) || (!succeeded && one == old)) continue;
+        bool const useless = one.result == Archive::OpenNotArchive || one.result == Archive::OpenCorrupt ||
+                             one.result == Archive::OpenBadInfo || one.result == Archive::OpenTruncated;
+        bool const isEmpty = one.result == Archive::OpenOk && one.items.empty();
+        if (!succeeded && old.result == Archive::OpenNotFound && (useless || isEmpty)) continue;
+        bool const isUnlinked =
+            one.result == Archive::OpenLinkMismatch || one.result == Archive::OpenLinkedNotFound || useless;
+        if (path == c_scratch && masterMoved && isUnlinked) continue;
+        return path + " is neither old nor new: " + DescribeView(found);
+    }
+    return {};
+}
+
+} // namespace KernelTest
