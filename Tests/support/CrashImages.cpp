@@ -194,7 +194,8 @@ private:
             for (u64 cut = 1; cut < size; ++cut) Torn(i, {.kept = true, .end = cut});
             if (write.offset >= c_fixedPart) return;
             for (u64 cut = 1; cut < size; ++cut) Torn(i, {.kept = true, .begin = cut});
-            for (unsigned mix = 1; mix <= m_plan.mixes; ++mix) Torn(i, {.kept = true, .mix = m_steps * 7919 + mix});
+            for (u64 mix = 1; mix <= m_plan.mixes * size / c_tornAnywhere; ++mix)
+                Torn(i, {.kept = true, .mix = m_steps * 7919 + mix});
             return;
         }
         u64 const first = (write.offset / c_sector + 1) * c_sector - write.offset;

@@ -10,8 +10,8 @@ namespace TestSupport {
 struct CrashPlan
 {
     unsigned seededSubsets = 60; ///< Where more than 12 changes are pending, beside the regular choices.
-    unsigned mixes = 40;         ///< Random byte mixes of old and new of each small record in the fixed part.
-    unsigned borders = 24;       ///< Places at which one longer write is torn, spread over it.
+    unsigned mixes = 40;   ///< Random byte mixes of old and new of each small record in the fixed part, for 64 bytes.
+    unsigned borders = 24; ///< Places at which one longer write is torn, spread over it.
 };
 
 /// Calls @p visit with the images that a power cut during the recording could leave, each with the number of steps that

@@ -424,8 +424,8 @@ protected:
 
     CrashSimulatorTest()
     {
-        m_plan = IsLongRun() ? TestSupport::CrashPlan{10'000, 2'000, 1'000} : TestSupport::CrashPlan{60, 60, 24};
-        m_secondCuts = IsLongRun() ? 1 : 2;
+        m_plan = IsLongRun() ? TestSupport::CrashPlan{10'000, 2'460, 1'000} : TestSupport::CrashPlan{60, 60, 24};
+        m_secondCuts = IsLongRun() ? 8 : 2;
     }
 
     Image MakeDocument(bool withScratch)
