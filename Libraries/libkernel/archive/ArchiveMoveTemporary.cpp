@@ -4,6 +4,8 @@
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/streams/FileIOException.h"
 
+#include <new>
+
 namespace Kernel {
 
 namespace {

@@ -23,7 +23,8 @@ Counted<FastFileInStream> FastFileInStream::Open(char const* path, u64 bufferSiz
     if (!buffer) return nullptr;
     Platform::FileHandle handle;
     if (!File::IsOpened(OpenPlatformFile(path, "rb", File::ShareMode::DenyNone, handle, nullptr))) return nullptr;
-    return new FastFileInStream(handle, std::move(buffer), bufferSize);
+    return MakeStreamOf<FastFileInStream>(handle,
+                                          [&] { return new FastFileInStream(handle, std::move(buffer), bufferSize); });
 }
 
 u64 FastFileInStream::ReadBlock(void* to, u64 count)

@@ -27,7 +27,8 @@ Counted<FastFileOutStream> FastFileOutStream::OpenI(char const* path, char const
     if (!File::IsOpened(OpenPlatformFile(path, mode, File::ShareMode::DenyNone, handle, nullptr))) return nullptr;
     u64 size = 0;
     if (placement == Placement::Append) Platform::GetFileCalls().getSize(handle, size);
-    return new FastFileOutStream(handle, std::move(buffer), bufferSize, placement, size);
+    return MakeStreamOf<FastFileOutStream>(
+        handle, [&] { return new FastFileOutStream(handle, std::move(buffer), bufferSize, placement, size); });
 }
 
 Counted<FastFileOutStream> FastFileOutStream::Create(char const* path, u64 bufferSize)

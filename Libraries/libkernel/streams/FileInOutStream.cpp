@@ -27,7 +27,7 @@ FileInOutStream::~FileInOutStream() = default;
 
 Counted<FileInOutStream> FileInOutStream::AdoptI(Platform::FileHandle handle, bool readOnly, bool isNew)
 {
-    return new FileInOutStream(handle, readOnly, isNew);
+    return MakeStreamOf<FileInOutStream>(handle, [&] { return new FileInOutStream(handle, readOnly, isNew); });
 }
 
 Counted<FileInOutStream> FileInOutStream::OpenI(char const* path, char const* mode, File::ShareMode share,

@@ -8,8 +8,8 @@
 
 namespace Kernel {
 
-FileInStream::FileInStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, u64 bufferSize, char const* path)
-    : FileReaderBase(handle, std::move(buffer), bufferSize), m_path(path)
+FileInStream::FileInStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, u64 bufferSize, String8 path)
+    : FileReaderBase(handle, std::move(buffer), bufferSize), m_path(std::move(path))
 {
 }
 
@@ -32,7 +32,10 @@ Counted<FileInStream> FileInStream::OpenEx(char const* path, File::OpenUnmanaged
     Platform::FileHandle handle;
     result = OpenPlatformFile(path, "rb", File::ShareMode::DenyNone, handle, nullptr);
     if (!File::IsOpened(result)) return nullptr;
-    return new FileInStream(handle, std::move(buffer), bufferSize, path);
+    return MakeStreamOf<FileInStream>(handle, [&] {
+        String8 name(path);
+        return new FileInStream(handle, std::move(buffer), bufferSize, std::move(name));
+    });
 }
 
 u64 FileInStream::ReadBlock(void* to, u64 count)

@@ -35,7 +35,7 @@ public:
     bool SeekInStream(SeekMethod method, i64 offset) override;
 
 private:
-    FileInStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, u64 bufferSize, char const* path);
+    FileInStream(Platform::FileHandle handle, std::unique_ptr<u8[]> buffer, u64 bufferSize, String8 path);
     ~FileInStream() override;
 
     String8 const m_path;

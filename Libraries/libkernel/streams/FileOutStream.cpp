@@ -27,7 +27,8 @@ Counted<FileOutStream> FileOutStream::OpenI(char const* path, char const* mode, 
     if (!File::IsOpened(result)) return nullptr;
     u64 size = 0;
     if (placement == Placement::Append) Platform::GetFileCalls().getSize(handle, size);
-    return new FileOutStream(handle, std::move(buffer), placement, size);
+    return MakeStreamOf<FileOutStream>(handle,
+                                       [&] { return new FileOutStream(handle, std::move(buffer), placement, size); });
 }
 
 Counted<FileOutStream> FileOutStream::Create(char const* path)

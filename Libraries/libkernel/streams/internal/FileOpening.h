@@ -1,5 +1,6 @@
 #pragma once
 
+#include "libkernel/core/Countable.h"
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/streams/File.h"
 
@@ -22,6 +23,19 @@ File::OpenUnmanagedResult OpenPlatformFile(char const* path, OpenMode const& mod
                                            String8* errorText);
 File::OpenUnmanagedResult OpenPlatformFile(char const* path, char const* mode, File::ShareMode share,
                                            Platform::FileHandle& handle, String8* errorText);
+
+/// Gives the stream that @p make makes of an open handle. The handle is closed when there is no memory for one; the
+/// stream's constructor, which owns it, may not throw.
+template <class Stream, class Make>
+Counted<Stream> MakeStreamOf(Platform::FileHandle handle, Make const& make)
+{
+    try {
+        return make();
+    } catch (...) {
+        Platform::GetFileCalls().close(handle);
+        throw;
+    }
+}
 
 /// Notes an error as an open does: in `errno` and in @p errorText, if given. Gives the result for it.
 File::OpenUnmanagedResult FailOpen(char const* path, int error, String8* errorText);
