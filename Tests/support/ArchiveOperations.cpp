@@ -17,6 +17,7 @@
 #include <condition_variable>
 #include <cstring>
 #include <mutex>
+#include <new>
 #include <sstream>
 
 namespace KernelTest {
@@ -55,6 +56,7 @@ Counted<ArchiveThumbnails> MakeThumbnails(char fill)
 {
     auto thumbnails = MakeCounted<ArchiveThumbnails>();
     auto data = MakeCounted<RawData>(200);
+    if (!data->GetData()) throw std::bad_alloc();
     std::memset(data->GetData(), fill, data->GetSize());
     thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, data);
     return thumbnails;
