@@ -1,6 +1,7 @@
 #include "support/FaultyFiles.h"
 
 #include <algorithm>
+#include <atomic>
 #include <map>
 #include <mutex>
 
@@ -28,7 +29,7 @@ struct OpenFile
 struct State
 {
     std::mutex mutex;
-    FileCalls const* next = nullptr;
+    std::atomic<FileCalls const*> next = nullptr; // Calls of other threads may be under way while tables change.
     std::vector<Planned> plans;
     int counts[static_cast<int>(FileCall::Count)] = {};
     int openHandles = 0;
@@ -116,7 +117,7 @@ IoResult MoveAt(FileCall call, FileHandle handle, Data* data, u64 size, u64 offs
 
 int Open(char const* path, OpenFlags const& flags, FileHandle& out)
 {
-    int const error = Pass(FileCall::Open, Text(path), s.next->open, path, flags, out);
+    int const error = Pass(FileCall::Open, Text(path), s.next.load()->open, path, flags, out);
     if (error) {
         out = c_noHandle;
         return error;
@@ -137,7 +138,7 @@ int Close(FileHandle handle)
         std::lock_guard const lock(s.mutex);
         if (s.files.erase(handle)) --s.openHandles;
     }
-    int const error = s.next->close(handle);
+    int const error = s.next.load()->close(handle);
     return strikes ? fault.error : error;
 }
 
@@ -145,7 +146,7 @@ int Flush(FileHandle handle, FlushKind kind)
 {
     Fault fault;
     bool const strikes = Strikes(FileCall::Flush, PathOf(handle), fault);
-    int const error = strikes ? fault.error : s.next->flush(handle, kind);
+    int const error = strikes ? fault.error : s.next.load()->flush(handle, kind);
     std::lock_guard const lock(s.mutex);
     OpenFile& file = s.files[handle];
     if (!error && file.known) file.flushed = Content(handle);
@@ -164,44 +165,52 @@ FileCalls MakeTable(FileCalls const& next)
     FileCalls t = next;
     t.open = Open;
     t.close = Close;
-    t.read = [](FileHandle h, void* d, u64 n) { return Move(C::Read, h, d, n, s.next->read); };
-    t.write = [](FileHandle h, void const* d, u64 n) { return Move(C::Write, h, d, n, s.next->write); };
-    t.readAt = [](FileHandle h, void* d, u64 n, u64 o) { return MoveAt(C::Read, h, d, n, o, s.next->readAt); };
-    t.writeAt = [](FileHandle h, void const* d, u64 n, u64 o) { return MoveAt(C::Write, h, d, n, o, s.next->writeAt); };
-    t.seek = [](FileHandle h, i64 o, SeekFrom f, u64& p) { return Pass(C::Seek, PathOf(h), s.next->seek, h, o, f, p); };
-    t.getSize = [](FileHandle h, u64& n) { return Pass(C::GetSize, PathOf(h), s.next->getSize, h, n); };
-    t.setSize = [](FileHandle h, u64 n) { return Pass(C::SetSize, PathOf(h), s.next->setSize, h, n); };
+    t.read = [](FileHandle h, void* d, u64 n) { return Move(C::Read, h, d, n, s.next.load()->read); };
+    t.write = [](FileHandle h, void const* d, u64 n) { return Move(C::Write, h, d, n, s.next.load()->write); };
+    t.readAt = [](FileHandle h, void* d, u64 n, u64 o) { return MoveAt(C::Read, h, d, n, o, s.next.load()->readAt); };
+    t.writeAt = [](FileHandle h, void const* d, u64 n, u64 o) {
+        return MoveAt(C::Write, h, d, n, o, s.next.load()->writeAt);
+    };
+    t.seek = [](FileHandle h, i64 o, SeekFrom f, u64& p) {
+        return Pass(C::Seek, PathOf(h), s.next.load()->seek, h, o, f, p);
+    };
+    t.getSize = [](FileHandle h, u64& n) { return Pass(C::GetSize, PathOf(h), s.next.load()->getSize, h, n); };
+    t.setSize = [](FileHandle h, u64 n) { return Pass(C::SetSize, PathOf(h), s.next.load()->setSize, h, n); };
     t.flush = Flush;
-    t.statHandle = [](FileHandle h, FileInfo& i) { return Pass(C::Stat, PathOf(h), s.next->statHandle, h, i); };
-    t.stat = [](char const* p, bool f, FileInfo& i) { return Pass(C::Stat, Text(p), s.next->stat, p, f, i); };
-    t.access = [](char const* p, Access a) { return Pass(C::Access, Text(p), s.next->access, p, a); };
+    t.statHandle = [](FileHandle h, FileInfo& i) { return Pass(C::Stat, PathOf(h), s.next.load()->statHandle, h, i); };
+    t.stat = [](char const* p, bool f, FileInfo& i) { return Pass(C::Stat, Text(p), s.next.load()->stat, p, f, i); };
+    t.access = [](char const* p, Access a) { return Pass(C::Access, Text(p), s.next.load()->access, p, a); };
     t.rename = [](char const* a, char const* b) {
-        return Pass(C::Rename, Text(a) + "\n" + Text(b), s.next->rename, a, b);
+        return Pass(C::Rename, Text(a) + "\n" + Text(b), s.next.load()->rename, a, b);
     };
-    t.unlink = [](char const* p) { return Pass(C::Unlink, Text(p), s.next->unlink, p); };
-    t.makeFolder = [](char const* p) { return Pass(C::MakeFolder, Text(p), s.next->makeFolder, p); };
-    t.removeFolder = [](char const* p) { return Pass(C::RemoveFolder, Text(p), s.next->removeFolder, p); };
-    t.readLink = [](char const* p, std::string& o) { return Pass(C::ReadLink, Text(p), s.next->readLink, p, o); };
+    t.unlink = [](char const* p) { return Pass(C::Unlink, Text(p), s.next.load()->unlink, p); };
+    t.makeFolder = [](char const* p) { return Pass(C::MakeFolder, Text(p), s.next.load()->makeFolder, p); };
+    t.removeFolder = [](char const* p) { return Pass(C::RemoveFolder, Text(p), s.next.load()->removeFolder, p); };
+    t.readLink = [](char const* p, std::string& o) {
+        return Pass(C::ReadLink, Text(p), s.next.load()->readLink, p, o);
+    };
     t.listFolder = [](char const* p, std::vector<FolderEntry>& e) {
-        return Pass(C::ListFolder, Text(p), s.next->listFolder, p, e);
+        return Pass(C::ListFolder, Text(p), s.next.load()->listFolder, p, e);
     };
-    t.flushFolder = [](char const* p) { return Pass(C::FlushFolder, Text(p), s.next->flushFolder, p); };
-    t.setTimes = [](char const* p, i64 a, i64 m) { return Pass(C::SetAttributes, Text(p), s.next->setTimes, p, a, m); };
+    t.flushFolder = [](char const* p) { return Pass(C::FlushFolder, Text(p), s.next.load()->flushFolder, p); };
+    t.setTimes = [](char const* p, i64 a, i64 m) {
+        return Pass(C::SetAttributes, Text(p), s.next.load()->setTimes, p, a, m);
+    };
     t.setTimesHandle = [](FileHandle h, i64 a, i64 m) {
-        return Pass(C::SetAttributes, PathOf(h), s.next->setTimesHandle, h, a, m);
+        return Pass(C::SetAttributes, PathOf(h), s.next.load()->setTimesHandle, h, a, m);
     };
-    t.setMode = [](char const* p, u32 m) { return Pass(C::SetAttributes, Text(p), s.next->setMode, p, m); };
+    t.setMode = [](char const* p, u32 m) { return Pass(C::SetAttributes, Text(p), s.next.load()->setMode, p, m); };
     t.setModeHandle = [](FileHandle h, u32 m) {
-        return Pass(C::SetAttributes, PathOf(h), s.next->setModeHandle, h, m);
+        return Pass(C::SetAttributes, PathOf(h), s.next.load()->setModeHandle, h, m);
     };
     t.getAttribute = [](char const* p, char const* n, std::string& v) {
-        return Pass(C::GetAttribute, Text(p), s.next->getAttribute, p, n, v);
+        return Pass(C::GetAttribute, Text(p), s.next.load()->getAttribute, p, n, v);
     };
     t.setAttribute = [](char const* p, char const* n, void const* d, u64 z) {
-        return Pass(C::SetAttributes, Text(p), s.next->setAttribute, p, n, d, z);
+        return Pass(C::SetAttributes, Text(p), s.next.load()->setAttribute, p, n, d, z);
     };
     t.removeAttribute = [](char const* p, char const* n) {
-        return Pass(C::SetAttributes, Text(p), s.next->removeAttribute, p, n);
+        return Pass(C::SetAttributes, Text(p), s.next.load()->removeAttribute, p, n);
     };
     return t;
 }

@@ -41,6 +41,7 @@ private:
     void SettleEntries();
     Archive::FileRevision const* FindEarlier(Archive::FileInfo const& info) const;
     void WriteTable();
+    void CutLeftovers();
     void ReserveMemory();
     bool WillDrop(Archive::Revision const& revision) const { return !m_file.m_isScratch && revision.IsScratch(); }
     void Publish();
@@ -90,6 +91,7 @@ void ArchiveCommit::Run(bool updateTimestamps)
 
         ReserveMemory();
         WriteTable();
+        CutLeftovers();
         FlushToDevice();
         Publish();
         Attempt([this] { RaiseVersion(); });
@@ -278,6 +280,14 @@ void ArchiveCommit::WriteTable()
     if (userDataSize != 0) appender.Append(m_revision.m_userData->GetData(), userDataSize);
     appender.Flush();
     PassGuard();
+}
+
+// An abandoned save may have left a whole table behind the end, of which the new one does not reach far enough to write
+// over. Should the info block be torn, a search would take it for the newest.
+void ArchiveCommit::CutLeftovers()
+{
+    if (m_file.m_stream->GetSizeInStream() <= m_revision.m_fileEnd) return;
+    if (!m_file.m_stream->Truncate(m_revision.m_fileEnd)) throw OutStream::WriteException();
 }
 
 // What the steps behind the commit need is taken before it: a save that stands must not fail for want of memory.
