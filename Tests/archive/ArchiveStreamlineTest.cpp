@@ -658,6 +658,51 @@ TEST_F(ArchiveStreamlineTest, NamesThatAreTakenArePassedOver)
     EXPECT_EQ(Listing(), "doc doc~backup doc~tmp ");
 }
 
+TEST_F(ArchiveStreamlineTest, SearchForANameIsGivenUpInTimeAndTheDocumentOverwritten)
+{
+    struct
+    {
+        std::string name;
+        int error;
+        int opens; ///< Of candidates, that is.
+    } const cases[] = {
+        {"~tmp", EIO, 3},     {"~tmp", EPERM, 29},     {"~tmp", EROFS, 1},
+        {"~backup", EIO, 30}, {"~backup", EAGAIN, 30}, {"~backup", EROFS, 1},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.name + " " + std::to_string(c.error));
+        Items const items = Make();
+        int opens = 0;
+        {
+            TestSupport::FaultyFiles files;
+            TestSupport::Fault fault;
+            fault.call = TestSupport::FileCall::Open;
+            fault.forEver = true;
+            fault.error = c.error;
+            fault.path = c.name;
+            files.Plan(fault);
+            files.SetObserver([&](TestSupport::FileCall call, std::string const& path) {
+                opens += call == TestSupport::FileCall::Open && path.find(c.name) != path.npos;
+            });
+            EXPECT_EQ(m_archive->Streamline(nullptr, nullptr, nullptr), Archive::StreamlineDone);
+        }
+        EXPECT_EQ(opens, c.opens);
+        ExpectCompact(*m_archive, items, c_streamlined);
+        EXPECT_EQ(Listing(), "doc ");
+        m_archive = nullptr;
+        std::filesystem::remove(m_path);
+    }
+    // Names that are taken count as none of these, up to the last.
+    for (int taken : {28, 29}) {
+        Items const items = Make();
+        for (int n = 1; n <= taken; ++n) WriteWhole(m_path + "~tmp" + (n > 1 ? std::to_string(n) : ""), "somebody's");
+        EXPECT_EQ(m_archive->Streamline(nullptr, nullptr, nullptr), Archive::StreamlineDone);
+        ExpectCompact(*m_archive, items, taken == 28 ? c_midStreamline : c_streamlined);
+        m_archive = nullptr;
+        std::filesystem::remove(m_path);
+    }
+}
+
 TEST_F(ArchiveStreamlineTest, OverwritingNeedsItsTemporaryFolder)
 {
     Make();
