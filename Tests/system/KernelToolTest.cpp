@@ -505,6 +505,15 @@ TEST_F(KernelToolTest, StreamlineLeavesTheItemsAndDropsTheRest)
     EXPECT_EQ(ReadWhole(m_doc), bytes);
 }
 
+TEST_F(KernelToolTest, RevisionOfAnUnknownKindIsShownByItsNumber)
+{
+    std::string bytes = ReadWhole(m_doc);
+    constexpr u64 c_tagOffset = 58;
+    bytes[RunJson({"archive", "info", m_doc})["master"]["firstFAT"].get<u64>() + c_tagOffset] = 9;
+    WriteWhole(m_doc, bytes);
+    EXPECT_THAT(Run({"archive", "history", m_doc}).out, HasSubstr("master, tag 9, file end"));
+}
+
 TEST_F(KernelToolTest, ProgressBarStaysOnStandardError)
 {
     ToolResult const always = Run({"archive", "verify", m_doc, "--json", "--progress", "always"});

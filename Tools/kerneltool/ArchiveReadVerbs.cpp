@@ -6,6 +6,7 @@
 #include "libkernel/platform/PlatformFile.h"
 
 #include <algorithm>
+#include <iterator>
 #include <map>
 
 // Verbs that look into a document and change nothing.
@@ -203,10 +204,12 @@ int RunHistory(Arguments const& arguments)
                            {"userDataSize", userDataSize},
                            {"entries", std::move(list)}});
         if (arguments.Has(Option::Json)) continue;
+        size_t const tag = revision.GetTag();
         Print((i ? "\n" : "") + std::string("revision ") + std::to_string(i) + "  " +
               FormatTime(revision.GetTimeStamp()) + "  " + PlaceOf(revision) + ", " +
-              c_tags[std::min<size_t>(revision.GetTag(), 2)] + ", file end " + FormatSize(revision.GetFileEnd()) +
-              (userDataSize ? ", user data " + FormatSize(userDataSize) : "") + "\n");
+              (tag < std::size(c_tags) ? c_tags[tag] : "tag " + std::to_string(tag)) + ", file end " +
+              FormatSize(revision.GetFileEnd()) + (userDataSize ? ", user data " + FormatSize(userDataSize) : "") +
+              "\n");
         table.Show();
     }
     if (arguments.Has(Option::Json)) PrintJson(history);

@@ -25,7 +25,7 @@ constexpr OptionInfo c_options[] = {
     {Option::Predictor, "--predictor", "BITS", "none|8|16|32", "store differences of numbers (default none)"},
     {Option::Striped, "--striped", nullptr, nullptr, "split the numbers into planes of their bytes"},
     {Option::UserData, "--user-data", "FILE", nullptr, "a block that the revision carries"},
-    {Option::Verify, "--verify", nullptr, nullptr, "read everything back after the commit"},
+    {Option::Verify, "--verify", nullptr, nullptr, "check the saved tables after the commit"},
     {Option::To, "--to", "NEW", nullptr, "write a compact copy to this new file"},
     {Option::Overwrite, "--overwrite", nullptr, nullptr, "write over the file instead of replacing it"},
     {Option::NoVerify, "--no-verify", nullptr, nullptr, "trust what was written"},
