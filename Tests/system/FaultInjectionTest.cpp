@@ -226,7 +226,10 @@ private:
         std::string const wrong = CompareViews(found, m_before, m_after, succeeded);
         PathView const& document = found.at("/ram/doc");
         bool const away = document.result == Archive::OpenNotFound || Archive::IsMidStreamlineFile(Str("/ram/doc"));
-        if (wrong.empty() || succeeded || !away || !HasCopy(m_disk.GetDisk(), m_before.at("/ram/doc"))) return wrong;
+        if (wrong.empty() || succeeded || !away) return wrong;
+        bool const hasCopy =
+            HasCopy(m_disk.GetDisk(), m_before.at("/ram/doc")) || HasCopy(m_disk.GetDisk(), m_after.at("/ram/doc"));
+        if (!hasCopy) return wrong;
         DiskView other = found;
         other["/ram/doc"] = m_before.at("/ram/doc");
         return CompareViews(other, m_before, m_after, succeeded);
