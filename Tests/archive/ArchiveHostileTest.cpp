@@ -441,6 +441,19 @@ TEST_F(ArchiveHostileTest, BlockTagInPlaceOfTheGuardReadsAndTakesNoSave)
     EXPECT_EQ(ReadWhole(m_path), builder.Build());
 }
 
+TEST_F(ArchiveHostileTest, OldFileWithoutABlockInFrontTakesNoSave)
+{
+    ArchiveBuilder builder(7);
+    builder.AddRaw("####");
+    builder.AddFile(1, "a", "1");
+    R result{};
+    Counted<Archive> archive = Open(builder.Build(), result);
+    ASSERT_TRUE(archive);
+    EXPECT_FALSE(Save(*archive, {{"b", "2"}}));
+    archive = nullptr;
+    EXPECT_EQ(ReadWhole(m_path), builder.Build());
+}
+
 TEST_F(ArchiveHostileTest, LongHistoriesOpenAndGoInTime)
 {
     // 100,000 tables of one record each, over two blocks.

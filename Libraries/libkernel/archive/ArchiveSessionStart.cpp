@@ -50,6 +50,22 @@ bool Archive::CreateFileEnumerationSession(ArchiveSessionHandle& handle, bool co
     return m->CreateSessionI(handle, SessionTypeFull, ChoiceNone, abort, false) == SessionOk;
 }
 
+// The first save of a file without a guard makes it one of today's version. Readers of those take a block for the guard
+// that is not there, and nothing else: with anything else in that place the save would make the file unreadable.
+static bool CanBecomeCurrent(Archive::ArchiveFile& file)
+{
+    CriticalSectionScope const lock(file.m_lock);
+    // With a link or a reference path in that place it stays what it is.
+    if ((file.m_flags & (c_flagLink | c_flagReference)) != 0 || file.m_fileEnd <= c_guardPos) return true;
+    u8 tag[c_blockTagSize];
+    try {
+        return file.m_stream && file.m_stream->ReadAt(c_guardPos, tag, sizeof(tag)) == sizeof(tag) &&
+               LoadLittleEndian<u32>(tag) == c_tagBlock;
+    } catch (FileIOException const&) {
+        return false;
+    }
+}
+
 ArchiveImpl::GuardResult ArchiveImpl::PassWriteGuard(Archive::ArchiveFile& file, bool acceptBlockTag)
 {
     CriticalSectionScope const lock(file.m_lock);
@@ -221,7 +237,12 @@ bool ArchiveImpl::OpenForSession(Archive::ArchiveFile& file)
             m_lastRestore = Archive::RestoreNotTheFile;
             return false;
         }
-        if (file.m_fileVersion < c_guardVersion) return true;
+        if (file.m_fileVersion < c_guardVersion) {
+            if (CanBecomeCurrent(file)) return true;
+            CriticalSectionScope const lock(m_accessLock);
+            m_lastRestore = Archive::RestoreNotTheFile;
+            return false;
+        }
         GuardResult const guard = PassWriteGuard(file, false);
         if (guard == GuardResult::Ok) return true;
         CriticalSectionScope const lock(m_accessLock);
