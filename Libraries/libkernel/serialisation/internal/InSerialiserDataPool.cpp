@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstdlib>
+#include <new>
 
 namespace Kernel {
 
@@ -14,7 +15,9 @@ Counted<InSerialiserDataPoolBucket> InSerialiserDataPoolBucket::Create(u64 size)
     if (size > static_cast<u64>(PTRDIFF_MAX)) return nullptr;
     u8* const block = static_cast<u8*>(std::malloc(size));
     if (!block) return nullptr;
-    return Counted<InSerialiserDataPoolBucket>(new InSerialiserDataPoolBucket(block, size));
+    auto* const bucket = new (std::nothrow) InSerialiserDataPoolBucket(block, size);
+    if (!bucket) std::free(block);
+    return Counted<InSerialiserDataPoolBucket>(bucket);
 }
 
 InSerialiserDataPoolBucket::~InSerialiserDataPoolBucket()
