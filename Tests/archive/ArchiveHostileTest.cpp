@@ -441,6 +441,24 @@ TEST_F(ArchiveHostileTest, BlockTagInPlaceOfTheGuardReadsAndTakesNoSave)
     EXPECT_EQ(ReadWhole(m_path), builder.Build());
 }
 
+TEST_F(ArchiveHostileTest, TableInTheFixedPartIsNone)
+{
+    // It would be written over by the next save.
+    ArchiveBuilder builder;
+    builder.link = ArchiveBuilder::Link{0, 0, std::string(4, '\xFF') + std::string("#FAT") + std::string(60, '\0')};
+    builder.firstFAT = 90;
+    std::string bytes = builder.Build();
+    bytes[6] = 0; // Without the flag the link is the beginning of the content, and the table is read.
+    R result{};
+    EXPECT_TRUE(Open(bytes, result)) << result;
+    bytes[6] = 1;
+    EXPECT_FALSE(Open(bytes, result));
+    EXPECT_EQ(result, R::OpenCorrupt);
+    WriteWhole(m_path, bytes);
+    EXPECT_FALSE(Archive::RecoverArchive(Str(m_path), Archive::OpenModeReadOnly, IDTag(), result));
+    EXPECT_EQ(result, R::OpenCorrupt);
+}
+
 TEST_F(ArchiveHostileTest, OldFileWithoutABlockInFrontTakesNoSave)
 {
     ArchiveBuilder builder(7);

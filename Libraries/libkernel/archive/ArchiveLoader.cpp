@@ -200,6 +200,8 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     }
 
     bool const hasTable = data.revisions.size() > before;
+    // A table in the fixed part would not outlive the next save.
+    if (hasTable && data.revisions.front()->m_fatPos < front.contentPos) return Archive::OpenCorrupt;
     TakeEnd(source, front, hasTable ? data.revisions[data.revisions.size() - before - 1].Get() : nullptr, highestUID,
             file, data);
     return Archive::OpenOk;
@@ -384,6 +386,7 @@ Result ArchiveLoader::TestArchive(ArchiveSource& source, IDTag tag, Archive::Arc
         FATHeader fat;
         FATKind const* kind = nullptr;
         bool const newest = position == front.info.firstFAT;
+        if (position < front.contentPos) return Archive::OpenCorrupt;
         if (Result const walked = ReadFATHeader(source, position, newest, fat, kind)) return walked;
         position = fat.nextFAT;
     }

@@ -39,8 +39,12 @@ private:
 class FATSearch
 {
 public:
-    /// Tables older than @p oldest are dead ones.
-    FATSearch(ArchiveSource& source, TimeStamp oldest) : m_source(source), m_oldest(oldest) {}
+    /// What looks like a table before @p contentPos lies in the fixed part, which the next save writes over; tables
+    /// older than @p oldest are dead ones.
+    FATSearch(ArchiveSource& source, u64 contentPos, TimeStamp oldest)
+        : m_source(source), m_contentPos(contentPos), m_oldest(oldest)
+    {
+    }
 
     /// Finds all tables and joins them to the tree.
     void Run()
@@ -105,7 +109,7 @@ private:
 
     void Add(u64 position)
     {
-        if (m_previous.count(position)) return;
+        if (position < m_contentPos || m_previous.count(position)) return;
         FATHeader header;
         FATKind const* kind = nullptr;
         if (ArchiveLoader::ReadFATHeader(m_source, position, false, header, kind) != Archive::OpenOk) return;
@@ -116,6 +120,7 @@ private:
     }
 
     ArchiveSource& m_source;
+    u64 const m_contentPos;
     TimeStamp const m_oldest;
     std::vector<u64> m_hits;
     std::map<u64, u64> m_previous; // NextFAT of each table found.
@@ -154,7 +159,9 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
     if (!front.infoDamaged) {
         ArchiveLoadData fresh = data;
         u32 highestUID = 0;
-        if (LoadFATChain(source, counted, fresh, front.info.firstFAT, highestUID) == Archive::OpenOk)
+        bool const isWhole = LoadFATChain(source, counted, fresh, front.info.firstFAT, highestUID) == Archive::OpenOk;
+        bool const hasTable = fresh.revisions.size() > data.revisions.size();
+        if (isWhole && !(hasTable && fresh.revisions.front()->m_fatPos < front.contentPos))
             return take(fresh, front.info.firstFAT, highestUID);
     }
     // A scratch file depends on the exact state of its master, and of a state that had to be searched nobody can say
@@ -162,7 +169,8 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
     if (isLinked) return Archive::OpenCorrupt;
 
     // What a scratch file held before its master was saved lies behind the front until it is written over.
-    FATSearch search(source, front.HasLink() ? front.linkSaveTimeStamp : TimeStamp(std::numeric_limits<i64>::min()));
+    FATSearch search(source, front.contentPos,
+                     front.HasLink() ? front.linkSaveTimeStamp : TimeStamp(std::numeric_limits<i64>::min()));
     search.Run();
     constexpr int maxContradictions = 16; // Each may cost a walk to the oldest table.
     int contradictions = 0;
@@ -173,7 +181,9 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
             ArchiveLoadData fresh = data;
             u32 highestUID = 0;
             u64 failedAt = 0;
-            if (LoadFATChain(source, counted, fresh, entry->m_position, highestUID, &failedAt) == Archive::OpenOk)
+            bool const isWhole =
+                LoadFATChain(source, counted, fresh, entry->m_position, highestUID, &failedAt) == Archive::OpenOk;
+            if (isWhole && fresh.revisions.front()->m_fatPos >= front.contentPos)
                 return take(fresh, entry->m_position, highestUID);
             if (failedAt == 0 && ++contradictions == maxContradictions) return Archive::OpenCorrupt;
             FATEntry* const bad = search.Find(failedAt);
