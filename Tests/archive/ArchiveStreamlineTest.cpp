@@ -9,7 +9,6 @@
 #include "libkernel/streams/InStream.h"
 #include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
-#include "support/CrashRecorder.h"
 #include "support/FakeClock.h"
 #include "support/FaultyFiles.h"
 #include "support/TempFolder.h"

@@ -352,9 +352,9 @@ std::vector<ArchiveOperation> MakeOperations()
              return Streamlined(w.archive->StreamlineAndVerifyFileState(report, &w.abort, nullptr, nullptr));
          },
          "streamline 2 streamline 3 streamline 4 streamline 6 streamline 7 streamline 8"},
-        {"streamline by overwriting", StartState::Document,
+        {"streamline by overwriting", StartState::Pair,
          [](World& w) {
-             OpenIn(w, c_doc);
+             OpenIn(w, c_scratch);
              w.archive->SetAlwaysStreamlineOverwrite(true);
          },
          [](World& w) { return Streamlined(w.archive->Streamline(&w.abort, nullptr, nullptr)); },

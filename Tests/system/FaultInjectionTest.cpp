@@ -95,6 +95,7 @@ std::vector<Fault> MakeFaults()
         {FileCall::Unlink, {EACCES, EBUSY}},
         {FileCall::Stat, {EIO}},
         {FileCall::ListFolder, {EIO}},
+        {FileCall::SetAttributes, {EIO}},
     };
     std::vector<Fault> faults;
     for (auto const& kind : kinds)
