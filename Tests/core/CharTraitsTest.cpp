@@ -1,5 +1,8 @@
 #include "libkernel/core/CharTraits.h"
 
+#include "support/Rows.h"
+
+#include <algorithm>
 #include <gtest/gtest.h>
 #include <memory>
 #include <random>
@@ -37,29 +40,28 @@ int SlowValidLength(std::string const& text, bool allowZero)
 TEST(CharTraitsTest, ValidLengthStopsAtTheStartOfABadCodePoint)
 {
     using namespace std::string_literals;
-    struct Case
+    for (auto const& [what, text, valid] :
+         Rows<char const*, std::string, int>{{"cut two-byte sequence", "abc\xC3", 3},
+                                             {"text ending in F0", "ab\xF0", 2},
+                                             {"cut four-byte sequence", "\xF0\x9F\x98", 0},
+                                             {"continuation in lead place", "a\x80", 1},
+                                             {"lead above F7", "a\xF8\x80\x80\x80\x80", 1},
+                                             {"bad continuation", "a\xE2\x82z", 1},
+                                             {"overlong is not looked for", "\xC0\x80\xE0\x80\x80", 5},
+                                             {"surrogate is not looked for", "\xED\xA0\x80", 3},
+                                             {"whole", "a\xC3\xA9\xF0\x9F\x98\x80", 7},
+                                             {"zero", "0123456789abcdefgh\0i"s, 18},
+                                             {"zero in last place", "ab\0"s, 2},
+                                             {"empty", "", 0}})
     {
-        char const* what;
-        std::string text;
-        int valid;
-    };
-    for (Case const& c :
-         {Case{"cut two-byte sequence", "abc\xC3", 3}, Case{"text ending in F0", "ab\xF0", 2},
-          Case{"cut four-byte sequence", "\xF0\x9F\x98", 0}, Case{"continuation in lead place", "a\x80", 1},
-          Case{"lead above F7", "a\xF8\x80\x80\x80\x80", 1}, Case{"bad continuation", "a\xE2\x82z", 1},
-          Case{"overlong is not looked for", "\xC0\x80\xE0\x80\x80", 5},
-          Case{"surrogate is not looked for", "\xED\xA0\x80", 3}, Case{"whole", "a\xC3\xA9\xF0\x9F\x98\x80", 7},
-          Case{"zero", "0123456789abcdefgh\0i"s, 18}, Case{"zero in last place", "ab\0"s, 2}, Case{"empty", "", 0}})
-    {
-        SCOPED_TRACE(c.what);
-        int const n = static_cast<int>(c.text.size());
-        EXPECT_EQ(Utf8::GetValidLength(c.text.data(), n, false), c.valid);
-        EXPECT_EQ(Utf8::IsValid(c.text.data(), n, false), c.valid == n);
+        int const n = static_cast<int>(text.size());
+        EXPECT_EQ(Utf8::GetValidLength(text.data(), n, false), valid) << what;
+        EXPECT_EQ(Utf8::IsValid(text.data(), n, false), valid == n) << what;
     }
     EXPECT_TRUE(Utf8::IsValid("a\0b", 3, true));
 }
 
-TEST(CharTraitsTest, ValidLengthAgreesWithTheByteRuleOnDamagedText)
+TEST(CharTraitsTest, ValidLengthAndCountAgreeWithTheByteRulesOnDamagedText)
 {
     std::mt19937 random(11);
     for (int round = 0; round < 20000; ++round) {
@@ -74,16 +76,17 @@ TEST(CharTraitsTest, ValidLengthAgreesWithTheByteRuleOnDamagedText)
         // A block of the exact size, so that a read past the end shows under a checker.
         std::unique_ptr<char[]> const exact(new char[text.size()]);
         std::copy(text.begin(), text.end(), exact.get());
+        int const length = static_cast<int>(text.size());
         for (bool allowZero : {false, true})
-            ASSERT_EQ(Utf8::GetValidLength(exact.get(), static_cast<int>(text.size()), allowZero),
-                      SlowValidLength(text, allowZero));
+            ASSERT_EQ(Utf8::GetValidLength(exact.get(), length, allowZero), SlowValidLength(text, allowZero));
+        auto const leads = std::ranges::count_if(text, [](char c) { return (static_cast<u8>(c) & 0xC0) != 0x80; });
+        ASSERT_EQ(Utf8::GetLengthInCodePoints(exact.get(), length), leads);
     }
 }
 
 TEST(CharTraitsTest, ValidLengthOfWiderTextStopsAtLoneSurrogates)
 {
-    std::u16string const text = u"a\xD83D\xDE00"
-                                u"b";
+    std::u16string const text = u"a\U0001F600b";
     EXPECT_EQ(Utf16::GetValidLength(text.data(), 4, false), 4);
     EXPECT_EQ(Utf16::GetValidLength(text.data(), 2, false), 1);
     EXPECT_EQ(Utf16::GetValidLength(text.data() + 2, 2, false), 0);
@@ -99,24 +102,17 @@ TEST(CharTraitsTest, ValidLengthOfWiderTextStopsAtLoneSurrogates)
 
 TEST(CharTraitsTest, DecodingGoesByTheLeadByteAlone)
 {
-    struct Case
+    for (auto const& [bytes, codePoint, length] : Rows<char const*, u32, int>{{"a", 'a', 1},
+                                                                              {"\xC3\xA9", 0xE9, 2},
+                                                                              {"\xE2\x82\xAC", 0x20AC, 3},
+                                                                              {"\xF0\x9F\x98\x80", 0x1F600, 4},
+                                                                              {"\200A", 1, 2},
+                                                                              {"\xF7\xBF\xBF\xBF", 0x1FFFFF, 4}})
     {
-        char const* bytes;
-        u32 codePoint;
-        int length;
-    };
-    for (Case const& c : {Case{"a", 'a', 1}, Case{"\xC3\xA9", 0xE9, 2}, Case{"\xE2\x82\xAC", 0x20AC, 3},
-                          Case{"\xF0\x9F\x98\x80", 0x1F600, 4},
-                          Case{"\x80"
-                               "A",
-                               1, 2},
-                          Case{"\xF7\xBF\xBF\xBF", 0x1FFFFF, 4}})
-    {
-        SCOPED_TRACE(c.bytes);
-        char const* p = c.bytes;
-        EXPECT_EQ(Utf8::NextCodePoint(p), c.codePoint);
-        EXPECT_EQ(p - c.bytes, c.length);
-        EXPECT_EQ(Utf8::GetCodePointLength(c.bytes[0]), c.length);
+        char const* p = bytes;
+        EXPECT_EQ(Utf8::NextCodePoint(p), codePoint);
+        EXPECT_EQ(p - bytes, length) << bytes;
+        EXPECT_EQ(Utf8::GetCodePointLength(bytes[0]), length);
     }
 }
 
@@ -135,40 +131,6 @@ TEST(CharTraitsTest, CodePointsAreFoundFromTheirUnits)
     EXPECT_TRUE(Utf16::IsCodePointEnd(wide, 3));
     EXPECT_EQ(Utf16::GetLengthInCodePoints(wide, 4), 3);
     EXPECT_EQ(Utf16::MakeCodePoint(0xD83D, 0xDE00), 0x1F600u);
-}
-
-TEST(CharTraitsTest, LongTextIsCountedByLeads)
-{
-    std::string text;
-    for (int i = 0; i < 100; ++i) text += "ab\xE2\x82\xAC\xF0\x9F\x98\x80";
-    for (size_t cut = 0; cut < 9; ++cut) {
-        int leads = 0;
-        for (size_t i = cut; i < text.size(); ++i) leads += (static_cast<u8>(text[i]) & 0xC0) != 0x80;
-        EXPECT_EQ(Utf8::GetLengthInCodePoints(text.data() + cut, static_cast<int>(text.size() - cut)), leads);
-    }
-}
-
-TEST(CharTraitsTest, BytesAbove127SortBeforeAscii)
-{
-    EXPECT_LT(Utf8::Compare("\xC3\xA9", "a"), 0);
-    EXPECT_GT(Utf16::Compare(u"\u00E9", u"a"), 0);
-    EXPECT_LT(Utf8::Compare("0123456789abX", "0123456789abY"), 0);
-    EXPECT_EQ(Utf8::Compare("0123456789", 10, "0123456789abc", 13), -3);
-    unsigned int const low[] = {0};
-    unsigned int const high[] = {0xFFFFFFFF};
-    EXPECT_LT(Utf32::Compare(low, 1, high, 1), 0);
-}
-
-TEST(CharTraitsTest, TrimmingTakesSpacesTabsAndLineFeedsOnly)
-{
-    char text[] = " \t\n\ra b\r \n\t";
-    int n = Utf8::TrimLeft(text, static_cast<int>(strlen(text)));
-    EXPECT_STREQ(text, "\ra b\r \n\t");
-    n = Utf8::TrimRight(text, n);
-    EXPECT_STREQ(text, "\ra b\r");
-    EXPECT_EQ(n, 5);
-    char blank[] = " \n ";
-    EXPECT_EQ(Utf8::TrimLeft(blank, 3), 0);
 }
 
 } // namespace

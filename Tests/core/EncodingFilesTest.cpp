@@ -1,16 +1,15 @@
 #include "libkernel/core/StringEncoding.h"
+#include "support/Rows.h"
 
-#include <cstring>
 #include <functional>
 #include <gtest/gtest.h>
-#include <iconv.h>
 #include <memory>
 #include <set>
 #include <unicode/ucnv.h>
 #include <unicode/utf16.h>
 
-// The generated mapping files against the converters of ICU and of the C library, both ways over all codes and all code
-// points. They were made from other sources, so that a difference is either a fault or a known one of the peers.
+// The generated mapping files against ICU's converters, both ways over all codes and all code points. They were made
+// from other sources, so that a difference is either a fault or a known one of the peer.
 
 using namespace Kernel;
 
@@ -54,140 +53,44 @@ Peer MakeIcu(char const* name)
             }};
 }
 
-// Bytes through iconv; the units that came out, as one number, when they are few and nothing was left.
-template <size_t n>
-size_t Convert(iconv_t handle, char (&in)[n], size_t size, char* out, size_t room)
-{
-    char* from = in;
-    char* to = out;
-    size_t left = room;
-    iconv(handle, nullptr, nullptr, nullptr, nullptr);
-    if (iconv(handle, &from, &size, &to, &left) != 0 || size != 0) return 0;
-    if (iconv(handle, nullptr, nullptr, &to, &left) != 0) return 0; // Some hold a character back.
-    return room - left;
-}
-
-Peer MakeIconv(char const* name)
-{
-    auto const open = [](char const* to, char const* from) {
-        iconv_t const handle = iconv_open(to, from);
-        return std::shared_ptr<void>(handle, [](iconv_t h) {
-            if (h != reinterpret_cast<iconv_t>(-1)) iconv_close(h);
-        });
-    };
-    auto const decoder = open("UTF-32LE", name);
-    auto const encoder = open(name, "UTF-32LE");
-    if (decoder.get() == reinterpret_cast<iconv_t>(-1) || encoder.get() == reinterpret_cast<iconv_t>(-1)) return {};
-    return {[decoder](u32 code) -> u32 {
-                char two[] = {static_cast<char>(code >> 8), static_cast<char>(code)};
-                char one[] = {static_cast<char>(code)};
-                u32 out[4];
-                char* const to = reinterpret_cast<char*>(out);
-                size_t const n =
-                    code > 0xFF ? Convert(decoder.get(), two, 2, to, 16) : Convert(decoder.get(), one, 1, to, 16);
-                return n == 4 ? out[0] : c_none;
-            },
-            [encoder](u32 codePoint) -> u32 {
-                char in[4];
-                std::memcpy(in, &codePoint, 4);
-                char out[8];
-                size_t const n = Convert(encoder.get(), in, 4, out, 8);
-                u32 const first = static_cast<u8>(out[0]);
-                return n == 1 ? first : n == 2 ? first << 8 | static_cast<u8>(out[1]) : c_none;
-            }};
-}
-
-enum class Side
-{
-    Icu,
-    Iconv
-};
-
-// The peers' converters with stored state, the C library's for 1255 and 1258, are left out, and so is its MAC-IS, which
-// is another table: it has 2020 at A0 and the dashes at D0 and D1 swapped.
-struct Row
-{
-    CodePage codePage; // Or -1, and then the script and language.
-    int script;
-    int language;
-    char const* icu;
-    char const* iconv;
-};
-
-constexpr Row c_rows[] = {
-    {775, 0, 0, "ibm-775", "CP775"},
-    {874, 0, 0, "windows-874", "CP874"},
-    {932, 0, 0, "windows-31j", "CP932"},
-    {949, 0, 0, "windows-949-2000", "CP949"},
-    {950, 0, 0, "windows-950-2000", "CP950"},
-    {1250, 0, 0, "windows-1250", "CP1250"},
-    {1251, 0, 0, "windows-1251", "CP1251"},
-    {1252, 0, 0, "windows-1252", "CP1252"},
-    {1253, 0, 0, "windows-1253", "CP1253"},
-    {1254, 0, 0, "windows-1254", "CP1254"},
-    {1255, 0, 0, "windows-1255", nullptr},
-    {1258, 0, 0, "windows-1258", nullptr},
-    {10000, 0, 0, "macos-0_2-10.2", "MACINTOSH"},
-    {10006, 0, 0, "macos-6_2-10.4", nullptr},
-    {10007, 0, 0, "macos-7_3-10.2", "MAC-CYRILLIC"},
-    {10029, 0, 0, "macos-29-10.2", "MAC-CENTRALEUROPE"},
-    {10081, 0, 0, "macos-35-10.2", nullptr},
-    {-1, 0, 20, "macos-6_2-10.4", nullptr},
-    {-1, 29, 0, "macos-29-10.2", "MAC-CENTRALEUROPE"},
-};
-
 struct Known
 {
     char const* name;
-    Side side;
     u32 first; // Codes.
     u32 last;
 };
 
 constexpr Known c_known[] = {
-    // ICU has the control codes of the PC's own terminals.
-    {"CP775", Side::Icu, 0x1A, 0x1A},
-    {"CP775", Side::Icu, 0x1C, 0x1C},
-    {"CP775", Side::Icu, 0x7F, 0x7F},
-    {"CP932", Side::Icu, 0x1A, 0x1A},
-    {"CP932", Side::Icu, 0x1C, 0x1C},
-    {"CP932", Side::Icu, 0x7F, 0x7F},
+    // The control codes of the PC's own terminals.
+    {"CP775", 0x1A, 0x1C},
+    {"CP775", 0x7F, 0x7F},
+    {"CP932", 0x1A, 0x1C},
+    {"CP932", 0x7F, 0x7F},
     // Bytes that Windows maps though the code page has no characters there.
-    {"CP932", Side::Icu, 0x80, 0x80},
-    {"CP932", Side::Icu, 0xA0, 0xA0},
-    {"CP932", Side::Icu, 0xFD, 0xFF},
-    {"CP932", Side::Iconv, 0x80, 0x80},
-    {"CP932", Side::Iconv, 0xA0, 0xA0},
-    {"CP932", Side::Iconv, 0xFD, 0xFF},
-    {"CP950", Side::Iconv, 0x80, 0x80},
-    {"CP1253", Side::Icu, 0xAA, 0xAA},
+    {"CP932", 0x80, 0x80},
+    {"CP932", 0xA0, 0xA0},
+    {"CP932", 0xFD, 0xFF},
+    {"CP1253", 0xAA, 0xAA},
     // A row for the user's own characters, where the file has the Kana and Cyrillic that fonts have there.
-    {"CP950", Side::Icu, 0xC6A1, 0xC8FE},
-    {"CP950", Side::Iconv, 0xC6A1, 0xC8FE},
-    // The C library took its tables before the euro sign, the increment sign and the apple came in.
-    {"Roman", Side::Iconv, 0xC6, 0xC6},
-    {"Roman", Side::Iconv, 0xF0, 0xF0},
-    {"Cyrillic", Side::Iconv, 0xFF, 0xFF},
+    {"CP950", 0xC6A1, 0xC8FE},
 };
 
 struct Comparison
 {
     StringEncoding const& ours;
     Peer peer;
-    Side side;
 
     bool IsKnown(u32 code) const
     {
         for (Known const& known : c_known)
-            if (ours.GetName() == known.name && side == known.side && code >= known.first && code <= known.last)
-                return true;
+            if (ours.GetName() == known.name && code >= known.first && code <= known.last) return true;
         return false;
     }
 
-    // The peers pass on what has no character: bytes as control characters, and all else by the private use area.
+    // The peer passes on what has no character: bytes as control characters, and all else by the private use area.
     bool IsPassedOn(u32 mine, u32 code, u32 codePoint) const
     {
-        bool const isControl = side == Side::Icu && code == codePoint && code >= 0x80 && code <= 0x9F;
+        bool const isControl = code == codePoint && code >= 0x80 && code <= 0x9F;
         return mine == c_none && (isControl || (codePoint >= 0xE000 && codePoint <= 0xF8FF));
     }
 
@@ -197,7 +100,7 @@ struct Comparison
         std::set<u32> codePoints;
         for (u32 code = 0; code < 0x10000; code = code == 0xFF ? 0x8000 : code + 1) {
             u32 const high = code >> 8;
-            // A lead byte alone is no character to the peers, and a pair behind another byte is two.
+            // A lead byte alone is no character to the peer, and a pair behind another byte is two.
             if (high == 0 && ours.IsVariableLength() && ours.IsLeadByte(static_cast<u8>(code))) continue;
             if (high != 0 && (!ours.IsVariableLength() || peer.decode(high) != c_none)) continue;
             u32 const mine = ours.ToUnicode(code);
@@ -229,46 +132,67 @@ struct Comparison
 
 TEST(EncodingFiles, AgreeWithOtherConverters)
 {
-    for (Row const& row : c_rows) {
-        auto const encoding =
-            row.codePage >= 0 ? StringEncoding::Make(row.codePage) : StringEncoding::Make(row.script, row.language);
-        for (Side const side : {Side::Icu, Side::Iconv}) {
-            char const* const name = side == Side::Icu ? row.icu : row.iconv;
-            if (!name) continue;
-            SCOPED_TRACE(std::string(encoding->GetName().GetData()) + " against " + name);
-            ASSERT_FALSE(encoding->IsIdentity());
-            Peer const peer = side == Side::Icu ? MakeIcu(name) : MakeIconv(name);
-            ASSERT_TRUE(peer.decode);
-            Comparison const comparison{*encoding, peer, side};
-            std::set<u32> codePoints = comparison.CompareCodes();
-            EXPECT_GT(codePoints.size(), 200u);
-            for (u32 c = 0; c < 0x3100; ++c) codePoints.insert(c);
-            comparison.CompareCodePoints(codePoints);
-        }
+    // A code page, or -1 and then the script and language.
+    for (auto const& [codePage, script, language, name] :
+         Rows<CodePage, int, int, char const*>{{775, 0, 0, "ibm-775"},
+                                               {874, 0, 0, "windows-874"},
+                                               {932, 0, 0, "windows-31j"},
+                                               {949, 0, 0, "windows-949-2000"},
+                                               {950, 0, 0, "windows-950-2000"},
+                                               {1250, 0, 0, "windows-1250"},
+                                               {1251, 0, 0, "windows-1251"},
+                                               {1252, 0, 0, "windows-1252"},
+                                               {1253, 0, 0, "windows-1253"},
+                                               {1254, 0, 0, "windows-1254"},
+                                               {1255, 0, 0, "windows-1255"},
+                                               {1258, 0, 0, "windows-1258"},
+                                               {10000, 0, 0, "macos-0_2-10.2"},
+                                               {10006, 0, 0, "macos-6_2-10.4"},
+                                               {10007, 0, 0, "macos-7_3-10.2"},
+                                               {10029, 0, 0, "macos-29-10.2"},
+                                               {10081, 0, 0, "macos-35-10.2"},
+                                               {-1, 0, 20, "macos-6_2-10.4"},
+                                               {-1, 29, 0, "macos-29-10.2"}})
+    {
+        auto const encoding = codePage >= 0 ? StringEncoding::Make(codePage) : StringEncoding::Make(script, language);
+        SCOPED_TRACE(std::string(encoding->GetName().GetData()) + " against " + name);
+        ASSERT_FALSE(encoding->IsIdentity());
+        Peer const peer = MakeIcu(name);
+        ASSERT_TRUE(peer.decode);
+        Comparison const comparison{*encoding, peer};
+        std::set<u32> codePoints = comparison.CompareCodes();
+        EXPECT_GT(codePoints.size(), 200u);
+        for (u32 c = 0; c < 0x3100; ++c) codePoints.insert(c);
+        comparison.CompareCodePoints(codePoints);
     }
 }
 
-// What no peer knows: a published value or two of each, on both sides of the line between one byte and two.
+// What the peer doesn't know: a published value or two of each, on both sides of the line between one byte and two.
 TEST(EncodingFiles, HaveThePublishedCharacters)
 {
-    struct
+    for (auto const& [script, language, code, codePoint] : Rows<int, int, u32, u32>{{1, 0, 0x82A0, 0x3042},
+                                                                                    {1, 0, 0x80, 0x5C},
+                                                                                    {2, 0, 0xA440, 0x4E00},
+                                                                                    {3, 0, 0xB0A1, 0xAC00},
+                                                                                    {4, 0, 0xC7, 0x627},
+                                                                                    {4, 48, 0xB0, 0x6F0},
+                                                                                    {5, 0, 0xE0, 0x5D0},
+                                                                                    {8, 0, 0x61, 0x3B1},
+                                                                                    {9, 0, 0xB3, 0x915},
+                                                                                    {10, 0, 0xB3, 0xA15},
+                                                                                    {11, 0, 0xB3, 0xA95},
+                                                                                    {21, 0, 0xA1, 0xE01},
+                                                                                    {21, 0, 0xE8, 0xE48},
+                                                                                    {25, 0, 0xB0A1, 0x554A},
+                                                                                    {0, 21, 0xA0, 0xDD},
+                                                                                    {0, 25, 0xA9, 0x160},
+                                                                                    {0, 39, 0xAF, 0x218},
+                                                                                    {0, 24, 0xDA, 0x11E}})
     {
-        int script;
-        int language;
-        u32 code;
-        u32 codePoint;
-    } const cases[] = {
-        {1, 0, 0x82A0, 0x3042}, {1, 0, 0x80, 0x5C},      {2, 0, 0xA440, 0x4E00}, {3, 0, 0xB0A1, 0xAC00},
-        {4, 0, 0xC7, 0x627},    {4, 48, 0xB0, 0x6F0},    {5, 0, 0xE0, 0x5D0},    {8, 0, 0x61, 0x3B1},
-        {9, 0, 0xB3, 0x915},    {10, 0, 0xB3, 0xA15},    {11, 0, 0xB3, 0xA95},   {21, 0, 0xA1, 0xE01},
-        {21, 0, 0xE8, 0xE48},   {25, 0, 0xB0A1, 0x554A}, {0, 21, 0xA0, 0xDD},    {0, 25, 0xA9, 0x160},
-        {0, 39, 0xAF, 0x218},   {0, 24, 0xDA, 0x11E},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(testing::Message() << "script " << c.script << ", language " << c.language);
-        auto const encoding = StringEncoding::Make(c.script, c.language);
-        EXPECT_EQ(encoding->ToUnicode(c.code), c.codePoint);
-        EXPECT_EQ(encoding->FromUnicode(c.codePoint, c_none), c.code);
+        SCOPED_TRACE(testing::Message() << "script " << script << ", language " << language);
+        auto const encoding = StringEncoding::Make(script, language);
+        EXPECT_EQ(encoding->ToUnicode(code), codePoint);
+        EXPECT_EQ(encoding->FromUnicode(codePoint, c_none), code);
     }
     auto const pdf = StringEncoding::MakePdfDocEncoding();
     EXPECT_EQ(pdf->ToUnicode("\x18\x80\x92\x9E\xA0\xAD\xE9", 7), "\u02D8\u2022\u2122\u017E\u20AC\uFFFF\u00E9");
