@@ -17,59 +17,43 @@ u32 CrcBitByBit(u8 const* p, u64 count)
     return ~crc;
 }
 
-TEST(CRC32Test, PublishedValues)
+TEST(CRC32Test, PublishedValuesAndMissingData)
 {
     struct Case
     {
         char const* text;
         u32 crc;
     };
-    for (Case const& c :
-         {Case{"", 0u}, Case{"a", 0xE8B7BE43u}, Case{"abc", 0x352441C2u}, Case{"123456789", 0xCBF43926u},
-          Case{"IEND", 0xAE426082u}, Case{"The quick brown fox jumps over the lazy dog", 0x414FA339u}})
-    {
-        u32 crc = 1;
+    u32 crc = 1;
+    for (Case const& c : {Case{"", 0u}, Case{"123456789", 0xCBF43926u}, Case{"IEND", 0xAE426082u}}) {
         EXPECT_TRUE(CRC32::StringCRC32(c.text, crc));
         EXPECT_EQ(crc, c.crc) << c.text;
     }
-    std::vector<u8> const zeros(32, 0);
-    u32 crc = 1;
-    EXPECT_TRUE(CRC32::Instance().DataCRC32(zeros.data(), zeros.size(), crc));
-    EXPECT_EQ(crc, 0x190A55ADu);
     EXPECT_FALSE(CRC32::DataCRC32(nullptr, 1, crc));
     EXPECT_FALSE(CRC32::StringCRC32(nullptr, crc));
     EXPECT_TRUE(CRC32::DataCRC32(nullptr, 0, crc));
 }
 
-TEST(CRC32Test, EveryLengthAndAlignmentAgreesWithTheDefinition)
+TEST(CRC32Test, EveryLengthAndAlignmentAgreesWithTheDefinitionWholeAndInPieces)
 {
     std::mt19937 random(1);
     std::vector<u8> data(800);
     for (u8& b : data) b = static_cast<u8>(random());
     for (u64 start = 0; start < 16; ++start)
         for (u64 length = 0; length <= 700; ++length) {
+            u32 const expected = CrcBitByBit(data.data() + start, length);
             u32 crc = 0;
             CRC32::DataCRC32(data.data() + start, length, crc);
-            ASSERT_EQ(crc, CrcBitByBit(data.data() + start, length)) << start << " " << length;
+            ASSERT_EQ(crc, expected) << start << " " << length;
+            CRC32::BeginCRC32(crc);
+            if (length > 0) CRC32::CalcCRC32(data[start], crc);
+            for (u64 at = 1, piece; at < length; at += piece) {
+                piece = std::min<u64>(1 + random() % 400, length - at);
+                CRC32::CalcCRC32(data.data() + start + at, piece, crc);
+            }
+            CRC32::EndCRC32(crc);
+            ASSERT_EQ(crc, expected) << start << " " << length << " in pieces";
         }
-}
-
-TEST(CRC32Test, PiecesGiveTheSameAsTheWhole)
-{
-    std::mt19937 random(2);
-    std::vector<u8> data(100000);
-    for (u8& b : data) b = static_cast<u8>(random());
-    u32 crc;
-    CRC32::BeginCRC32(crc);
-    for (u64 at = 0, piece; at < data.size(); at += piece) {
-        piece = std::min<u64>(random() % 700, data.size() - at);
-        if (piece == 1)
-            CRC32::CalcCRC32(data[at], crc);
-        else
-            CRC32::CalcCRC32(data.data() + at, piece, crc);
-    }
-    CRC32::EndCRC32(crc);
-    EXPECT_EQ(crc, CrcBitByBit(data.data(), data.size()));
 }
 
 } // namespace

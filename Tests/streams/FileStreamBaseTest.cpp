@@ -23,7 +23,7 @@ using TestSupport::ReadWholeFile;
 using TestSupport::WriteWholeFile;
 using Reason = FileIOException::Reason;
 
-/// Notes what it is told, and takes itself off the stream meanwhile if asked to.
+/// Notes what it is told, and takes itself off the stream and throws if asked to.
 class Handler : public FileStreamErrorHandler
 {
 public:
@@ -32,13 +32,13 @@ public:
     {
         reasons.push_back(reason);
         EXPECT_TRUE(fatal);
-        if (leave) leave->SetErrorHandler(nullptr);
-        if (throws) throw 42;
+        if (!leave) return;
+        leave->SetErrorHandler(nullptr);
+        throw 42;
     }
 
     std::vector<Reason> reasons;
     FileStreamBase* leave = nullptr;
-    bool throws = false;
 };
 
 // Failures that each stream must report once, and survive. The operation gets a fresh stream on a file of 5,000 bytes
@@ -69,7 +69,6 @@ char g_bytes[8192];
 std::vector<FaultCase> MakeFaultCases()
 {
     auto in = [](char const* p) { return Counted<Countable>(FileInStream::Open(p)); };
-    auto raw = [](char const* p) { return Counted<Countable>(FileInStream::Open(p, true)); };
     auto fastIn = [](char const* p) { return Counted<Countable>(FastFileInStream::Open(p, 0)); };
     auto out = [](char const* p) { return Counted<Countable>(FileOutStream::Append(p)); };
     auto fastOut = [](char const* p) { return Counted<Countable>(FastFileOutStream::Append(p, 0)); };
@@ -94,7 +93,6 @@ std::vector<FaultCase> MakeFaultCases()
     Fault const eio{.call = FileCall::Read, .error = EIO};
     Fault const half{.call = FileCall::Read, .error = EIO, .part = Fault::Part::Half};
     Fault const full{.call = FileCall::Write, .error = ENOSPC};
-    Fault const fullHalf{.call = FileCall::Write, .error = ENOSPC, .part = Fault::Part::AllButOne};
     Fault const device{.call = FileCall::Flush, .error = EIO};
     Fault const setSize{.call = FileCall::SetSize, .error = EIO};
     Fault const getSize{.call = FileCall::GetSize, .error = EACCES};
@@ -102,17 +100,14 @@ std::vector<FaultCase> MakeFaultCases()
     Reason const space = Reason::OutOfSpace;
     return {
         {"plain read", eio, lost, in, read},
-        {"plain read, half", half, lost, in, readLots},
         {"plain copy", half, lost, in, copy},
         {"plain size", getSize, Reason::AccessDenied, in, size},
         {"plain seek", getSize, Reason::AccessDenied, in, seekEnd},
-        {"unbuffered read", eio, lost, raw, read},
         {"fast read", eio, lost, fastIn, read},
         {"fast read, half", half, lost, fastIn, readLots},
         {"fast copy", eio, lost, fastIn, copy},
         {"plain write past the buffer", full, space, out, writeLots},
         {"plain write held back", full, space, out, writeAndFlush},
-        {"plain write, nearly all", fullHalf, space, out, writeLots},
         {"plain write, seek", full, space, out, seekWithBytes},
         {"plain write at a position", full, space, out, patch},
         {"plain device flush", device, lost, out, toDevice},
@@ -126,7 +121,6 @@ std::vector<FaultCase> MakeFaultCases()
         {"in and out read", eio, lost, both, read},
         {"in and out copy", half, lost, both, copy},
         {"in and out write", full, space, both, write},
-        {"in and out write, quota", {.call = FileCall::Write, .error = EDQUOT}, Reason::Other, both, write},
         {"in and out write at a position", full, space, both, patch},
         {"in and out device flush", device, lost, both, toDevice},
         {"in and out truncate", setSize, lost, both, truncate},
@@ -155,7 +149,7 @@ protected:
         }
         if (auto* out = dynamic_cast<OutStream*>(&stream)) {
             EXPECT_EQ(out->WriteBlock(g_bytes, 8192), 0u);
-            EXPECT_TRUE(out->Flush() && out->ForceFlush());
+            EXPECT_TRUE(out->Flush() && out->ForceFlush()); // The device is not asked again, which might say yes.
         }
         for (FileCall const call : {FileCall::Read, FileCall::Write, FileCall::Flush, FileCall::GetSize})
             EXPECT_EQ(m_faults.GetCount(call), 0) << "a broken stream touches no file";
@@ -164,49 +158,39 @@ protected:
     FaultyFiles m_faults;
 };
 
-TEST_F(FileStreamBaseTest, WithoutAHandlerTheFirstFailureIsThrownOnce)
+TEST_F(FileStreamBaseTest, TheFirstFailureIsThrownOnceOrToldToTheHandler)
 {
-    for (FaultCase const& c : MakeFaultCases()) {
-        SCOPED_TRACE(c.what);
-        WriteWholeFile(m_path, Pattern(5000));
-        Counted<Countable> stream = c.open(m_path.c_str());
-        m_faults.Plan(c.fault);
-        try {
-            c.failing(*stream);
-            ADD_FAILURE() << "nothing was thrown";
-        } catch (FileIOException const& e) {
-            EXPECT_EQ(e.GetReason(), c.reason);
+    for (FaultCase const& c : MakeFaultCases())
+        for (bool const handles : {false, true}) {
+            SCOPED_TRACE(c.what);
+            WriteWholeFile(m_path, Pattern(5000));
+            Counted<Countable> stream = c.open(m_path.c_str());
+            auto handler = MakeCounted<Handler>();
+            if (handles) As<FileStreamBase>(*stream).SetErrorHandler(handler);
+            m_faults.Plan(c.fault);
+            try {
+                EXPECT_TRUE(c.failing(*stream));
+                EXPECT_TRUE(handles) << "nothing was thrown";
+            } catch (FileIOException const& e) {
+                EXPECT_EQ(e.GetReason(), c.reason);
+                EXPECT_FALSE(handles);
+            }
+            EXPECT_TRUE(m_faults.HasFired());
+            m_faults.Clear();
+            ExpectBroken(*stream, c.reason);
+            EXPECT_EQ(handler->reasons.size(), handles ? 1u : 0u);
+            std::string const left = ReadWholeFile(m_path);
+            stream.Reset();
+            EXPECT_EQ(ReadWholeFile(m_path), left) << "a broken stream writes nothing more when it goes";
+            EXPECT_EQ(m_faults.GetOpenHandles(), 0);
         }
-        EXPECT_TRUE(m_faults.HasFired());
-        m_faults.Clear();
-        ExpectBroken(*stream, c.reason);
-        stream.Reset();
-        EXPECT_EQ(m_faults.GetOpenHandles(), 0);
-    }
 }
 
-TEST_F(FileStreamBaseTest, AHandlerIsToldOnceAndTheCallComesUpShort)
-{
-    for (FaultCase const& c : MakeFaultCases()) {
-        SCOPED_TRACE(c.what);
-        WriteWholeFile(m_path, Pattern(5000));
-        Counted<Countable> stream = c.open(m_path.c_str());
-        auto handler = MakeCounted<Handler>();
-        As<FileStreamBase>(*stream).SetErrorHandler(handler);
-        m_faults.Plan(c.fault);
-        EXPECT_TRUE(c.failing(*stream));
-        m_faults.Clear();
-        ExpectBroken(*stream, c.reason);
-        EXPECT_EQ(handler->reasons, (std::vector<Reason>{c.reason}));
-    }
-}
-
-TEST_F(FileStreamBaseTest, AHandlerMayThrowOrTakeItselfOff)
+TEST_F(FileStreamBaseTest, AHandlerMayThrowAndTakeItselfOff)
 {
     Counted<FileInOutStream> stream = FileInOutStream::Open(m_path.c_str());
     auto handler = MakeCounted<Handler>();
     handler->leave = stream.Get();
-    handler->throws = true;
     stream->SetErrorHandler(handler);
     handler.Reset(); // Only the stream holds it, and it lets go in the middle of the call.
     m_faults.Plan({.call = FileCall::Write, .error = EIO});
@@ -232,23 +216,6 @@ TEST_F(FileStreamBaseTest, AShortWriteWithoutAnErrorIsACountWhereTheCallerSeesIt
         ADD_FAILURE() << "the loss went unreported";
     } catch (FileIOException const& e) {
         EXPECT_EQ(e.GetReason(), Reason::NoError);
-    }
-}
-
-TEST_F(FileStreamBaseTest, ADeviceFlushThatFailedIsNotTriedAgain)
-{
-    for (bool const fast : {false, true}) {
-        std::string const path = m_folder / "out";
-        Counted<FileOutStream> plain = fast ? nullptr : FileOutStream::Create(path.c_str());
-        Counted<FastFileOutStream> quick = fast ? FastFileOutStream::Create(path.c_str(), 0) : nullptr;
-        OutStream& out = fast ? static_cast<OutStream&>(*quick) : *plain;
-        Write(out, "abc");
-        m_faults.ResetCounts();
-        m_faults.Plan({.call = FileCall::Flush, .error = EIO, .loseWrites = true});
-        EXPECT_THROW(out.ForceFlush(), FileIOException);
-        m_faults.Clear();
-        out.ForceFlush();
-        EXPECT_EQ(m_faults.GetCount(FileCall::Flush), 1);
     }
 }
 
@@ -287,49 +254,28 @@ TEST_F(FileStreamBaseTest, CloseWritesWhatIsHeldAndClosesWhateverFails)
             }
 }
 
-TEST_F(FileStreamBaseTest, ABrokenStreamWritesNothingMoreWhenItGoes)
-{
-    std::string const path = m_folder / "out";
-    {
-        Counted<FileOutStream> out = FileOutStream::Create(path.c_str());
-        Write(*out, "lost");
-        m_faults.Plan({.call = FileCall::GetSize, .error = EIO});
-        EXPECT_THROW(static_cast<void>(out->GetSizeOutStream()), FileIOException);
-        m_faults.Clear();
-        EXPECT_TRUE(out->Close());
-    }
-    EXPECT_EQ(ReadWholeFile(path), "");
-    EXPECT_EQ(m_faults.GetOpenHandles(), 0);
-}
-
 TEST_F(FileStreamBaseTest, AClosedStreamAnswersWithoutAFile)
 {
     Counted<FileInOutStream> both = FileInOutStream::Open(m_path.c_str());
     Counted<FileInStream> in = FileInStream::Open(m_path.c_str());
     Counted<FastFileInStream> fastIn = FastFileInStream::Open(m_path.c_str(), 0);
     EXPECT_TRUE(both->Close() && in->Close() && fastIn->Close());
-    for (InStreamSeekable* s : {static_cast<InStreamSeekable*>(both.Get()), static_cast<InStreamSeekable*>(in.Get()),
-                                static_cast<InStreamSeekable*>(fastIn.Get())})
-    {
-        EXPECT_EQ(s->ReadBlock(g_bytes, 10), 0u);
-        EXPECT_FALSE(s->Rewind());
-        EXPECT_TRUE(s->EOS());
-        EXPECT_EQ(s->GetSizeInStream(), 0u);
+    for (InStreamSeekable* s : std::vector<InStreamSeekable*>{both.Get(), in.Get(), fastIn.Get()}) {
+        EXPECT_EQ(s->ReadBlock(g_bytes, 10) + s->GetSizeInStream(), 0u);
+        EXPECT_TRUE(!s->Rewind() && s->EOS());
     }
     EXPECT_EQ(both->WriteBlock("x", 1), 0u);
-    EXPECT_FALSE(both->Truncate(0) || both->Recreate() || both->UpdateTimestamps());
+    EXPECT_FALSE(both->Truncate(0) || both->Recreate() || both->UpdateTimestamps() || both->IsBroken());
     EXPECT_TRUE(both->Flush() && both->ForceFlush() && both->Close());
-    EXPECT_FALSE(both->IsBroken());
 }
 
 TEST_F(FileStreamBaseTest, FilesCopyByTheGeneralLoopAndHandOverToOthers)
 {
     std::string const text = Pattern((1 << 20) + 100);
     WriteWholeFile(m_path, text);
-    auto in = [&] { return FileInStream::Open(m_path.c_str()); };
     ProgressLog log;
     auto memory = MakeCounted<MemoryInOutStream>();
-    EXPECT_TRUE(in()->CopyToStream(*memory, &log));
+    EXPECT_TRUE(FileInStream::Open(m_path.c_str())->CopyToStream(*memory, &log));
     EXPECT_TRUE(Content(*memory) == text);
     EXPECT_EQ(log.reports.size(), 2u) << "the memory stream's own copy, in pieces because the file is slow";
 
@@ -338,12 +284,11 @@ TEST_F(FileStreamBaseTest, FilesCopyByTheGeneralLoopAndHandOverToOthers)
         EXPECT_TRUE(copy()) << what; // The streams are gone when it returns, so their last bytes are written.
         EXPECT_TRUE(ReadWholeFile(target) == text) << what;
     };
-    expectCopied("file to file", [&] { return in()->CopyToStream(*FileOutStream::Create(target.c_str())); });
     expectCopied("fast to fast", [&] {
         return FastFileOutStream::Create(target.c_str(), 0)->CopyFromStream(*FastFileInStream::Open(m_path.c_str(), 0));
     });
-    expectCopied("in and out", [&] {
-        return FileInOutStream::Create(target.c_str())->CopyFromStream(*FileInOutStream::OpenReadOnly(m_path.c_str()));
+    expectCopied("both to plain", [&] {
+        return FileInOutStream::OpenReadOnly(m_path.c_str())->CopyToStream(*FileOutStream::Create(target.c_str()));
     });
     memory->Rewind();
     expectCopied("memory to file", [&] { return FileInOutStream::Create(target.c_str())->CopyFromStream(*memory); });

@@ -1,6 +1,6 @@
-#include "libkernel/streams/LimitedStreams.h"
-
 #include "StreamTestSupport.h"
+#include "libkernel/streams/ForwardBiasedSeekableInStream.h"
+#include "libkernel/streams/LimitedStreams.h"
 
 #include <gtest/gtest.h>
 
@@ -18,8 +18,6 @@ TEST(LimitedStreamsTest, AReaderSeesAWindowThatStartsWhereTheSourceStood)
     EXPECT_TRUE(in->SkipBlock(1));
     EXPECT_EQ(ReadAll(*in, 3), "3456");
     EXPECT_TRUE(in->EOS());
-    EXPECT_FALSE(source->EOS());
-    EXPECT_EQ(in->Tell(), 5u);
     EXPECT_EQ(in->Remaining(), 0u);
     EXPECT_TRUE(in->SkipBlock(100)) << "a skip is cut to the limit";
     EXPECT_EQ(source->Tell(), 7u);
@@ -46,9 +44,43 @@ TEST(LimitedStreamsTest, AWriterPassesOnWhatIsAllowedAndRemembersTheRest)
     EXPECT_EQ(target->GetReferenceCount(), 2);
     EXPECT_EQ(Write(*borrowed, "0123456789"), 4u);
     EXPECT_TRUE(borrowed->WasExceeded());
-    EXPECT_EQ(borrowed->GetSize(), 4u);
     EXPECT_EQ(borrowed->Tell(), 4u);
     EXPECT_EQ(target->text, "123456abcd0123");
+}
+
+TEST(ForwardBiasedSeekableInStreamTest, SeeksForwardAlwaysAndBackWhereTheSourceRewinds)
+{
+    struct Case
+    {
+        SeekMethod method;
+        i64 offset;
+        bool plain, rewindable;
+        u64 expected; // From 40 of 100, where it succeeds.
+    };
+    for (Case const& c : {
+             Case{SeekMethod::Current, 5, true, true, 45},
+             Case{SeekMethod::Current, 0, true, true, 40},
+             Case{SeekMethod::Current, -5, false, true, 35},
+             Case{SeekMethod::Beginning, 41, true, true, 41},
+             Case{SeekMethod::Beginning, 39, false, true, 39},
+             Case{SeekMethod::End, -10, true, true, 90},
+             Case{SeekMethod::Current, -41, false, false, 0},
+             Case{SeekMethod::End, 1, false, false, 0},
+             Case{SeekMethod::End, INT64_MAX, false, false, 0},
+             Case{SeekMethod::Beginning, INT64_MIN, false, false, 0},
+             Case{static_cast<SeekMethod>(3), 0, false, false, 0},
+         })
+        for (bool const rewindable : {false, true}) {
+            SCOPED_TRACE(testing::Message() << int(c.method) << " " << c.offset << " " << rewindable);
+            PlainSource source(Pattern(100));
+            source.rewindable = rewindable;
+            source.SkipBlock(40);
+            ForwardBiasedSeekableInStream in(source);
+            bool const expected = rewindable ? c.rewindable : c.plain;
+            EXPECT_EQ(in.Seek(c.method, c.offset), expected);
+            EXPECT_EQ(in.Tell(), expected ? c.expected : 40u);
+            EXPECT_EQ(in.Rewind(), rewindable);
+        }
 }
 
 } // namespace
