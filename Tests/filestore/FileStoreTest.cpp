@@ -155,14 +155,19 @@ TEST_F(FileStoreTest, DroppedRevisionsLeaveBackDataWhereNothingElseWould)
     EXPECT_TRUE(h[1]->IsDead());
 }
 
-TEST_F(FileStoreTest, DroppedRevisionIsForgottenThoughCopyingFails)
+TEST_F(FileStoreTest, CopyThatFailsKeepsNothingAlive)
 {
     Revision const r = a->Put("x", "X");
     Counted<DelayLoadHolder> const x = a->Hold("x");
     a->onCreateBackData = [] { throw BackstoreException(true); };
+    Kernel::Test::TraceCapture const capture;
     EXPECT_THROW(a->RemoveDelayLoadLinks({r}), BackstoreException);
+    EXPECT_EQ(0u, Kernel::Test::TraceCapture::GetText().find("== BackstoreException"));
     EXPECT_FALSE(x->IsBackedBy(*a));
-    EXPECT_NE(x, a->Hold("x"));
+    Counted<DelayLoadHolder> const again = a->Hold("x");
+    EXPECT_NE(x, again);
+    a.Reset();
+    EXPECT_TRUE(again->IsDead());
 }
 
 TEST_F(FileStoreTest, PreFileDeleteAsksForEachHolderAndTakesTheChosenOnes)
@@ -227,15 +232,8 @@ TEST_F(FileStoreTest, StoreThatLetsGoOfItsHoldersLivesOn)
     Counted<DelayLoadHolder> const again = a->Hold("x");
     EXPECT_NE(x, again);
     EXPECT_TRUE(again->HasLivingOwner());
-}
-
-TEST_F(FileStoreTest, EndOfAStoreSurvivesAFailingCopy)
-{
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const x = a->Hold("x");
-    a->onCreateBackData = [] { throw BackstoreException(true); };
-    a.Reset();
-    EXPECT_TRUE(x->IsDead());
+    a->broken = true;
+    EXPECT_FALSE(again->HasLivingOwner());
 }
 
 TEST_F(FileStoreTest, HolderThatDiesWhileItsStoreIsDetachedLeavesNoTrace)
@@ -251,85 +249,70 @@ TEST_F(FileStoreTest, HolderThatDiesWhileItsStoreIsDetachedLeavesNoTrace)
     EXPECT_EQ("X2", TextOf(a->Hold("x")));
 }
 
-TEST_F(FileStoreTest, BrokenStoreIsNoLivingOwner)
-{
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
-    EXPECT_TRUE(holder->HasLivingOwner());
-    a->broken = true;
-    EXPECT_FALSE(holder->HasLivingOwner());
-}
-
-TEST_F(FileStoreTest, BackDataGoesToTheHolderOfThePath)
+TEST_F(FileStoreTest, BackDataOfItsRevisionGoesToTheHolderOfThePath)
 {
     a->Put("x", "X");
     Counted<FileStoreBackData const> const data(new MemoryBackData("copy"));
     a->AddBackData("x", data);
     Counted<DelayLoadHolder> const holder = a->Hold("x");
-    EXPECT_FALSE(holder->GetBackData());
     a->AddBackData("x", nullptr);
-    a->AddBackData("x", data);
+    a->AddBackData("x", nullptr, data); // Of a revision that the holder has left.
+    EXPECT_FALSE(holder->GetBackData());
+    a->AddBackData("x", RevisionIn(*a, holder), data);
     EXPECT_EQ(data, holder->GetBackData());
     EXPECT_EQ("copy", TextOf(holder));
-}
 
-TEST_F(FileStoreTest, BackDataOfARevisionThatTheHolderHasLeftIsRefused)
-{
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
-    NonCounted<FileStoreRevision const> revision;
-    ASSERT_TRUE(holder->IsBackedBy(*a, revision));
-    Counted<FileStoreBackData const> const data(new MemoryBackData("copy"));
-    a->AddBackData("x", nullptr, data);
-    EXPECT_FALSE(holder->GetBackData());
-    a->AddBackData("x", revision, data);
-    EXPECT_EQ(data, holder->GetBackData());
+    Counted<FileStoreBackData const> const late(new MemoryBackData("late"));
+    a->Put("y", "Y");
+    Counted<DelayLoadHolder> const other = a->Hold("y");
+    a->AddBackData("y", late);
+    EXPECT_EQ(late, other->GetBackData());
 }
 
 TEST(FileStoreItemType, LastRegistrationOfAClassWins)
 {
-    static FileStoreItemType const s_first(ClassUID("Ts01"), MemoryItem::c_plain.GetCreateFunc(),
-                                           FileStoreItemType::IsNestableType, FileStoreItemType::NotRecoverable);
-    static FileStoreItemType const s_second(ClassUID("Ts01"), MemoryItem::c_plain.GetCreateFunc(),
-                                            FileStoreItemType::NotNestable, FileStoreItemType::IsRecoverableType);
+    static FileStoreItemType const s_first(ClassUID("Ts01"), nullptr, FileStoreItemType::IsNestableType,
+                                           FileStoreItemType::NotRecoverable);
+    static FileStoreItemType const s_second(ClassUID("Ts01"), nullptr, FileStoreItemType::NotNestable,
+                                            FileStoreItemType::IsRecoverableType);
     FileStoreItemType::Init const first(s_first);
-    EXPECT_EQ(&s_first, FileStoreItemType::FindFileStoreItemType(ClassUID("Ts01")));
     FileStoreItemType::Init const second(s_second);
     EXPECT_EQ(&s_second, FileStoreItemType::FindFileStoreItemType(ClassUID("Ts01")));
-    EXPECT_EQ(nullptr, FileStoreItemType::FindFileStoreItemType(ClassUID("none")));
-    EXPECT_TRUE(s_first.IsNestable() && !s_first.IsRecoverable());
-    EXPECT_TRUE(!s_second.IsNestable() && s_second.IsRecoverable());
 }
 
 TEST(VoidFileStore, HasNothingAndTakesNothing)
 {
     VoidFileStore& store = VoidFileStore::GetInstance();
     Counted<MemoryItem> const item(new MemoryItem);
-    EXPECT_FALSE(store.LoadFile("x", *item));
-    EXPECT_FALSE(store.LoadFile("x", nullptr, *item, true));
-    EXPECT_FALSE(store.CreateBackData(nullptr, "x"));
-    EXPECT_FALSE(store.IsBroken());
+    EXPECT_FALSE(store.LoadFile("x", *item) || store.LoadFile("x", nullptr, *item, true) ||
+                 store.CreateBackData(nullptr, "x") || store.IsBroken());
     EXPECT_FALSE(store.CreateDelayLoadHolderDirect("x", &MemoryItem::c_plain, nullptr));
-    Counted<DelayLoadHolder> const holder = store.CreateDelayLoadHolderDirect("x", &MemoryItem::c_recoverable, nullptr);
-    ASSERT_TRUE(holder);
-    EXPECT_TRUE(holder->IsDead());
-
+    EXPECT_TRUE(store.CreateDelayLoadHolderDirect("x", &MemoryItem::c_recoverable, nullptr)->IsDead());
     VoidFileStoreOut& out = VoidFileStoreOut::GetInstance();
-    EXPECT_EQ(&store, &out.GetFileStore());
-    EXPECT_TRUE(out.IsFullSave());
-    String8 path("before");
-    EXPECT_FALSE(out.GenerateIndexedPath({"a", "b"}, item, holder, path));
+    EXPECT_TRUE(&store == &out.GetFileStore() && out.IsFullSave());
     EXPECT_FALSE(out.AddProlongedObject(item)) << "the process-wide output must not collect objects";
     EXPECT_EQ(1, item->GetReferenceCount());
 }
 
-TEST(BackstoreException, IsTracedAndCarriesItsReason)
+TEST(FileStoreOut, EnumerationInheritsStrategiesAndAbortFlagAlone)
 {
-    Kernel::Test::TraceCapture const capture;
-    BackstoreException const exception(true);
-    EXPECT_EQ(0u, Kernel::Test::TraceCapture::GetText().find("== BackstoreException"));
-    EXPECT_EQ('\n', Kernel::Test::TraceCapture::GetText().back());
-    EXPECT_TRUE(exception.GetOutOfSpace());
+    class Advice : public SerialisationStrategy
+    {
+    };
+    bool abort = true;
+    Counted<MemoryItem> const kept(new MemoryItem);
+    {
+        RecordingOut out(VoidFileStore::GetInstance(), FileStoreOut::PurposeSave, &abort);
+        out.AddStrategy(nullptr);
+        out.AddStrategy(MakeCounted<Advice>());
+        EXPECT_TRUE(out.AddProlongedObject(kept));
+        out.SetAborted();
+        RecordingOut const inner(out, FileStoreOut::PurposeEnumeratePaths);
+        EXPECT_EQ(1u, inner.GetStrategies().size());
+        EXPECT_TRUE(inner.IsAbortRequested() && !inner.WasAborted() && !inner.IsFullSave());
+        EXPECT_EQ(2, kept->GetReferenceCount());
+    }
+    EXPECT_EQ(1, kept->GetReferenceCount());
 }
 
 } // namespace

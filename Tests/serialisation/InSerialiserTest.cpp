@@ -1,5 +1,6 @@
 #include "libkernel/serialisation/InSerialiser.h"
 
+#include "libkernel/core/Uuid.h"
 #include "libkernel/filestore/DelayLoadHolder.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
 #include "libkernel/serialisation/FlagSerialiser.h"
@@ -12,8 +13,6 @@
 
 namespace Kernel::Test {
 namespace {
-
-using Type = InSerialiser::PropertyType;
 
 struct Number
 {
@@ -67,6 +66,10 @@ TEST(InSerialiserTest, RefusedLoadLeavesTheOutputUntouched)
     u32 narrow = 88;
     EXPECT_FALSE(file->LoadType("Arry", narrow));
     EXPECT_FALSE(file->LoadTypeI("Numb", PropType::UInt32, &narrow, 2));
+    Uuid id;
+    Uuid const before = id;
+    EXPECT_FALSE(id.Load(*file, "Numb"));
+    EXPECT_EQ(id, before);
     EXPECT_EQ(wide, 77u);
     EXPECT_EQ(narrow, 88u);
     EXPECT_EQ(text, "before");
@@ -74,63 +77,36 @@ TEST(InSerialiserTest, RefusedLoadLeavesTheOutputUntouched)
     EXPECT_EQ(two[0], 3u);
 }
 
-TEST(InSerialiserTest, EveryItemFormReadsItsValueByEveryDelivery)
+// Each form alone is read where it is written; here stands what no writer writes, and what hangs together.
+TEST(InSerialiserTest, EveryItemFormLoadsByEveryDelivery)
 {
     PropertyBytes const b = EveryItemForm();
     for (Delivery delivery : c_deliveries) {
         SCOPED_TRACE(static_cast<int>(delivery));
         Counted<InSerialiserFile> const in = Parse(b.bytes, true, delivery);
         ASSERT_TRUE(in);
-        u32 u32Value = 0;
-        EXPECT_TRUE(in->LoadType(IDTag(0x10003), u32Value));
-        EXPECT_EQ(u32Value, 0x04030201u);
         u8 block[64];
         EXPECT_TRUE(in->LoadTypeI(IDTag(0x10000 + 30), static_cast<PropType>(30), block, 48));
         EXPECT_EQ(block[47], 48);
         EXPECT_TRUE(in->LoadRawStructI(IDTag(0x10000 + 116), block, 64));
-        EXPECT_EQ(block[63], 64);
         EXPECT_FALSE(in->LoadRawStructI(IDTag(0x10000 + 116), block, 63));
-        u64 count = 0;
-        EXPECT_NE(in->LoadTypeArrayI(IDTag(0x20000 + 26), static_cast<PropType>(26), 16, count), nullptr);
-        EXPECT_EQ(count, 2u);
-        bool flag = false;
-        std::vector<bool> bits;
-        EXPECT_TRUE(in->LoadType("Bool", flag) && flag);
-        EXPECT_TRUE(in->LoadTypes("Bits", bits));
-        EXPECT_EQ(bits, (std::vector<bool>{true, false, true, false, false, false, false, false, false, false, true}));
+        Uuid id;
+        EXPECT_TRUE(id.Load(*in, IDTag(0x10044)));
+        EXPECT_EQ(id, Uuid("04030201-0605-0807-090A-0B0C0D0E0F10"));
+        EXPECT_FALSE(in->LoadTypeCustomI("Cust", block, 2));
         String16 text;
-        std::vector<String8> texts;
         EXPECT_TRUE(in->LoadType("Text", text));
         EXPECT_EQ(text.GetLength(), 5);
-        EXPECT_TRUE(in->LoadTypes("Txts", texts));
-        EXPECT_EQ(texts, (std::vector<String8>{"ab", ""}));
         EXPECT_FALSE(in->LoadType("Shpd", text));
-        EXPECT_TRUE(in->LoadTypeCustomI("Cust", block, 3));
-        EXPECT_FALSE(in->LoadTypeCustomI("Cust", block, 2));
-        auto const* const customs = static_cast<u8 const*>(in->LoadTypeCustomArrayI("Csts", 3, count));
-        ASSERT_TRUE(customs);
-        EXPECT_EQ(customs[5], 6);
-        RawDataBlock data;
-        EXPECT_TRUE(in->LoadRawData("Algn", data));
-        ASSERT_EQ(data.GetSize(), 3u);
-        EXPECT_EQ(data.GetBytes()[0], 1);
         Counted<FragmentedRawData> fragments;
         ASSERT_TRUE(in->LoadFragmentedRawData("Frag", fragments));
-        EXPECT_EQ(fragments->GetSize(), 4u);
-        EXPECT_EQ(fragments->GetBlockSize(), 65536u);
         EXPECT_EQ(fragments->GetData(3, block, 9), 1u);
-        EXPECT_EQ(block[0], 1);
         ClassUID uid;
         unsigned short version = 0;
-        Counted<InSerialiser const> const nested = in->LoadClassI("Clas", uid, version);
-        ASSERT_TRUE(nested);
-        EXPECT_EQ(uid, ClassUID("InRg"));
-        EXPECT_TRUE(nested->LoadType("Frst", u32Value) && u32Value == 5);
-        EXPECT_FALSE(in->LoadClassI("ClsN", uid, version));
-        EXPECT_EQ(uid.value, 0u);
         auto const* const lists = in->LoadClassesI("Clss", uid, version);
         ASSERT_TRUE(lists && lists->size() == 3);
         EXPECT_TRUE((*lists)[0] && !(*lists)[1] && (*lists)[2]);
+        EXPECT_TRUE(!in->LoadClassI("ClsN", uid, version) && uid.value == 0);
         Counted<DelayLoadHolder> holder;
         EXPECT_TRUE(in->LoadDelayLoadObject("DlyN", holder) && !holder);
         EXPECT_TRUE(in->LoadDelayLoadObject("DlyZ", holder) && !holder);
@@ -138,14 +114,13 @@ TEST(InSerialiserTest, EveryItemFormReadsItsValueByEveryDelivery)
         ASSERT_TRUE(in->LoadObject("Root", root));
         EXPECT_EQ(root->number, 100u);
         EXPECT_EQ(root->name, "default name");
-        EXPECT_TRUE(root->shared);
         EXPECT_FALSE(root->sawUnloaded); // An owner loads after what it owns.
         ASSERT_EQ(root->kids.size(), 3u);
         EXPECT_EQ(root->kids[2], root->child);
         EXPECT_EQ(root->reference.Get(), root->child.Get());
         Consolidated<ReaderShared> shared;
         EXPECT_TRUE(in->LoadSharedObject("Shar", shared));
-        EXPECT_TRUE(shared->next == root->shared);
+        EXPECT_TRUE(root->shared && shared->next == root->shared);
         Counted<ReaderLegacy> legacy;
         EXPECT_TRUE(in->LoadObject("Lgcy", legacy));
         EXPECT_EQ(legacy->madeWith, 77u);
@@ -187,13 +162,10 @@ TEST(InSerialiserTest, EnumsAndFlagsGoThroughTheirSerialisers)
     FlagSerialiser::FlagIndex const indices[] = {{0}, {1}, {2}, {3}, {4}, {5}, {6}, {7}, {20}};
     flags.RegisterFlagIndices(indices);
     int value = 0;
-    std::vector<int> values;
     int two[2] = {};
     u64 stored = 0;
     EXPECT_TRUE(in->LoadEnumI("Enum", enums, value));
     EXPECT_EQ(value, 30);
-    EXPECT_TRUE(in->LoadEnumI("Enms", enums, values));
-    EXPECT_EQ(values, (std::vector<int>{30, 10, 20}));
     EXPECT_FALSE(in->LoadEnumI("Enms", enums, two, 2));
     EXPECT_TRUE(in->LoadEnumI("Enms", enums, two, 2, &stored));
     EXPECT_EQ(two[1], 10);
@@ -281,8 +253,6 @@ TEST(InSerialiserTest, NullAnswersForPlainAndShared)
     EXPECT_TRUE(in->LoadSharedObject("NulO", shared));
     EXPECT_TRUE(in->LoadObjects("NulA", nodes) && nodes.size() == 4 && !nodes[3]);
     EXPECT_TRUE(in->LoadSharedObjects("NulA", allShared) && allShared.size() == 4);
-    EXPECT_EQ(in->GetPropertyType("NulO"), Type::NullObject);
-    EXPECT_EQ(in->GetPropertyType("NulA"), Type::NullArray);
 }
 
 TEST(InSerialiserTest, ObjectOfAnotherClassIsRefusedBeforeItIsCast)
@@ -300,27 +270,6 @@ TEST(InSerialiserTest, ObjectOfAnotherClassIsRefusedBeforeItIsCast)
     EXPECT_TRUE(in->LoadObjectOrSharedObjectI("Root", plain,
                                               reinterpret_cast<Consolidated<SharedSerialisable>&>(shared), true));
     EXPECT_TRUE(plain);
-}
-
-TEST(InSerialiserTest, ParamsDescribeTypedValuesOnly)
-{
-    Counted<InSerialiserFile> const in = Parse(EveryItemForm().bytes);
-    ASSERT_TRUE(in);
-    InSerialiser::PropertyTypeParams params;
-    ASSERT_TRUE(in->GetPropertyParams("Bits", params));
-    EXPECT_TRUE(params.type == PropType::Bool && params.isArray && params.arrayCount == 11);
-    ASSERT_TRUE(in->GetPropertyParams("Text", params));
-    EXPECT_TRUE(params.type == PropType::String && !params.isArray && params.arrayCount == 0);
-    EXPECT_FALSE(in->GetPropertyParams("Data", params));
-    struct
-    {
-        IDTag tag;
-        Type type;
-    } const kinds[] = {{"Enum", Type::Value},      {"Data", Type::RawData},    {"Frag", Type::FragmentedRawData},
-                       {"Strm", Type::DataStream}, {"Root", Type::Object},     {"Shar", Type::SharedObject},
-                       {"Clas", Type::Class},      {"Clss", Type::ClassArray}, {"Shrs", Type::SharedObjectArray},
-                       {"DlyN", Type::DelayLoad},  {IDTag(12345), Type::None}};
-    for (auto const& kind : kinds) EXPECT_EQ(in->GetPropertyType(kind.tag), kind.type) << kind.tag.value;
 }
 
 TEST(InSerialiserTest, JsonTextLoadsUnlessItIsBadOrTooDeep)
@@ -366,46 +315,6 @@ TEST(InSerialiserTest, LongTextsAreSharedAndCorrect)
 }
 
 // Data streams.
-
-TEST(InSerialiserPropertyDataStreamTest, ReadsItemsInTheirOrder)
-{
-    Counted<InSerialiserFile> const in = Parse(EveryItemForm().bytes);
-    ASSERT_TRUE(in);
-    InSerialiserPropertyDataStream s;
-    ASSERT_TRUE(in->LoadDataStream("Strm", s));
-    EnumSerialiser enums;
-    enums.RegisterEnumSet({{10}, {20}, {30}});
-    EXPECT_EQ(s.GetVersion(), 7);
-    u32 number = 0;
-    std::vector<double> reals;
-    bool flag = false;
-    std::vector<bool> flags;
-    int value = 0;
-    std::vector<int> values;
-    String8 text;
-    std::vector<String16> texts;
-    u8 two[2];
-    u64 count = 0;
-    RawDataBlock raw;
-    EXPECT_TRUE(s.LoadValue(number) && number == 42);
-    EXPECT_TRUE(s.IsArray() && s.GetArrayCount() == 1);
-    EXPECT_TRUE(s.LoadValues(reals) && reals == std::vector<double>{2.5});
-    EXPECT_TRUE(s.LoadValue(flag) && flag);
-    EXPECT_TRUE(s.LoadValues(flags) && flags == std::vector<bool>(9, true));
-    EXPECT_TRUE(s.LoadEnumI(enums, value) && value == 20);
-    EXPECT_TRUE(s.LoadEnumI(enums, values) && values == std::vector<int>{30});
-    EXPECT_TRUE(s.LoadValue(text) && text == "hi");
-    EXPECT_TRUE(s.LoadValues(texts) && texts.size() == 1);
-    EXPECT_EQ(s.GetStructByteSize(), 2u);
-    EXPECT_TRUE(s.LoadValueCustomI(two, 2) && two[1] == 2);
-    EXPECT_TRUE(s.LoadValueCustomArrayI(2, count) && count == 1);
-    EXPECT_EQ(s.GetStructByteSize(), 3u);
-    EXPECT_TRUE(s.LoadValueRaw(raw) && raw.GetSize() == 3);
-    EXPECT_TRUE(s.LoadValueI(RawStructType(1), two, 1) && two[0] == 1);
-    EXPECT_TRUE(s.LoadValueArrayI(RawStructType(1), 1, count) && count == 2);
-    EXPECT_EQ(s.GetCurrentPropType(), PropType::EndOfList);
-    EXPECT_FALSE(s.LoadValue(number));
-}
 
 TEST(InSerialiserPropertyDataStreamTest, MismatchDoesNotAdvance)
 {

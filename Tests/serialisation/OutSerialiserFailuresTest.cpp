@@ -1,12 +1,8 @@
-#include "libkernel/filestore/DelayLoadHolder.h"
-#include "libkernel/filestore/FileStoreItem.h"
-#include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/FileStoreOutPathGenerator.h"
 #include "libkernel/filestore/VoidFileStore.h"
 #include "libkernel/serialisation/OutSerialiserPropertyDataStream.h"
 #include "serialisation/WriterTestSupport.h"
-
-#include <map>
+#include "support/MemoryFileStore.h"
 
 namespace KernelTest {
 namespace {
@@ -166,70 +162,10 @@ TEST(OutSerialiserFailures, NothingIsWrittenAfterAFailure)
     EXPECT_EQ(stream->m_bytes.size(), 20u);
 }
 
-/// A store that notes what a save asks of it.
-class NotingStoreOut : public FileStoreOut
-{
-public:
-    explicit NotingStoreOut(Purpose purpose, bool const* abort = nullptr) : FileStoreOut(purpose, abort) {}
-    using FileStoreOut::CreateFile;
-    void CreateFile(Counted<DelayLoadHolder> holder, Counted<FileStoreCompressionHint> const&) override
-    {
-        m_files.push_back(holder);
-    }
-    void CreateFile(String8 const&, Counted<FileStoreItem const> const&,
-                    Counted<FileStoreCompressionHint> const&) override
-    {
-    }
-    void DeleteFile(String8 const&) override {}
-    void AddObjectToClean(Counted<FileStoreStateObject>) override {}
-    void AddPostSaveObject(Counted<FileStorePostSaveInterface>) override {}
-    bool GenerateIndexedPath(IndexedPathParts const&, NonCounted<FileStoreItem const>,
-                             NonCounted<DelayLoadHolder const>, String8&) override
-    {
-        return false;
-    }
-    void AssignDelayLoadHolderPath(Counted<DelayLoadHolder> holder, String8 const& path) override
-    {
-        m_assigned.emplace_back(holder, path);
-    }
-    FileStore& GetFileStore() const override { return VoidFileStore::GetInstance(); }
-
-    std::vector<Counted<DelayLoadHolder>> m_files;
-    std::vector<std::pair<Counted<DelayLoadHolder>, String8>> m_assigned;
-};
-
-class Generator : public FileStoreOutPathGenerator
-{
-public:
-    explicit Generator(char const* path) : m_path(path) {}
-    bool GeneratePath(NonCounted<FileStoreItem const> item, NonCounted<DelayLoadHolder const>, String8& path) override
-    {
-        m_sawItem = static_cast<bool>(item);
-        if (m_path) path = m_path;
-        return m_path != nullptr;
-    }
-    char const* m_path;
-    bool m_sawItem = false;
-};
-
-class Picture : public FileStoreItem
-{
-public:
-    static FileStoreItemType const s_type;
-    void Save(OutStream&, FileStoreOut&) const override {}
-    bool Load(InStream&, FileStore&) override { return true; }
-    FileStoreItemType const* GetObjectFileStoreItemType() const override { return &s_type; }
-
-protected:
-    ~Picture() override = default;
-};
-FileStoreItemType const Picture::s_type("Pict", nullptr, FileStoreItemType::NotNestable,
-                                        FileStoreItemType::NotRecoverable);
-
 TEST(OutSerialiserFailures, AbortEndsTheSaveAtTheNextProperty)
 {
     bool abort = false;
-    NotingStoreOut store(FileStoreOut::PurposeSave, &abort);
+    RecordingOut store(VoidFileStore::GetInstance(), FileStoreOut::PurposeSave, &abort);
     auto const stream = MakeCounted<BytesOutStream>();
     OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
     OutSerialiserPropertyDataStream values(out, "Strm", 1);
@@ -246,23 +182,22 @@ TEST(OutSerialiserFailures, AbortEndsTheSaveAtTheNextProperty)
 
 TEST(OutSerialiserFailures, DelayLoadReferenceNamesTheItemAndQueuesIt)
 {
-    NotingStoreOut store(FileStoreOut::PurposeSave);
+    RecordingOut store(VoidFileStore::GetInstance());
     auto const stream = MakeCounted<BytesOutStream>();
-    auto const picture = MakeCounted<Picture>();
-    auto const holder = DelayLoadHolder::Create(&Picture::s_type, picture);
-    Generator generator("pic/1");
+    auto const item = MakeCounted<MemoryItem>();
+    auto const holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item);
+    FileStoreOutIndexedPathGenerator generator(store, "pic/", ".x");
     OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
     out.SaveDelayLoadObject("Pic1", holder, generator, nullptr);
-    EXPECT_TRUE(generator.m_sawItem);
     out.SaveDelayLoadObject("Pic2", nullptr, generator, nullptr);
     out.Close();
     EXPECT_EQ(Show(stream->m_bytes.substr(16)),
-              Show(Bytes("33 [Pic1] [Pict] 05 00 00 00 'pic/1' | 33 [Pic2] 00 00 00 00 00 00 00 00 | 00")));
-    EXPECT_EQ(store.m_files, (std::vector<Counted<DelayLoadHolder>>{holder}));
-    ASSERT_EQ(store.m_assigned.size(), 1u);
-    EXPECT_EQ(store.m_assigned[0].second, "pic/1");
+              Show(Bytes("33 [Pic1] [TsPl] 07 00 00 00 'pic/1.x' | 33 [Pic2] 00 00 00 00 00 00 00 00 | 00")));
+    EXPECT_EQ(store.files, (std::vector<Counted<DelayLoadHolder>>{holder}));
+    ASSERT_EQ(store.assigned.size(), 1u);
+    EXPECT_EQ(store.assigned[0].second, "pic/1.x");
 
-    Generator refusing(nullptr);
+    FileStoreOutIndexedPathGenerator refusing(VoidFileStoreOut::GetInstance(), "pic/", "");
     EXPECT_EQ(ListCode([&](OutSerialiser& o) { o.SaveDelayLoadObject("Pic1", holder, refusing, nullptr); }), 6);
 }
 
@@ -296,7 +231,7 @@ struct Page
     static unsigned short GetSchemaVersion() { return 1; }
     void Save(OutSerialiser& out) const
     {
-        Generator generator("pic/1");
+        FileStoreOutIndexedPathGenerator generator(out.GetFileStoreOut(), "pic/", "");
         out.SaveDelayLoadObject("Pict", holder, generator, nullptr);
         out.SaveDelayLoadObject("None", nullptr, generator, nullptr);
     }
@@ -305,11 +240,11 @@ struct Page
 
 TEST(OutSerialiserFailures, EnumeratingPassWalksTheStructureAndWritesNothing)
 {
-    auto const picture = MakeCounted<Picture>();
-    auto const holder = DelayLoadHolder::Create(&Picture::s_type, picture);
+    auto const item = MakeCounted<MemoryItem>();
+    auto const holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item);
     for (auto const purpose : {FileStoreOut::PurposeEnumeratePaths, FileStoreOut::PurposeEnumerateHolders}) {
         SCOPED_TRACE(static_cast<u32>(purpose));
-        NotingStoreOut store(purpose);
+        RecordingOut store(VoidFileStore::GetInstance(), purpose);
         auto const stream = MakeCounted<BytesOutStream>(u64{0});
         auto const album = MakeCounted<Album>();
         OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
@@ -319,9 +254,9 @@ TEST(OutSerialiserFailures, EnumeratingPassWalksTheStructureAndWritesNothing)
         out.Close();
         EXPECT_EQ(stream->m_writes, 0);
         EXPECT_EQ(album->m_saves, 1);
-        EXPECT_EQ(store.m_files, (std::vector<Counted<DelayLoadHolder>>{holder}));
+        EXPECT_EQ(store.files, (std::vector<Counted<DelayLoadHolder>>{holder}));
         bool const wantsPaths = purpose == FileStoreOut::PurposeEnumeratePaths;
-        EXPECT_EQ(store.m_assigned.size(), wantsPaths ? 1u : 0u);
+        EXPECT_EQ(store.assigned.size(), wantsPaths ? 1u : 0u);
     }
 }
 

@@ -5,6 +5,7 @@
 #include "libkernel/filestore/FileStore.h"
 #include "libkernel/filestore/FileStoreItem.h"
 #include "libkernel/filestore/FileStoreLoadContext.h"
+#include "libkernel/filestore/FileStoreOut.h"
 
 #include <atomic>
 #include <functional>
@@ -139,6 +140,47 @@ class CollectingContext : public FileStoreLoadContext
 public:
     void ReportProblem(String8 const& text) override { problems.push_back(text); }
     std::vector<String8> problems;
+};
+
+/// Notes what a save asks of it. The first indexed path is taken, for items alone.
+class RecordingOut : public FileStoreOut
+{
+public:
+    explicit RecordingOut(FileStore& store, Purpose purpose = PurposeSave, bool const* abort = nullptr)
+        : FileStoreOut(purpose, abort), m_store(store)
+    {
+    }
+    RecordingOut(RecordingOut const& outer, Purpose purpose) : FileStoreOut(outer, purpose), m_store(outer.m_store) {}
+
+    using FileStoreOut::CreateFile;
+    void CreateFile(Counted<DelayLoadHolder> holder, Counted<FileStoreCompressionHint> const&) override
+    {
+        files.push_back(holder);
+    }
+    void CreateFile(String8 const&, Counted<FileStoreItem const> const&,
+                    Counted<FileStoreCompressionHint> const&) override
+    {
+    }
+    void DeleteFile(String8 const&) override {}
+    void AddObjectToClean(Counted<FileStoreStateObject>) override {}
+    void AddPostSaveObject(Counted<FileStorePostSaveInterface>) override {}
+    bool GenerateIndexedPath(IndexedPathParts const& parts, NonCounted<FileStoreItem const> item,
+                             NonCounted<DelayLoadHolder const>, String8& path) override
+    {
+        if (item) path = parts.prefix + "1" + parts.suffix;
+        return static_cast<bool>(item);
+    }
+    void AssignDelayLoadHolderPath(Counted<DelayLoadHolder> holder, String8 const& path) override
+    {
+        assigned.emplace_back(holder, path);
+    }
+    FileStore& GetFileStore() const override { return m_store; }
+
+    std::vector<Counted<DelayLoadHolder>> files;
+    std::vector<std::pair<Counted<DelayLoadHolder>, String8>> assigned;
+
+private:
+    FileStore& m_store;
 };
 
 /// The text of the holder's item, loaded if needed; "(none)" if it can't be had.
