@@ -8,6 +8,7 @@
 #include "libkernel/streams/CRC32.h"
 #include "libkernel/streams/InStream.h"
 #include "libkernel/streams/OutStream.h"
+#include "support/BytesItem.h"
 #include "support/Table.h"
 
 #include <cstdio>
@@ -29,6 +30,7 @@
 namespace {
 
 using namespace Kernel;
+using Bench::BytesItem;
 
 struct Item
 {
@@ -74,23 +76,6 @@ std::vector<Item> MakeItems(int count, u64 smallest, u64 largest)
     }
     return items;
 }
-
-class BytesItem : public FileStoreItem
-{
-public:
-    static FileStoreItemType const c_type;
-    explicit BytesItem(std::string const& bytes) : m_bytes(bytes) {}
-    void Save(OutStream& out, FileStoreOut&) const override { out.WriteBlock(m_bytes.data(), m_bytes.size()); }
-    bool Load(InStream&, FileStore&) override { return false; }
-    FileStoreItemType const* GetObjectFileStoreItemType() const override { return &c_type; }
-
-private:
-    ~BytesItem() override = default;
-    std::string const& m_bytes; // The benchmark's items outlive every save.
-};
-
-FileStoreItemType const BytesItem::c_type(ClassUID("Bnch"), nullptr, FileStoreItemType::NotNestable,
-                                          FileStoreItemType::NotRecoverable);
 
 /// What every store can do. A commit is on the device when Commit returns.
 class Store

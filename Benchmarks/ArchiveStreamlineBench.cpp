@@ -10,6 +10,7 @@
 #include "libkernel/filesystem/TempFile.h"
 #include "libkernel/streams/InStream.h"
 #include "libkernel/streams/OutStream.h"
+#include "support/BytesItem.h"
 #include "support/Table.h"
 
 #include <cstdio>
@@ -25,26 +26,10 @@
 namespace {
 
 using namespace Kernel;
+using Bench::BytesItem;
 
 constexpr int c_items = 1000;
 constexpr u64 c_itemSize = (u64{64} << 20) / (2 * c_items);
-
-class BytesItem : public FileStoreItem
-{
-public:
-    static FileStoreItemType const c_type;
-    explicit BytesItem(std::string const& bytes) : m_bytes(bytes) {}
-    void Save(OutStream& out, FileStoreOut&) const override { out.WriteBlock(m_bytes.data(), m_bytes.size()); }
-    bool Load(InStream&, FileStore&) override { return false; }
-    FileStoreItemType const* GetObjectFileStoreItemType() const override { return &c_type; }
-
-private:
-    ~BytesItem() override = default;
-    std::string const& m_bytes;
-};
-
-FileStoreItemType const BytesItem::c_type(ClassUID("Bnch"), nullptr, FileStoreItemType::NotNestable,
-                                          FileStoreItemType::NotRecoverable);
 
 void Require(bool holds)
 {

@@ -535,4 +535,12 @@ inline void CheckProperties(Bytes const& bytes, bool checks, Test::Delivery deli
     Test::LoadEverything(*mine.file);
 }
 
+/// The same for an input of which the first byte chooses how the stream delivers.
+inline void CheckDelivered(uint8_t const* data, size_t size, bool checks)
+{
+    Input input(data, size);
+    Test::Delivery const delivery = Test::c_deliveries[input.TakeBelow(4)];
+    CheckProperties(Bytes(input.GetRest(), input.GetRest() + input.GetLeft()), checks, delivery);
+}
+
 } // namespace Kernel::Fuzz

@@ -173,4 +173,16 @@ size_t MutateAndRepair(uint8_t* data, size_t size, size_t maxSize, unsigned seed
     return size;
 }
 
+/// The same for an input of which the first byte chooses how the stream delivers: the stream is given its header.
+inline size_t MutateDelivered(uint8_t* data, size_t size, size_t maxSize, unsigned seed)
+{
+    return MutateAndRepair(data, size, maxSize, seed, [](u8* bytes, u64 count) {
+        u64 const front = 1 + c_serialisedHeaderSize;
+        if (count < front) return;
+        StoreLittleEndian(bytes + 1, c_serialisedMagic);
+        StoreLittleEndian(bytes + 5, c_serialisedFormatVersion);
+        PropertyRepair(bytes + front, count - front).RepairList(0);
+    });
+}
+
 } // namespace Kernel::Fuzz

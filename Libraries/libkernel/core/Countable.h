@@ -52,7 +52,7 @@ private:
     mutable std::atomic<i32> m_count{0};
 };
 
-/// Placeholder base where a template wants a base class but no counting is wanted.
+/// Empty base where a template wants a base class but no counting is wanted.
 class KERNEL_API VoidClass
 {
 public:

@@ -80,11 +80,11 @@ private:
     static_assert(DoubleTextDetail::c_maxShortLength >= NumberTextDetail::c_decimalRoom);
 };
 
-/// The format engine: appends @p format to @p out, with each placeholder replaced by its argument, and gives the number
-/// of units appended.
+/// The format engine: appends @p format to @p out, with each "%" and number replaced by the argument of that number,
+/// and gives the number of units appended.
 ///
-/// "%1", "%2" and so on are placeholders; all digits that follow belong to the number, and an argument may be used many
-/// times or never. A number beyond the arguments gives nothing, "%%" gives one "%", "%" before anything else disappears
+/// The first argument is "%1". All digits that follow belong to the number, and an argument may be used many times or
+/// never. A number beyond the arguments gives nothing, "%%" gives one "%", "%" before anything else disappears
 /// together with that unit, and at the very end it gives nothing. The target grows once. A null format clears the
 /// target and gives 0. A text that would make the target longer than 2^31 - 1 units gives 0 and leaves the target as it
 /// was. Format and arguments may lie in the target. Throws std::bad_alloc when there is no memory.
