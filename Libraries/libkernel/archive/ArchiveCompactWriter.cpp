@@ -2,6 +2,7 @@
 
 #include "libkernel/archive/ArchiveStreamline.h"
 #include "libkernel/archive/internal/ArchiveThumbnailBlock.h"
+#include "libkernel/core/Abortable.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/Endian.h"
 #include "libkernel/core/Limits.h"
@@ -9,7 +10,6 @@
 #include "libkernel/streams/FileIOException.h"
 
 #include <algorithm>
-#include <atomic>
 #include <limits>
 
 // A compact file: front, the live blocks in the order of their UIDs, one table. A block goes from its file straight
@@ -55,7 +55,7 @@ Result ArchiveCompactWriter::Run(Archive::StreamlineData& data)
     Describe(data);
     if (m_options.copyThumbnails) {
         // Without its thumbnails the file is not what was asked for.
-        if (IsAborted()) return Archive::StreamlineAborted;
+        if (IsAbortFlagSet(m_options.abort)) return Archive::StreamlineAborted;
         CopyThumbnailBlock();
     }
     return m_targetFile && m_targetFile->IsBroken() ? Archive::StreamlineNoAccess : Archive::StreamlineDone;
@@ -131,21 +131,15 @@ void ArchiveCompactWriter::WriteFront()
     m_file.m_flags = flags;
 }
 
-bool ArchiveCompactWriter::IsAborted() const
-{
-    return m_options.abort &&
-           std::atomic_ref<bool>(*const_cast<bool*>(m_options.abort)).load(std::memory_order_relaxed);
-}
-
 Result ArchiveCompactWriter::WriteBlocks()
 {
     u64 done = 0;
     for (Item& item : m_items) {
-        if (IsAborted()) return Archive::StreamlineAborted;
+        if (IsAbortFlagSet(m_options.abort)) return Archive::StreamlineAborted;
         if (!CopyBlock(item)) return Archive::StreamlineFailed;
         if (m_options.progress) m_options.progress->OnProgress(++done, m_items.size() + 1);
     }
-    return IsAborted() ? Archive::StreamlineAborted : Archive::StreamlineDone;
+    return IsAbortFlagSet(m_options.abort) ? Archive::StreamlineAborted : Archive::StreamlineDone;
 }
 
 bool ArchiveCompactWriter::FindSource(Counted<Archive::ArchiveFile> const& file, Source const*& source)

@@ -1,5 +1,4 @@
 #include "libkernel/archive/internal/ArchiveImpl.h"
-#include "libkernel/core/NumberText.h"
 #include "libkernel/filesystem/FileSystem.h"
 #include "libkernel/platform/PlatformFile.h"
 #include "libkernel/streams/FileIOException.h"
@@ -11,24 +10,7 @@ namespace Kernel {
 namespace {
 
 constexpr int c_renameRetries = 2;
-
-/// A name beside @p path at which nothing stands; empty to go without a backup.
-String8 FindBackupName(String8 const& path)
-{
-    constexpr int c_notFound = 2;
-    constexpr int c_readOnlyVolume = 11;
-    constexpr int c_maxDoubtful = 10;
-    int doubtful = 0;
-    for (u32 n = 1;; ++n) {
-        String8 candidate = path + "~backup";
-        if (n > 1) candidate += ToString(n);
-        File::OpenUnmanagedResult result{};
-        if (FileInOutStream::OpenReadOnly(candidate.GetData(), File::ShareMode::DenyNone, result, nullptr)) continue;
-        int const value = static_cast<int>(result);
-        if (value == c_notFound) return candidate;
-        if (value == c_readOnlyVolume || ++doubtful == c_maxDoubtful) return String8();
-    }
-}
+constexpr int c_backupFailures = 10;
 
 ArchiveFileException::Reason ReasonOf(FileSystem::SafeMoveFileResult result)
 {
@@ -53,7 +35,7 @@ void ArchiveImpl::MoveTemporary(Archive::ArchiveFile& file)
     if (!file.m_backupPath.IsEmpty())
         backup = file.m_backupPath;
     else if (file.m_keepBackup && FileSystem::Exists(final))
-        backup = FindBackupName(final);
+        backup = FindBackupName(final, c_backupFailures);
     // What lies where is what counts here, whether or not it is known to last.
     bool isBackup = false;
     // A backup under the name of one of the two files would take the other one's place.

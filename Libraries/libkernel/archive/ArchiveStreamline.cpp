@@ -134,17 +134,9 @@ ArchiveStreamliner::Access ArchiveStreamliner::BeginAccess(Counted<Archive::Acce
     return m_impl.OpenFileHandleCS(reopened, false, false) == Archive::RestoreOk ? block : nullptr;
 }
 
-// Whoever waits for a suspension to end may hold no lock, so a step that meets one starts afresh.
 Result ArchiveStreamliner::StreamlineI(Request const& request)
 {
-    for (;;) {
-        m_impl.WaitWhileSuspended();
-        CriticalSectionScope const lock(m_impl.m_sessionLock);
-        if (IsBusyCS()) return Archive::StreamlineFailed;
-        bool suspended = false;
-        Result const result = StreamlineFrame(request, suspended);
-        if (!suspended) return result;
-    }
+    return RunInTurn([&](bool& suspended) { return StreamlineFrame(request, suspended); });
 }
 
 // Offlining reads the blocks that are about to move, so it is stopped, and goes on when it is known where they lie.

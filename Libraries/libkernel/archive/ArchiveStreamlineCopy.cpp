@@ -14,19 +14,6 @@ namespace Kernel {
 
 using Result = Archive::StreamlineResult;
 
-template <class TStep>
-Result ArchiveStreamliner::RunInTurn(TStep const& step)
-{
-    for (;;) {
-        m_impl.WaitWhileSuspended();
-        CriticalSectionScope const lock(m_impl.m_sessionLock);
-        if (IsBusyCS()) return Archive::StreamlineFailed;
-        bool suspended = false;
-        Result const result = step(suspended);
-        if (!suspended) return result;
-    }
-}
-
 // To write over a file that is being read from would lose it.
 bool ArchiveStreamliner::IsOwnFile(String8 const& path) const
 {
@@ -53,12 +40,6 @@ Result WriteFile(ArchiveImpl& impl, Archive::ArchiveFile& file, bool copyThumbna
     return flushed ? Archive::StreamlineDone : Archive::StreamlineNoAccess;
 }
 
-Counted<FileInOutStream> CreateStream(String8 const& path)
-{
-    File::OpenUnmanagedResult result{};
-    return FileInOutStream::Create(path.GetData(), File::ShareMode::DenyWrite, result, nullptr, false);
-}
-
 void Discard(Archive::ArchiveFile& file)
 {
     file.m_stream = nullptr;
@@ -82,7 +63,7 @@ Result ArchiveStreamliner::StreamlineToNew(String8 const& path)
         Counted<File> const file = MakeFile(1);
         file->m_mode = Archive::OpenModeReadWrite;
         file->m_path = path;
-        file->m_stream = CreateStream(path);
+        file->m_stream = CreateStream(path, false);
         if (!file->m_stream) return Archive::StreamlineNotCreated;
         Archive::StreamlineData data;
         Result const result = WriteFile(m_impl, *file, true, data);
@@ -113,7 +94,7 @@ Result ArchiveStreamliner::StreamlineAndSwitchI(String8 const& path, bool asScra
         if (!readersOff.IsClosed()) return Archive::StreamlineFailed;
         Counted<File> const file = MakeFile(1);
         file->m_path = path;
-        file->m_stream = CreateStream(path);
+        file->m_stream = CreateStream(path, false);
         if (!file->m_stream) return Archive::StreamlineNotCreated;
         Archive::StreamlineData data;
         Result result = WriteFile(m_impl, *file, true, data);

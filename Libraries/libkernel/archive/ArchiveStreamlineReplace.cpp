@@ -14,6 +14,7 @@ using Result = Archive::StreamlineResult;
 namespace {
 
 constexpr int c_moveRetries = 2;
+constexpr int c_backupFailures = 30;
 constexpr int c_notFound = 2;
 constexpr int c_notPermitted = 6;
 constexpr int c_readOnlyVolume = 11;
@@ -31,10 +32,10 @@ int TestName(String8 const& path)
     return static_cast<int>(file.OpenEx(path.GetData(), Kernel::File::AccessMode::Read));
 }
 
-/// A name beside @p path at which nothing stands; empty to go without a backup.
-String8 FindBackupName(String8 const& path)
+} // namespace
+
+String8 ArchiveImpl::FindBackupName(String8 const& path, int maxFailures)
 {
-    constexpr int c_maxFailures = 30;
     int failures = 0;
     for (int n = 1;; ++n) {
         String8 const candidate = NthName(path, "~backup", n);
@@ -42,17 +43,15 @@ String8 FindBackupName(String8 const& path)
         if (result == c_notFound) return candidate;
         if (result == c_readOnlyVolume) return String8();
         bool const opened = Kernel::File::IsOpened(static_cast<Kernel::File::OpenUnmanagedResult>(result));
-        if (!opened && ++failures == c_maxFailures) return String8();
+        if (!opened && ++failures == maxFailures) return String8();
     }
 }
 
-Counted<FileInOutStream> CreateStream(String8 const& path, bool mustBeNew)
+Counted<FileInOutStream> ArchiveStreamliner::CreateStream(String8 const& path, bool mustBeNew)
 {
     Kernel::File::OpenUnmanagedResult result{};
     return FileInOutStream::Create(path.GetData(), Kernel::File::ShareMode::DenyWrite, result, nullptr, mustBeNew);
 }
-
-} // namespace
 
 std::pair<bool, Result> ArchiveStreamliner::StreamlineReplacement()
 {
@@ -143,7 +142,7 @@ Result ArchiveStreamliner::StreamlineReplacementInner(String8 const& tempPath, S
         CriticalSectionScope const access(m_impl.m_accessLock);
         if (Counted<FileInOutStream> const stream = m_master->GetStream())
             m_newFile->m_stream->CopyFileAttributes(*stream);
-        if (keepBackup && backupPath.IsEmpty()) backupPath = FindBackupName(path);
+        if (keepBackup && backupPath.IsEmpty()) backupPath = ArchiveImpl::FindBackupName(path, c_backupFailures);
         hasBackup = MoveAway(backupPath);
         if (hasBackup || !keepBackup) {
             m_newFile->m_stream = nullptr;

@@ -60,7 +60,6 @@ private:
     void WriteTable();
     void CopyThumbnailBlock();
     void Describe(Archive::StreamlineData& data);
-    bool IsAborted() const;
 
     void Put(void const* bytes, u64 size);
     u8* GetSpace(u64 wanted, u64& room);

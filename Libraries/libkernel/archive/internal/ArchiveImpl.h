@@ -229,6 +229,9 @@ struct ArchiveImpl
     // ArchiveMoveTemporary.cpp
     /// Moves a committed temporary over its target and reopens it there. The caller holds the session lock.
     void MoveTemporary(Archive::ArchiveFile& file);
+    /// A name beside @p path at which nothing stands; empty to go without a backup, on a volume that cannot be written
+    /// to and after @p maxFailures names that could not be tried. ArchiveStreamlineReplace.cpp
+    static String8 FindBackupName(String8 const& path, int maxFailures);
 
     // ArchiveAccess.cpp. The caller holds the access lock where the name ends in CS.
     Archive::RestoreResult OpenFileHandleCS(bool& reopened, bool force, bool ignoreFailure);

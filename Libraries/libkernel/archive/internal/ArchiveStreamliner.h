@@ -42,10 +42,22 @@ private:
 
     /// Runs @p step under the session lock, again after a suspension for as long as it reports one.
     template <class TStep>
-    Result RunInTurn(TStep const& step);
+    Result RunInTurn(TStep const& step)
+    {
+        // Whoever waits for a suspension to end may hold no lock, so a step that meets one starts afresh.
+        for (;;) {
+            m_impl.WaitWhileSuspended();
+            CriticalSectionScope const lock(m_impl.m_sessionLock);
+            if (IsBusyCS()) return Archive::StreamlineFailed;
+            bool suspended = false;
+            Result const result = step(suspended);
+            if (!suspended) return result;
+        }
+    }
     /// Access for the step, files open. Null with @p suspended, if so, telling why.
     Access BeginAccess(Counted<Archive::AccessBlockAdorner> const& adorner, bool exclusive, bool& suspended);
     bool IsBusyCS() const;
+    static Counted<FileInOutStream> CreateStream(String8 const& path, bool mustBeNew);
     bool IsOwnFile(String8 const& path) const;
     u32 NextWriteCounter() const;
     Counted<File> MakeFile(u32 saveCount) const;
