@@ -1,43 +1,21 @@
 #include "libkernel/concurrency/Timer.h"
+#include "libkernel/core/DoubleText.h"
+#include "libkernel/core/Format.h"
 #include "libkernel/core/Trace.h"
 #include "libkernel/platform/Debug.h"
-
-#include <charconv>
-#include <cstdio>
-#include <string>
 
 namespace Kernel {
 namespace {
 
-// Decimals rounded half up on the 14 that are printed, as all the library's numbers are.
-std::string ToDecimals(double value, int decimals, int width)
+String8 ToDecimals(double value, u32 decimals, u32 width)
 {
-    char digits[400]; // 309 digits before the point at most.
-    std::to_chars_result const end = std::to_chars(digits, digits + sizeof digits, value, std::chars_format::fixed, 14);
-    std::string text(digits, end.ptr);
-    size_t const point = text.find('.');
-    if (point != std::string::npos) {
-        bool const up = text[point + 1 + static_cast<size_t>(decimals)] >= '5';
-        text.resize(point + 1 + static_cast<size_t>(decimals));
-        size_t i = text.size();
-        bool carry = up;
-        while (carry && i-- > 0) {
-            if (text[i] == '.') continue;
-            if (text[i] < '0' || text[i] > '9') break;
-            carry = text[i] == '9';
-            text[i] = carry ? '0' : static_cast<char>(text[i] + 1);
-        }
-        if (carry) text.insert(text[0] == '-' ? 1 : 0, 1, '1');
-    }
-    if (text.size() < static_cast<size_t>(width)) text.insert(0, static_cast<size_t>(width) - text.size(), ' ');
-    return text;
+    return ToString(value, decimals, width, SignStyle::None, TruncateStyle::KeepAll);
 }
 
-std::string ToField(u64 value, int width)
+template <TextInteger T>
+String8 ToField(T value)
 {
-    char text[32];
-    std::snprintf(text, sizeof text, "%*llu", width, static_cast<unsigned long long>(value));
-    return text;
+    return ToStringPadded(value, 7, PadStyle::SpacesLeft);
 }
 
 } // namespace
@@ -111,22 +89,19 @@ String8 Timers::GetReportString() const
     u64 const count = GetTotalCount();
     if (count == 0) return {};
     double const total = GetTotalMilliseconds();
-    std::string text;
-    if (m_description && *m_description) text.append(m_description).append(":\n");
-    text.append("     Id   Count  Total tm    Tm/call   Rel tm\n");
+    String8 text;
+    if (m_description && *m_description) AppendFormat(text, "%1:\n", m_description);
+    text += "     Id   Count  Total tm    Tm/call   Rel tm\n";
     for (u64 i = 0; i < m_slots.size(); ++i) {
         Slot const& slot = m_slots[i];
         if (slot.count == 0) continue;
         double const share = total == 0.0 ? 0.0 : slot.milliseconds / total * 100.0;
-        text.append(ToField(i, 7)).append(" ").append(ToField(slot.count, 7)).append(" ");
-        text.append(ToDecimals(slot.milliseconds, 3, 9)).append(" ");
-        text.append(ToDecimals(slot.milliseconds / slot.count, 6, 11)).append(" ");
-        text.append(ToDecimals(share, 1, 5)).append(" ");
-        text.append(slot.description ? slot.description : "").append("\n");
+        AppendFormat(text, "%1 %2 %3 %4 %5 %6\n", ToField(i), ToField(slot.count), ToDecimals(slot.milliseconds, 3, 9),
+                     ToDecimals(slot.milliseconds / slot.count, 6, 11), ToDecimals(share, 1, 5), slot.description);
     }
-    text.append("Totals: ").append(ToField(count, 7)).append(" ").append(ToDecimals(total, 3, 9)).append(" ");
-    text.append(ToDecimals(total / static_cast<double>(count), 6, 11)).append(" 100.0\n");
-    return String8(std::string_view(text));
+    AppendFormat(text, "Totals: %1 %2 %3 100.0\n", ToField(count), ToDecimals(total, 3, 9),
+                 ToDecimals(total / static_cast<double>(count), 6, 11));
+    return text;
 }
 
 void Timers::Report()
