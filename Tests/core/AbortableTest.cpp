@@ -10,19 +10,7 @@ class Work : public Abortable
 {
 };
 
-TEST(AbortableTest, NullPutsTheOwnFlagBackInForce)
-{
-    bool outer = false;
-    Work work;
-    work.SetAbortPointer(&outer);
-    work.SetAbort(true);
-    EXPECT_TRUE(outer);
-    work.SetAbortPointer(nullptr);
-    EXPECT_FALSE(work.IsAborting());
-    EXPECT_NE(work.GetAbortPointer(), &outer);
-}
-
-TEST(AbortableTest, CopyStandsAloneOrSharesTheOuterFlag)
+TEST(AbortableTest, CopyStandsAloneOrSharesTheOuterFlagUntilThatIsTaken)
 {
     Work alone;
     alone.SetAbort(true);
@@ -35,12 +23,16 @@ TEST(AbortableTest, CopyStandsAloneOrSharesTheOuterFlag)
     Work sharing;
     sharing.SetAbort(true);
     sharing.SetAbortPointer(&outer);
+    EXPECT_FALSE(sharing.IsAborting());
     copy = sharing;
-    Work const second(sharing);
+    Work second(sharing);
     EXPECT_EQ(copy.GetAbortPointer(), &outer);
     EXPECT_EQ(second.GetAbortPointer(), &outer);
     EXPECT_FALSE(copy.IsAborting());
+    second.SetAbort(true);
+    EXPECT_TRUE(outer);
     copy.SetAbortPointer(nullptr);
+    EXPECT_NE(copy.GetAbortPointer(), &outer);
     EXPECT_TRUE(copy.IsAborting()); // The value of the other's own flag came along.
 }
 

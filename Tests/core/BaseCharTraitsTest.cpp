@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <string>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -11,37 +12,29 @@ using Wide = BaseCharTraits<unsigned int>;
 
 TEST(BaseCharTraitsTest, ComparingGivesTheDifferenceOfUnitsAndThenOfLengths)
 {
-    struct Case
+    using Row = std::tuple<char const*, char const*, int>;
+    for (auto const& [a, b, difference] :
+         {Row{"abc", "abe", -2}, Row{"b", "a", 1}, Row{"\xC3\xA9", "a", -61 - 'a'}, Row{"abc", "abcde", -2},
+          Row{"abcdefghij", "abcdefgh", 2}, Row{"same", "same", 0}, Row{"0123456789abcXe", "0123456789abcYe", -1},
+          Row{"", "", 0}})
     {
-        char const* a;
-        char const* b;
-        int difference;
-    };
-    for (Case const& c : {Case{"abc", "abe", -2}, Case{"b", "a", 1}, Case{"\xC3\xA9", "a", -61 - 'a'},
-                          Case{"abc", "abcde", -2}, Case{"abcdefghij", "abcdefgh", 2}, Case{"same", "same", 0},
-                          Case{"0123456789abcXe", "0123456789abcYe", -1}, Case{"", "", 0}})
-    {
-        SCOPED_TRACE(c.a);
-        int const n = Chars::GetLength(c.a);
-        int const m = Chars::GetLength(c.b);
-        EXPECT_EQ(Chars::Compare(c.a, c.b), c.difference);
-        EXPECT_EQ(Chars::Compare(c.a, n, c.b), c.difference);
-        EXPECT_EQ(Chars::Compare(c.b, m, c.a, n), -c.difference);
-        EXPECT_EQ(Chars::IsEqual(c.a, n, c.b), c.difference == 0);
+        SCOPED_TRACE(a);
+        int const n = Chars::GetLength(a);
+        int const m = Chars::GetLength(b);
+        EXPECT_EQ(Chars::Compare(a, b), difference);
+        EXPECT_EQ(Chars::Compare(a, n, b), difference);
+        EXPECT_EQ(Chars::Compare(b, m, a, n), -difference);
+        EXPECT_EQ(Chars::IsEqual(a, n, b), difference == 0);
     }
     EXPECT_EQ(BaseCharTraits<char16_t>::Compare(u"\uFFFF", u"\u0001"), 0xFFFE);
 }
 
 TEST(BaseCharTraitsTest, WideDifferencesAreExactWhileTheyFit)
 {
-    struct Case
-    {
-        unsigned int a, b;
-        int difference;
-    };
-    for (Case const& c : {Case{'a', 'c', -2}, Case{0x10FFFF, 1, 0x10FFFE}, Case{7, 7, 0},
-                          Case{0xFFFFFFFF, 0, 0x7FFFFFFF}, Case{0, 0xFFFFFFFF, -0x7FFFFFFF - 1}})
-        EXPECT_EQ(Wide::Compare(&c.a, 1, &c.b, 1), c.difference) << c.a;
+    using Row = std::tuple<unsigned int, unsigned int, int>;
+    for (auto const& [a, b, difference] : {Row{'a', 'c', -2}, Row{0x10FFFF, 1, 0x10FFFE}, Row{7, 7, 0},
+                                           Row{0xFFFFFFFF, 0, 0x7FFFFFFF}, Row{0, 0xFFFFFFFF, -0x7FFFFFFF - 1}})
+        EXPECT_EQ(Wide::Compare(&a, 1, &b, 1), difference) << a;
 }
 
 TEST(BaseCharTraitsTest, TrimmingTouchesNothingOutsideTheUnitsGiven)
@@ -73,15 +66,12 @@ TEST(BaseCharTraitsTest, TrimmingTouchesNothingOutsideTheUnitsGiven)
 
 TEST(BaseCharTraitsTest, FindingStaysInsideTheText)
 {
-    struct Case
-    {
-        char const* needle;
-        int start, found;
-    };
-    for (Case const& c : {Case{"ab", 0, 0}, Case{"ab", 1, 3}, Case{"ab", -5, 0}, Case{"ab", 4, -1}, Case{"abc", 0, 3},
-                          Case{"abcd", 0, -1}, Case{"", 6, 6}, Case{"", 7, -1}, Case{"c", 9, -1}})
+    using Row = std::tuple<char const*, int, int>;
+    for (auto const& [needle, start, found] :
+         {Row{"ab", 0, 0}, Row{"ab", 1, 3}, Row{"ab", -5, 0}, Row{"ab", 4, -1}, Row{"abc", 0, 3}, Row{"abcd", 0, -1},
+          Row{"", 6, 6}, Row{"", 7, -1}, Row{"c", 9, -1}})
         // The text ends before the "d".
-        EXPECT_EQ(Chars::Find("ab-abcd", 6, c.needle, Chars::GetLength(c.needle), c.start), c.found) << c.needle;
+        EXPECT_EQ(Chars::Find("ab-abcd", 6, needle, Chars::GetLength(needle), start), found) << needle;
 }
 
 } // namespace

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <unicode/uchar.h>
 #include <unicode/ustring.h>
 #include <vector>
@@ -46,26 +47,20 @@ TEST(CaseTableTest, EveryCodePointFoldsAndMapsAsTheUnicodeLibraryDoes)
 
 TEST(CaseTableTest, LanguagesKeepTheirOwnRules)
 {
-    struct Case
+    using Row = std::tuple<Operation, char const*, u32, char32_t const*>;
+    for (auto const& [operation, locale, codePoint, mapped] :
+         {Row{Operation::Lower, "tr-TR", 'I', U"\u0131"}, Row{Operation::Upper, "az", 'i', U"\u0130"},
+          Row{Operation::Title, "tr_TR", 'i', U"\u0130"}, Row{Operation::Lower, "tr", 0x130, U"i"},
+          Row{Operation::Lower, "en", 0x130, U"i\u0307"}, Row{Operation::Lower, "tru", 'I', U"i"},
+          Row{Operation::Lower, "lt", 0xCC, U"i\u0307\u0300"}, Row{Operation::Upper, "hy", 0x587, U"\u0535\u054E"},
+          Row{Operation::Upper, "", 0x587, U"\u0535\u0552"}, Row{Operation::Upper, "el", 0x3AC, U"\u0386"},
+          Row{Operation::Fold, "tr", 'I', U"i"}, Row{Operation::Title, "", 0x1C6, U"\u01C5"},
+          Row{Operation::Title, "", 0xFB01, U"Fi"}, Row{Operation::Upper, "", 0x390, U"\u0399\u0308\u0301"},
+          Row{Operation::Lower, "not a locale at all, and a long one", 'A', U"a"},
+          Row{Operation::Upper, "", 0xFFFFFFFF, U"\xFFFFFFFF"}})
     {
-        Operation operation;
-        char const* locale;
-        u32 codePoint;
-        char32_t const* mapped;
-    };
-    for (Case const& c :
-         {Case{Operation::Lower, "tr-TR", 'I', U"\u0131"}, Case{Operation::Upper, "az", 'i', U"\u0130"},
-          Case{Operation::Title, "tr_TR", 'i', U"\u0130"}, Case{Operation::Lower, "tr", 0x130, U"i"},
-          Case{Operation::Lower, "en", 0x130, U"i\u0307"}, Case{Operation::Lower, "tru", 'I', U"i"},
-          Case{Operation::Lower, "lt", 0xCC, U"i\u0307\u0300"}, Case{Operation::Upper, "hy", 0x587, U"\u0535\u054E"},
-          Case{Operation::Upper, "", 0x587, U"\u0535\u0552"}, Case{Operation::Upper, "el", 0x3AC, U"\u0386"},
-          Case{Operation::Fold, "tr", 'I', U"i"}, Case{Operation::Title, "", 0x1C6, U"\u01C5"},
-          Case{Operation::Title, "", 0xFB01, U"Fi"}, Case{Operation::Upper, "", 0x390, U"\u0399\u0308\u0301"},
-          Case{Operation::Lower, "not a locale at all, and a long one", 'A', U"a"},
-          Case{Operation::Upper, "", 0xFFFFFFFF, U"\xFFFFFFFF"}})
-    {
-        SCOPED_TRACE(c.locale);
-        EXPECT_EQ(Map(c.operation, c.locale, c.codePoint), c.mapped) << c.codePoint;
+        SCOPED_TRACE(locale);
+        EXPECT_EQ(Map(operation, locale, codePoint), mapped) << codePoint;
     }
 }
 

@@ -1,6 +1,7 @@
 #include "libkernel/core/DemangleTypeName.h"
 
 #include <gtest/gtest.h>
+#include <tuple>
 #include <typeinfo>
 
 namespace TestNames {
@@ -26,21 +27,15 @@ using namespace Kernel;
 TEST(DemangleTypeName, NamesAreForDisplay)
 {
     using Nested = TestNames::Holder<TestNames::Thing>;
-    struct Case
+    using Row = std::tuple<char const*, char const*, char const*>;
+    for (auto const& [name, shown, full] :
+         {Row{typeid(int).name(), "int", "int"}, Row{typeid(TestNames::Thing).name(), "Thing", "TestNames::Thing"},
+          Row{typeid(Nested).name(), "Holder<TestNames::Thing>", "TestNames::Holder<TestNames::Thing>"},
+          Row{typeid(Nested::Inner).name(), "Inner", "TestNames::Holder<TestNames::Thing>::Inner"},
+          Row{"not mangled!", "not mangled!", "not mangled!"}, Row{"", "", ""}})
     {
-        char const* name;
-        char const* shown;
-        char const* full;
-    };
-    for (Case const& c : {Case{typeid(int).name(), "int", "int"},
-                          {typeid(TestNames::Thing).name(), "Thing", "TestNames::Thing"},
-                          {typeid(Nested).name(), "Holder<TestNames::Thing>", "TestNames::Holder<TestNames::Thing>"},
-                          {typeid(Nested::Inner).name(), "Inner", "TestNames::Holder<TestNames::Thing>::Inner"},
-                          {"not mangled!", "not mangled!", "not mangled!"},
-                          {"", "", ""}})
-    {
-        EXPECT_EQ(c.shown, DemangleTypeName(c.name, false)) << c.name;
-        EXPECT_EQ(c.full, DemangleTypeName(c.name, true)) << c.name;
+        EXPECT_EQ(shown, DemangleTypeName(name, false)) << name;
+        EXPECT_EQ(full, DemangleTypeName(name, true)) << name;
     }
     EXPECT_EQ("", DemangleTypeName(nullptr, true));
 }

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <limits>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -11,34 +12,18 @@ constexpr auto c_none = SignStyle::None;
 
 TEST(FractionTextTest, ImperialFractionsStandInLowestTerms)
 {
-    struct
-    {
-        double value;
-        u32 most, least;
-        SignStyle sign;
-        char const* expected;
-    } const cases[] = {
-        {1.5, 16, 2, c_none, "1 1/2"},
-        {0.9999, 16, 2, c_none, "1"},
-        {-1.9999, 16, 2, c_none, "-2"},
-        {-0.25, 16, 2, c_none, "-1/4"},
-        {0.25, 16, 2, SignStyle::Plus, "+1/4"},
-        {2.25, 16, 2, SignStyle::Space, " 2 1/4"},
-        {-0.001, 16, 2, SignStyle::Plus, "+0"},
-        {0.0, 16, 2, c_none, "0"},
-        {0.5, 16, 8, c_none, "4/8"},
-        {0.5, 16, 0, c_none, "1/2"},
-        {0.5, 16, 4294967295, c_none, "8/16"},
-        {7.0 / 16, 16, 2, c_none, "7/16"},
-        {3.0 / 32, 16, 2, c_none, "1/8"}, // 1.5 parts round up.
-        {0.2, 10, 2, c_none, "2/10"},
-        {0.75, 12, 2, c_none, "3/4"},
-        {0.6, 1, 2, c_none, "1"},
-        {3.7, 0, 2, c_none, "3"},
-        {-1e20, 16, 2, c_none, "-100000000000000000000"},
-        {c_infinity, 16, 2, c_none, "inf"},
-    };
-    for (auto const& c : cases) EXPECT_EQ(ToStringImperial(c.value, c.most, c.least, c.sign), c.expected);
+    using Row = std::tuple<double, u32, u32, SignStyle, char const*>;
+    for (auto const& [value, most, least, sign, expected] :
+         {Row{1.5, 16, 2, c_none, "1 1/2"}, Row{0.9999, 16, 2, c_none, "1"}, Row{-1.9999, 16, 2, c_none, "-2"},
+          Row{-0.25, 16, 2, c_none, "-1/4"}, Row{0.25, 16, 2, SignStyle::Plus, "+1/4"},
+          Row{2.25, 16, 2, SignStyle::Space, " 2 1/4"}, Row{-0.001, 16, 2, SignStyle::Plus, "+0"},
+          Row{0.0, 16, 2, c_none, "0"}, Row{0.5, 16, 8, c_none, "4/8"}, Row{0.5, 16, 0, c_none, "1/2"},
+          Row{0.5, 16, 4294967295, c_none, "8/16"}, Row{7.0 / 16, 16, 2, c_none, "7/16"},
+          Row{3.0 / 32, 16, 2, c_none, "1/8"}, // 1.5 parts round up.
+          Row{0.2, 10, 2, c_none, "2/10"}, Row{0.75, 12, 2, c_none, "3/4"}, Row{0.6, 1, 2, c_none, "1"},
+          Row{3.7, 0, 2, c_none, "3"}, Row{-1e20, 16, 2, c_none, "-100000000000000000000"},
+          Row{c_infinity, 16, 2, c_none, "inf"}})
+        EXPECT_EQ(ToStringImperial(value, most, least, sign), expected);
     EXPECT_EQ(ToStringImperialT<String16>(1.5, 16, 2, c_none), u"1 1/2");
 }
 
@@ -68,26 +53,18 @@ TEST(FractionTextTest, FractionsTellWhatTheyLose)
 
 TEST(FractionTextTest, PicasAndPoints)
 {
-    struct
-    {
-        double value;
-        u32 precision;
-        SignStyle sign;
-        TruncateStyle truncate;
-        char const* expected;
-    } const cases[] = {
-        {1.5, 6, c_none, TruncateStyle::KeepOne, "1p6"},
-        {2.0, 6, c_none, TruncateStyle::KeepOne, "2p"},
-        {0.5, 3, SignStyle::Plus, TruncateStyle::KeepAll, "0p6"},
-        {18.25 / 12, 6, c_none, TruncateStyle::StripZeros, "1p6.25"},
-        {24.5 / 12, 2, c_none, TruncateStyle::KeepAll, "2p0.50"},
-        {-18.0 / 12, 6, c_none, TruncateStyle::KeepOne, "-1p6"},
-        {-0.5, 6, c_none, TruncateStyle::KeepOne, "0p6"},
-        {11.9999999 / 12, 2, c_none, TruncateStyle::KeepAll, "1p"},
-        {1.5, 0, c_none, TruncateStyle::KeepAll, "1p6"},
-        {1e20, 6, c_none, TruncateStyle::KeepOne, "100000000000000000000p"},
-    };
-    for (auto const& c : cases) EXPECT_EQ(ToPicaString(c.value, c.precision, 9, c.sign, c.truncate), c.expected);
+    using Row = std::tuple<double, u32, SignStyle, TruncateStyle, char const*>;
+    for (auto const& [value, precision, sign, truncate, expected] :
+         {Row{1.5, 6, c_none, TruncateStyle::KeepOne, "1p6"}, Row{2.0, 6, c_none, TruncateStyle::KeepOne, "2p"},
+          Row{0.5, 3, SignStyle::Plus, TruncateStyle::KeepAll, "0p6"},
+          Row{18.25 / 12, 6, c_none, TruncateStyle::StripZeros, "1p6.25"},
+          Row{24.5 / 12, 2, c_none, TruncateStyle::KeepAll, "2p0.50"},
+          Row{-18.0 / 12, 6, c_none, TruncateStyle::KeepOne, "-1p6"},
+          Row{-0.5, 6, c_none, TruncateStyle::KeepOne, "0p6"},
+          Row{11.9999999 / 12, 2, c_none, TruncateStyle::KeepAll, "1p"},
+          Row{1.5, 0, c_none, TruncateStyle::KeepAll, "1p6"},
+          Row{1e20, 6, c_none, TruncateStyle::KeepOne, "100000000000000000000p"}})
+        EXPECT_EQ(ToPicaString(value, precision, 9, sign, truncate), expected);
     EXPECT_EQ(ToPicaStringT<String16>(-2.5), u"-2p6");
 }
 

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <limits>
 #include <random>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -85,49 +86,34 @@ TEST(NumberTextTest, EveryWidthShowsItsLimits)
 
 TEST(NumberTextTest, SignsAndGroups)
 {
-    struct Case
+    using Row = std::tuple<i64, SignStyle, CharacterGrouping const*, char const*>;
+    for (auto const& [value, sign, grouping, expected] :
+         {Row{1234567, SignStyle::None, CharacterGroupingNumber(), "1,234,567"},
+          Row{100, SignStyle::None, CharacterGroupingNumber(), "100"}, Row{0, SignStyle::None, nullptr, "0"},
+          Row{0, SignStyle::Plus, nullptr, "+0"}, Row{0, SignStyle::Space, nullptr, " 0"},
+          Row{-7, SignStyle::Plus, nullptr, "-7"}, Row{12345, SignStyle::None, CharacterGroupingHexBytes(), "1 23 45"},
+          Row{123456789, SignStyle::None, CharacterGroupingHexWords(), "1 2345 6789"}})
     {
-        i64 value;
-        SignStyle sign;
-        CharacterGrouping const* grouping;
-        char const* expected;
-    };
-    for (Case const& c : {Case{1234567, SignStyle::None, CharacterGroupingNumber(), "1,234,567"},
-                          Case{100, SignStyle::None, CharacterGroupingNumber(), "100"},
-                          Case{0, SignStyle::None, nullptr, "0"}, Case{0, SignStyle::Plus, nullptr, "+0"},
-                          Case{0, SignStyle::Space, nullptr, " 0"}, Case{-7, SignStyle::Plus, nullptr, "-7"},
-                          Case{12345, SignStyle::None, CharacterGroupingHexBytes(), "1 23 45"},
-                          Case{123456789, SignStyle::None, CharacterGroupingHexWords(), "1 2345 6789"}})
-    {
-        SCOPED_TRACE(c.expected);
-        EXPECT_EQ(ToString(c.value, c.sign, c.grouping), c.expected);
+        SCOPED_TRACE(expected);
+        EXPECT_EQ(ToString(value, sign, grouping), expected);
     }
 }
 
 TEST(NumberTextTest, FieldsAreFilled)
 {
-    struct Case
-    {
-        int value, width;
-        PadStyle pad;
-        SignStyle sign;
-        bool grouped;
-        char const* expected;
-    };
     constexpr auto left = PadStyle::SpacesLeft;
     constexpr auto zeros = PadStyle::ZerosLeft;
     constexpr auto right = PadStyle::SpacesRight;
-    for (Case const& c :
-         {Case{-5, 6, zeros, SignStyle::None, false, "-00005"}, Case{-5, 6, left, SignStyle::None, false, "    -5"},
-          Case{-5, 6, right, SignStyle::None, false, "-5    "}, Case{7, -9, zeros, SignStyle::None, false, "7"},
-          Case{123456, 3, left, SignStyle::None, false, "123456"},
-          Case{1234, 9, zeros, SignStyle::None, true, "0,001,234"},
-          Case{1234, 8, zeros, SignStyle::None, true, "0001,234"},
-          Case{-123, 5, zeros, SignStyle::None, true, "-0123"}})
+    using Row = std::tuple<int, int, PadStyle, SignStyle, bool, char const*>;
+    for (auto const& [value, width, pad, sign, grouped, expected] :
+         {Row{-5, 6, zeros, SignStyle::None, false, "-00005"}, Row{-5, 6, left, SignStyle::None, false, "    -5"},
+          Row{-5, 6, right, SignStyle::None, false, "-5    "}, Row{7, -9, zeros, SignStyle::None, false, "7"},
+          Row{123456, 3, left, SignStyle::None, false, "123456"},
+          Row{1234, 9, zeros, SignStyle::None, true, "0,001,234"},
+          Row{1234, 8, zeros, SignStyle::None, true, "0001,234"}, Row{-123, 5, zeros, SignStyle::None, true, "-0123"}})
     {
-        SCOPED_TRACE(c.expected);
-        EXPECT_EQ(ToStringPadded(c.value, c.width, c.pad, c.sign, c.grouped ? CharacterGroupingNumber() : nullptr),
-                  c.expected);
+        SCOPED_TRACE(expected);
+        EXPECT_EQ(ToStringPadded(value, width, pad, sign, grouped ? CharacterGroupingNumber() : nullptr), expected);
     }
     EXPECT_EQ(ToStringPadded(5u, 3, PadStyle::ZerosLeft), "005");
 }

@@ -4,6 +4,7 @@
 #include <limits>
 #include <random>
 #include <string>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -49,26 +50,21 @@ TEST(SimpleParserTest, ListsAreReadItemByItem)
 TEST(SimpleParserTest, ErrorsNameTheirPlace)
 {
     SimpleParser parser = MakeParser();
-    struct Case
+    using Row = std::tuple<char const*, Code, int, int>;
+    for (auto const& [text, code, pos, length] :
+         {Row{"", Code::Empty, 0, 0}, Row{" \t ", Code::Empty, 0, 3}, Row{"1, 2.3.4", Code::BadNumber, 3, 3},
+          Row{"1..", Code::BadNumber, 0, 2}, Row{".", Code::BadNumber, 0, 1}, Row{"2,. cm", Code::BadNumber, 2, 1},
+          Row{"..", Code::BadNumber, 0, 1}, Row{"1,-2", Code::Unexpected, 2, 1}, Row{"1 2", Code::Unexpected, 2, 1},
+          Row{"1 cm 2", Code::Unexpected, 5, 1}, Row{"cm", Code::Unexpected, 0, 1},
+          Row{"1 cm mm", Code::Unexpected, 5, 1}, Row{"1,cm", Code::Unexpected, 2, 1},
+          Row{"1\n", Code::Unexpected, 1, 1}, Row{"1 _x", Code::Unexpected, 2, 1},
+          Row{"1, 2 inch, 3", Code::UnknownKeyword, 5, 4}, Row{"1 CM", Code::UnknownKeyword, 2, 2},
+          Row{"1 c", Code::UnknownKeyword, 2, 1}, Row{"2e5", Code::UnknownKeyword, 1, 2}})
     {
-        char const* text;
-        Code code;
-        int pos, length;
-    };
-    for (Case const& c :
-         {Case{"", Code::Empty, 0, 0}, Case{" \t ", Code::Empty, 0, 3}, Case{"1, 2.3.4", Code::BadNumber, 3, 3},
-          Case{"1..", Code::BadNumber, 0, 2}, Case{".", Code::BadNumber, 0, 1}, Case{"2,. cm", Code::BadNumber, 2, 1},
-          Case{"..", Code::BadNumber, 0, 1}, Case{"1,-2", Code::Unexpected, 2, 1}, Case{"1 2", Code::Unexpected, 2, 1},
-          Case{"1 cm 2", Code::Unexpected, 5, 1}, Case{"cm", Code::Unexpected, 0, 1},
-          Case{"1 cm mm", Code::Unexpected, 5, 1}, Case{"1,cm", Code::Unexpected, 2, 1},
-          Case{"1\n", Code::Unexpected, 1, 1}, Case{"1 _x", Code::Unexpected, 2, 1},
-          Case{"1, 2 inch, 3", Code::UnknownKeyword, 5, 4}, Case{"1 CM", Code::UnknownKeyword, 2, 2},
-          Case{"1 c", Code::UnknownKeyword, 2, 1}, Case{"2e5", Code::UnknownKeyword, 1, 2}})
-    {
-        EXPECT_FALSE(parser.Parse(c.text, true)) << c.text;
-        EXPECT_EQ(parser.GetErrorCode(), c.code) << c.text;
-        EXPECT_EQ(parser.GetErrorPos(), c.pos) << c.text;
-        EXPECT_EQ(parser.GetErrorLength(), c.length) << c.text;
+        EXPECT_FALSE(parser.Parse(text, true)) << text;
+        EXPECT_EQ(parser.GetErrorCode(), code) << text;
+        EXPECT_EQ(parser.GetErrorPos(), pos) << text;
+        EXPECT_EQ(parser.GetErrorLength(), length) << text;
         EXPECT_TRUE(parser.GetResults().empty());
     }
     EXPECT_TRUE(parser.Parse("1", true));
@@ -93,25 +89,20 @@ TEST(SimpleParserTest, IllFormedKeywordsAreRefusedAtTheirByte)
 
 TEST(SimpleParserTest, DecimalsAreRoundedAsWritten)
 {
-    struct Case
-    {
-        char const* text;
-        int places;
-        double value;
-    };
     double const infinity = std::numeric_limits<double>::infinity();
     std::string const large(400, '9');
     std::string const small = "0." + std::string(400, '0') + "1";
-    for (Case const& c :
-         {Case{"1.235", 2, 1.24}, Case{"1.234", 2, 1.23}, Case{"1.005", 2, 1.01}, Case{"9.996", 2, 10.0},
-          Case{".95", 1, 1.0}, Case{"2.5", 0, 3.0}, Case{"2.4999", 0, 2.0}, Case{"1.235", -1, 1.235},
-          Case{"1.235", 3, 1.235}, Case{"7.", 0, 7.0}, Case{large.c_str(), 2, infinity}, Case{small.c_str(), -1, 0.0},
-          Case{"0.1", std::numeric_limits<int>::max(), 0.1}})
+    using Row = std::tuple<char const*, int, double>;
+    for (auto const& [text, places, value] :
+         {Row{"1.235", 2, 1.24}, Row{"1.234", 2, 1.23}, Row{"1.005", 2, 1.01}, Row{"9.996", 2, 10.0},
+          Row{".95", 1, 1.0}, Row{"2.5", 0, 3.0}, Row{"2.4999", 0, 2.0}, Row{"1.235", -1, 1.235},
+          Row{"1.235", 3, 1.235}, Row{"7.", 0, 7.0}, Row{large.c_str(), 2, infinity}, Row{small.c_str(), -1, 0.0},
+          Row{"0.1", std::numeric_limits<int>::max(), 0.1}})
     {
         SimpleParser parser(',');
-        parser.SetMaxDecimalPlaces(c.places);
-        ASSERT_TRUE(parser.Parse(c.text, false)) << c.text;
-        EXPECT_EQ(parser.GetResults()[0].value, c.value) << c.text;
+        parser.SetMaxDecimalPlaces(places);
+        ASSERT_TRUE(parser.Parse(text, false)) << text;
+        EXPECT_EQ(parser.GetResults()[0].value, value) << text;
     }
 }
 

@@ -6,6 +6,7 @@
 #include <cstring>
 #include <gmock/gmock.h>
 #include <sys/stat.h>
+#include <tuple>
 
 using namespace Kernel;
 using namespace std::string_literals;
@@ -19,26 +20,17 @@ String8 Text(std::string const& text)
 
 TEST(StringConverter, EveryRoadGivesTheSameText)
 {
-    struct
+    using Row = std::tuple<char const*, std::string, char const*>;
+    for (auto const& [charset, bytes, text] :
+         {Row{"UTF-8", "a\u20AC", "a\u20AC"}, Row{"windows-1252", "a\x80", "a\u20AC"},
+          Row{"Shift_JIS", "\x82\xA0", "\u3042"}, Row{"ISO-2022-JP", "\x1B$B$\"\x1B(B", "\u3042"},
+          Row{"gb18030", "\x94\x39\xFC\x36", "\U0001F600"}, Row{"UTF-8", "", ""}, Row{"windows-1252", "", ""}})
     {
-        char const* charset;
-        std::string bytes;
-        char const* text;
-    } const cases[] = {
-        {"UTF-8", "a\u20AC", "a\u20AC"},
-        {"windows-1252", "a\x80", "a\u20AC"},
-        {"Shift_JIS", "\x82\xA0", "\u3042"},
-        {"ISO-2022-JP", "\x1B$B$\"\x1B(B", "\u3042"},
-        {"gb18030", "\x94\x39\xFC\x36", "\U0001F600"},
-        {"UTF-8", "", ""},
-        {"windows-1252", "", ""},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.charset);
-        EXPECT_EQ(StringConverter(c.charset).Convert(c.bytes.c_str()), c.text);
-        EXPECT_EQ(EncodedToUtf8(c.bytes.c_str(), c.charset), c.text);
-        EXPECT_EQ(EncodedToUtf16(c.bytes.c_str(), c.charset), ConvertedTo<TEncUtf16>(String8(c.text)));
-        EXPECT_STREQ(Utf8ToEncoded(c.text, c.charset).get(), c.bytes.c_str());
+        SCOPED_TRACE(charset);
+        EXPECT_EQ(StringConverter(charset).Convert(bytes.c_str()), text);
+        EXPECT_EQ(EncodedToUtf8(bytes.c_str(), charset), text);
+        EXPECT_EQ(EncodedToUtf16(bytes.c_str(), charset), ConvertedTo<TEncUtf16>(String8(text)));
+        EXPECT_STREQ(Utf8ToEncoded(text, charset).get(), bytes.c_str());
     }
     auto const wide = Utf8ToEncoded("a", "UTF-32BE");
     EXPECT_EQ(std::string(wide.get(), 8), "\0\0\0a\0\0\0\0"s);
@@ -54,10 +46,7 @@ TEST(StringConverter, OneConverterServesManyTexts)
 TEST(StringConverter, SurrogatesWithoutPartnerAreReplaced)
 {
     // One unit in the compressed scheme's Unicode mode, and in the middle and at the end of UTF-7.
-    EXPECT_EQ(EncodedToUtf8("\x0E\xD8\x3D"
-                            "a",
-                            "SCSU"),
-              "\uFFFDa");
+    EXPECT_EQ(EncodedToUtf8("\x0E\xD8\075a", "SCSU"), "\uFFFDa");
     EXPECT_EQ(EncodedToUtf8("+2D0-a", "UTF-7"), "\uFFFDa");
     EXPECT_EQ(EncodedToUtf16("a+2D0-", "UTF-7"), String16(u"a\uFFFD"));
 }
@@ -85,16 +74,8 @@ TEST(StringConverter, EachByteKnowsItsUnit)
         std::string bytes;
         std::vector<int> sources;
     } const cases[] = {
-        {"windows-1252",
-         "a\u20ACb",
-         "a\x80"
-         "b",
-         {0, 1, 2}},
-        {"Shift_JIS",
-         "a\u3042b",
-         "a\x82\xA0"
-         "b",
-         {0, 1, 1, 2}},
+        {"windows-1252", "a\u20ACb", "a\200b", {0, 1, 2}},
+        {"Shift_JIS", "a\u3042b", "a\x82\240b", {0, 1, 1, 2}},
         {"UTF-8", "\U0001F600b", "\U0001F600b", {0, 0, 0, 0, 2}},
         {"windows-1252", "", "", {}},
     };
@@ -114,17 +95,15 @@ TEST(StringConverter, CharsetIsGuessedFromFilesAndBytes)
     TestSupport::TempFolder const folder;
     std::string const french =
         "Voil\xE0 l'\xE9t\xE9 qui s'en va, et d\xE9j\xE0 la for\xEAt a des couleurs plus \xE2pres.";
-    struct
+    using Row = std::tuple<std::string, char const*>;
+    for (auto const& [bytes, charset] :
+         {Row{french, "ISO-8859-1"}, Row{"\u3042\u3044\u3046 \u4E00\u4E8C", "UTF-8"}, Row{"", ""}})
     {
-        std::string bytes;
-        char const* charset;
-    } const cases[] = {{french, "ISO-8859-1"}, {"\u3042\u3044\u3046 \u4E00\u4E8C", "UTF-8"}, {"", ""}};
-    for (auto const& c : cases) {
-        TestSupport::WriteWholeFile(folder / "text", c.bytes);
-        EXPECT_EQ(IcuCharsetDetect(Text(folder / "text")), c.charset);
-        std::unique_ptr<char[]> copy(new char[c.bytes.size()]);
-        if (!c.bytes.empty()) std::memcpy(copy.get(), c.bytes.data(), c.bytes.size());
-        EXPECT_EQ(IcuCharsetDetect(std::move(copy), static_cast<i64>(c.bytes.size())), c.charset);
+        TestSupport::WriteWholeFile(folder / "text", bytes);
+        EXPECT_EQ(IcuCharsetDetect(Text(folder / "text")), charset);
+        std::unique_ptr<char[]> copy(new char[bytes.size()]);
+        if (!bytes.empty()) std::memcpy(copy.get(), bytes.data(), bytes.size());
+        EXPECT_EQ(IcuCharsetDetect(std::move(copy), static_cast<i64>(bytes.size())), charset);
     }
     EXPECT_TRUE(IcuCharsetDetect(nullptr, 5).IsEmpty());
     EXPECT_TRUE(IcuCharsetDetect("/dev/zero").IsEmpty());
@@ -135,21 +114,13 @@ TEST(StringConverter, TextFilesComeWithPlainLineEnds)
     TestSupport::TempFolder const folder;
     // The compressed scheme reads two units from each byte here, beyond the room that its shortest character gives.
     std::string const dense = "\x0B\x07\xEC" + std::string(100, '\x80');
-    struct
+    using Row = std::tuple<std::string, char const*, char const*>;
+    for (auto const& [bytes, charset, text] :
+         {Row{"a\x80\r\nb\r", "windows-1252", "a\u20AC\nb\n"}, Row{"a\0\x0D\0\x0A\0"s, "UTF-16LE", "a\n"},
+          Row{"a", "no such", ""}, Row{"", "windows-1252", ""}, Row{dense, "SCSU", ""}})
     {
-        std::string bytes;
-        char const* charset;
-        char const* text;
-    } const cases[] = {
-        {"a\x80\r\nb\r", "windows-1252", "a\u20AC\nb\n"},
-        {"a\0\x0D\0\x0A\0"s, "UTF-16LE", "a\n"},
-        {"a", "no such", ""},
-        {"", "windows-1252", ""},
-        {dense, "SCSU", ""},
-    };
-    for (auto const& c : cases) {
-        TestSupport::WriteWholeFile(folder / "text", c.bytes);
-        EXPECT_EQ(IcuLoadTextFile(Text(folder / "text"), c.charset), c.text) << c.charset;
+        TestSupport::WriteWholeFile(folder / "text", bytes);
+        EXPECT_EQ(IcuLoadTextFile(Text(folder / "text"), charset), text) << charset;
     }
     EXPECT_FALSE(EncodedToUtf8(dense.c_str(), "SCSU").IsEmpty());
     ASSERT_EQ(mkfifo((folder / "fifo").c_str(), 0600), 0);

@@ -5,21 +5,19 @@
 
 #include <gtest/gtest.h>
 #include <string>
+#include <tuple>
 
 namespace Kernel {
 namespace {
 
 TEST(TextToolsTest, LineEndsOfEverySortBecomeOneLineFeed)
 {
-    struct Case
-    {
-        char const* text;
-        char const* canonical;
-    };
-    for (Case const& c : {Case{"a\r\n\r\nb", "a\n\nb"}, Case{"a\n\r\n\rb", "a\n\nb"}, Case{"a\rb\r\rc", "a\nb\n\nc"},
-                          Case{"a\n\nb", "a\n\nb"}, Case{"\r", "\n"}, Case{"\n\r", "\n"}, Case{"\n\n\r", "\n\n"},
-                          Case{"x\n\r\r\n", "x\n\n"}, Case{"\r\n\n", "\n\n"}, Case{"", ""}, Case{"plain", "plain"}})
-        EXPECT_EQ(CanonicaliseLineEnds(c.text), c.canonical) << testing::PrintToString(c.text);
+    using Row = std::tuple<char const*, char const*>;
+    for (auto const& [text, canonical] :
+         {Row{"a\r\n\r\nb", "a\n\nb"}, Row{"a\n\r\n\rb", "a\n\nb"}, Row{"a\rb\r\rc", "a\nb\n\nc"},
+          Row{"a\n\nb", "a\n\nb"}, Row{"\r", "\n"}, Row{"\n\r", "\n"}, Row{"\n\n\r", "\n\n"}, Row{"x\n\r\r\n", "x\n\n"},
+          Row{"\r\n\n", "\n\n"}, Row{"", ""}, Row{"plain", "plain"}})
+        EXPECT_EQ(CanonicaliseLineEnds(text), canonical) << testing::PrintToString(text);
 }
 
 TEST(TextToolsTest, WordsAreCutBehindTheLastOneWanted)

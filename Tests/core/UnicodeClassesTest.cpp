@@ -4,6 +4,7 @@
 #include "libkernel/core/Utf8Sequence.h"
 
 #include <gmock/gmock.h>
+#include <tuple>
 
 using namespace Kernel;
 
@@ -79,32 +80,21 @@ TEST(UnicodeClasses, TonasLeavesTheCapitalsAlone)
 
 TEST(Utf8Sequence, CodePointsAndBytesTellEachOther)
 {
-    struct
+    using Row = std::tuple<u32, std::string>;
+    for (auto const& [codePoint, bytes] :
+         {Row{'a', "a"}, Row{0x7F, "\x7F"}, Row{0x80, "\xC2\x80"}, Row{0x7FF, "\xDF\xBF"}, Row{0x800, "\xE0\xA0\x80"},
+          Row{0xFFFF, "\xEF\xBF\xBF"}, Row{0x10000, "\xF0\x90\x80\x80"}, Row{0x1FFFFF, "\xF7\xBF\xBF\xBF"},
+          Row{0x200000, "\xF8\x88\x80\x80\x80"}, Row{0x4000000, "\xFC\x84\x80\x80\x80\x80"},
+          Row{0x7FFFFFFF, "\xFD\xBF\xBF\xBF\xBF\xBF"}})
     {
-        u32 codePoint;
-        std::string bytes;
-    } const cases[] = {
-        {'a', "a"},
-        {0x7F, "\x7F"},
-        {0x80, "\xC2\x80"},
-        {0x7FF, "\xDF\xBF"},
-        {0x800, "\xE0\xA0\x80"},
-        {0xFFFF, "\xEF\xBF\xBF"},
-        {0x10000, "\xF0\x90\x80\x80"},
-        {0x1FFFFF, "\xF7\xBF\xBF\xBF"},
-        {0x200000, "\xF8\x88\x80\x80\x80"},
-        {0x4000000, "\xFC\x84\x80\x80\x80\x80"},
-        {0x7FFFFFFF, "\xFD\xBF\xBF\xBF\xBF\xBF"},
-    };
-    for (auto const& c : cases) {
-        Utf8Sequence const made(c.codePoint);
-        EXPECT_EQ(std::string(made.GetSequence()), c.bytes);
-        EXPECT_TRUE(made.Equals(c.bytes.c_str()) && made.Equals(c.bytes.data(), c.bytes.size()));
-        EXPECT_FALSE(made.Equals((c.bytes + "x").c_str()) || made.Equals(c.bytes.data(), c.bytes.size() - 1));
+        Utf8Sequence const made(codePoint);
+        EXPECT_EQ(std::string(made.GetSequence()), bytes);
+        EXPECT_TRUE(made.Equals(bytes.c_str()) && made.Equals(bytes.data(), bytes.size()));
+        EXPECT_FALSE(made.Equals((bytes + "x").c_str()) || made.Equals(bytes.data(), bytes.size() - 1));
         Utf8Sequence read;
-        bool const readable = c.bytes.size() <= 4; // Longer forms are only written.
-        EXPECT_EQ(read.Set((c.bytes + "x").c_str()), readable ? static_cast<int>(c.bytes.size()) : 0);
-        EXPECT_EQ(read.GetValue(), readable ? c.codePoint : 0);
+        bool const readable = bytes.size() <= 4; // Longer forms are only written.
+        EXPECT_EQ(read.Set((bytes + "x").c_str()), readable ? static_cast<int>(bytes.size()) : 0);
+        EXPECT_EQ(read.GetValue(), readable ? codePoint : 0);
         EXPECT_EQ(read.IsValid(), readable);
     }
 }

@@ -1,7 +1,6 @@
 #include "libkernel/core/Uuid.h"
 
 #include "libkernel/core/BaseCharTraits.h"
-#include "libkernel/core/Hash.h"
 
 #include <gtest/gtest.h>
 
@@ -57,14 +56,6 @@ TEST(UuidTest, OrderIsThatOfTheTexts)
         Uuid const b = i % 2 ? Uuid() : Uuid(near);
         EXPECT_EQ(a < b, BaseCharTraits<char>::Compare(a.ToString().GetData(), b.ToString().GetData()) < 0);
     }
-}
-
-TEST(UuidTest, HashIsThatOfTheBytes)
-{
-    Uuid const id;
-    HashAccumulator hash;
-    hash.AddToHash(id.GetBytes().data(), 16);
-    EXPECT_EQ(std::hash<Uuid>()(id), hash.GetHash());
 }
 
 } // namespace

@@ -1,6 +1,7 @@
 #include "libkernel/numerics/IndexRange.h"
 
 #include <gtest/gtest.h>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -21,19 +22,15 @@ TEST(IndexRangeTest, BordersFollowFromLocationAndLength)
 
 TEST(IndexRangeTest, ClampAndIntersectsAgreeOnWhatBothHold)
 {
-    struct Case
+    using Row = std::tuple<IndexRange, IndexRange, IndexRange, bool>;
+    for (auto const& [a, b, clamped, intersects] :
+         {Row{{2, 5}, {4, 10}, {4, 3}, true}, Row{{4, 10}, {2, 5}, {4, 3}, true}, Row{{2, 5}, {3, 2}, {3, 2}, true},
+          Row{{2, 3}, {5, 4}, {5, 0}, false}, Row{{5, 4}, {2, 3}, {5, 0}, false}, Row{{2, 3}, {9, 0}, {9, 0}, false},
+          Row{{7, 0}, {2, 9}, {7, 0}, true}, Row{{1, 2147483647}, {5, 2}, {5, 2}, true}})
     {
-        IndexRange a, b, clamped;
-        bool intersects;
-    };
-    for (Case const& c :
-         {Case{{2, 5}, {4, 10}, {4, 3}, true}, Case{{4, 10}, {2, 5}, {4, 3}, true}, Case{{2, 5}, {3, 2}, {3, 2}, true},
-          Case{{2, 3}, {5, 4}, {5, 0}, false}, Case{{5, 4}, {2, 3}, {5, 0}, false}, Case{{2, 3}, {9, 0}, {9, 0}, false},
-          Case{{7, 0}, {2, 9}, {7, 0}, true}, Case{{1, 2147483647}, {5, 2}, {5, 2}, true}})
-    {
-        SCOPED_TRACE(testing::Message() << c.a.GetLocation() << ',' << c.a.GetLength());
-        EXPECT_EQ(IndexRange::Clamp(c.a, c.b), c.clamped);
-        EXPECT_EQ(c.a.Intersects(c.b), c.intersects);
+        SCOPED_TRACE(testing::Message() << a.GetLocation() << ',' << a.GetLength());
+        EXPECT_EQ(IndexRange::Clamp(a, b), clamped);
+        EXPECT_EQ(a.Intersects(b), intersects);
     }
 }
 

@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 namespace Kernel::Test {
@@ -20,47 +21,38 @@ constexpr char const* c_bad = "no locale at all"; ///< ICU refuses it.
 
 TEST(CollatorTest, LanguageCaseAndDigitsDecideTheOrder)
 {
-    struct
+    // Null for no locale.
+    using Row = std::tuple<char const*, bool, bool, char const*, char const*, int>;
+    for (auto const& [locale, caseSensitive, numeric, a, b, expected] :
+         {Row{"sv-SE", false, false, "z", "\xC3\xB6", -1},
+          Row{"de-DE", false, false, "z", "\xC3\xB6", 1},
+          Row{nullptr, false, false, "z", "\xC3\xB6", 1},
+          Row{"de-u-co-phonebk", false, false, "\xC3\xA4", "az", -1},
+          Row{"de-DE", false, false, "\xC3\xA4", "az", -1},
+          Row{"de-u-co-phonebk", false, false, "\xC3\xA4", "ad", 1},
+          Row{"en", false, false, "Boat", "boat", 0},
+          Row{"en", true, false, "Boat", "boat", 1},
+          Row{"en", false, false, "resume", "r\xC3\xA9sum\xC3\xA9", -1},
+          Row{"en", false, false, "r\xC3\xA9sum\xC3\xA9", "re\xCC\x81sume\xCC\x81", 0},
+          Row{"en", false, false, "file10", "file9", -1},
+          Row{"en", false, true, "file10", "file9", 1},
+          Row{"en", false, true, "file010", "file10", 0},
+          Row{"en", true, false, "", "a", -1},
+          Row{"en", true, false, "", "", 0},
+          Row{"xx-YY", true, false, "a", "B", -1},
+          Row{c_bad, true, false, "a", "B", 1},
+          Row{c_bad, true, true, "a10", "a9", -1},
+          Row{c_bad, false, false, "a", "B", -1},
+          Row{c_bad, false, false, "STRASSE", "stra\xC3\237e", 0},
+          Row{c_bad, false, false, "a\xE2\x80", "a", 1},
+          Row{"en", true, false, "\xFF", "\xEF\xBF\xBD", 0},
+          Row{"en", true, false, "a\xE2\x80", "a", 1}})
     {
-        char const* locale; ///< Null for none.
-        bool caseSensitive, numeric;
-        char const* a;
-        char const* b;
-        int expected;
-    } const cases[] = {
-        {"sv-SE", false, false, "z", "\xC3\xB6", -1},
-        {"de-DE", false, false, "z", "\xC3\xB6", 1},
-        {nullptr, false, false, "z", "\xC3\xB6", 1},
-        {"de-u-co-phonebk", false, false, "\xC3\xA4", "az", -1},
-        {"de-DE", false, false, "\xC3\xA4", "az", -1},
-        {"de-u-co-phonebk", false, false, "\xC3\xA4", "ad", 1},
-        {"en", false, false, "Boat", "boat", 0},
-        {"en", true, false, "Boat", "boat", 1},
-        {"en", false, false, "resume", "r\xC3\xA9sum\xC3\xA9", -1},
-        {"en", false, false, "r\xC3\xA9sum\xC3\xA9", "re\xCC\x81sume\xCC\x81", 0},
-        {"en", false, false, "file10", "file9", -1},
-        {"en", false, true, "file10", "file9", 1},
-        {"en", false, true, "file010", "file10", 0},
-        {"en", true, false, "", "a", -1},
-        {"en", true, false, "", "", 0},
-        {"xx-YY", true, false, "a", "B", -1},
-        {c_bad, true, false, "a", "B", 1},
-        {c_bad, true, true, "a10", "a9", -1},
-        {c_bad, false, false, "a", "B", -1},
-        {c_bad, false, false, "STRASSE",
-         "stra\xC3\x9F"
-         "e",
-         0},
-        {c_bad, false, false, "a\xE2\x80", "a", 1},
-        {"en", true, false, "\xFF", "\xEF\xBF\xBD", 0},
-        {"en", true, false, "a\xE2\x80", "a", 1},
-    };
-    for (auto const& c : cases) {
-        auto const collator = Make(c.locale, c.caseSensitive, c.numeric);
-        EXPECT_EQ(collator->IsLocaleAware(), c.locale != c_bad) << c.a;
+        auto const collator = Make(locale, caseSensitive, numeric);
+        EXPECT_EQ(collator->IsLocaleAware(), locale != c_bad) << a;
         auto const sign = [](int order) { return (order > 0) - (order < 0); };
-        EXPECT_EQ(sign(collator->Collate(c.a, c.b)), c.expected) << c.a << " " << c.b;
-        EXPECT_EQ(sign(collator->Collate(c.b, c.a)), -c.expected) << c.a << " " << c.b;
+        EXPECT_EQ(sign(collator->Collate(a, b)), expected) << a << " " << b;
+        EXPECT_EQ(sign(collator->Collate(b, a)), -expected) << a << " " << b;
     }
 }
 

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <gtest/gtest.h>
 #include <map>
+#include <tuple>
 #include <unicode/uloc.h>
 
 namespace Kernel::Test {
@@ -10,35 +11,14 @@ namespace {
 
 TEST(LanguageIdTest, OfferIsMatchedWithTheWantedLanguage)
 {
-    struct
-    {
-        char const* wanted;
-        char const* offered;
-        int expected;
-    } const cases[] = {
-        {"en-GB", "en-US", 1},
-        {"en", "en-US", 2},
-        {"en", "en-GB", 1},
-        {"fr", "en-GB", 0},
-        {"en", "en", 2},
-        {"en-GB", "en-GB", 2},
-        {"en-GB", "en_GB", 2},
-        {"xx", "xx-GB", 1},
-        {"nb", "nb-NO", 2},
-        {"en-GB", "en", 0},
-        {"", "", 2},
-        {"", "en-GB", 0},
-        {"e", "e", 2},
-        {"zh", "zh-Hans", 0},
-        {"zh-Hans", "zh-Hans", 2},
-        {"zh-TW", "zh-Hans", 0},
-        {"eng", "en-GB", 0},
-        {"de", "d", 0},
-        {"ca-ES-valencia", "ca-ES", 0},
-    };
-    for (auto const& c : cases)
-        EXPECT_EQ(static_cast<int>(GetLanguageIdMatch(c.wanted, c.offered)), c.expected)
-            << c.wanted << " " << c.offered;
+    using Row = std::tuple<char const*, char const*, int>;
+    for (auto const& [wanted, offered, expected] :
+         {Row{"en-GB", "en-US", 1}, Row{"en", "en-US", 2}, Row{"en", "en-GB", 1}, Row{"fr", "en-GB", 0},
+          Row{"en", "en", 2}, Row{"en-GB", "en-GB", 2}, Row{"en-GB", "en_GB", 2}, Row{"xx", "xx-GB", 1},
+          Row{"nb", "nb-NO", 2}, Row{"en-GB", "en", 0}, Row{"", "", 2}, Row{"", "en-GB", 0}, Row{"e", "e", 2},
+          Row{"zh", "zh-Hans", 0}, Row{"zh-Hans", "zh-Hans", 2}, Row{"zh-TW", "zh-Hans", 0}, Row{"eng", "en-GB", 0},
+          Row{"de", "d", 0}, Row{"ca-ES-valencia", "ca-ES", 0}})
+        EXPECT_EQ(static_cast<int>(GetLanguageIdMatch(wanted, offered)), expected) << wanted << " " << offered;
 }
 
 TEST(LanguageIdTest, DefaultCountryIsPutBehindABareLanguage)
@@ -62,31 +42,13 @@ TEST(LanguageIdTest, DefaultCountryIsPutBehindABareLanguage)
 
 TEST(LanguageIdTest, PublishedIdentifiersHaveTheirTags)
 {
-    struct
-    {
-        int lcid;
-        char const* tag;
-    } const cases[] = {
-        {1, "ar"},
-        {4, "zh-Hans"},
-        {1088, "ky-KG"},
-        {31890, "ku-Arab"},
-        {255, "zxx"},
-        {0, ""},
-        {1033, "en-US"},
-        {2057, "en-GB"},
-        {1034, "es-ES_tradnl"},
-        {2051, "ca-ES-valencia"},
-        {31748, "zh-Hant"},
-        {66567, "de-DE_phoneb"},
-        {331780, "zh-SG_phoneb"},
-        {331781, ""},
-        {127, ""},
-        {4096, ""},
-        {-1, ""},
-        {2147483647, ""},
-    };
-    for (auto const& c : cases) EXPECT_EQ(GetLanguageIdFromLcid(c.lcid), c.tag) << c.lcid;
+    using Row = std::tuple<int, char const*>;
+    for (auto const& [lcid, tag] :
+         {Row{1, "ar"}, Row{4, "zh-Hans"}, Row{1088, "ky-KG"}, Row{31890, "ku-Arab"}, Row{255, "zxx"}, Row{0, ""},
+          Row{1033, "en-US"}, Row{2057, "en-GB"}, Row{1034, "es-ES_tradnl"}, Row{2051, "ca-ES-valencia"},
+          Row{31748, "zh-Hant"}, Row{66567, "de-DE_phoneb"}, Row{331780, "zh-SG_phoneb"}, Row{331781, ""}, Row{127, ""},
+          Row{4096, ""}, Row{-1, ""}, Row{2147483647, ""}})
+        EXPECT_EQ(GetLanguageIdFromLcid(lcid), tag) << lcid;
 }
 
 // ICU fills in countries and scripts of its own, so only the language is compared; four it names in another way.

@@ -1,33 +1,23 @@
 #include "libkernel/text/Locale.h"
 
 #include <gtest/gtest.h>
+#include <tuple>
 
 namespace Kernel::Test {
 namespace {
 
 TEST(LocaleTest, IdentifierIsTakenApart)
 {
-    struct
+    using Row = std::tuple<char const*, char const*, u16, int>;
+    for (auto const& [id, isoCode, language, units16] :
+         {Row{"en-GB", "en", 0x656E, 5}, Row{"zh-Hans-CN", "zh", 0x7A68, 10}, Row{"de", "de", 0x6465, 2},
+          Row{"x", "x", 0, 1}, Row{"", "", 0, 0}, Row{"-x", "", 0x2D78, 2}, Row{"e\xFF", "e\xFF", 0x65FF, 1}})
     {
-        char const* id;
-        char const* isoCode;
-        u16 language;
-        int units16;
-    } const cases[] = {
-        {"en-GB", "en", 0x656E, 5},
-        {"zh-Hans-CN", "zh", 0x7A68, 10},
-        {"de", "de", 0x6465, 2},
-        {"x", "x", 0, 1},
-        {"", "", 0, 0},
-        {"-x", "", 0x2D78, 2},
-        {"e\xFF", "e\xFF", 0x65FF, 1},
-    };
-    for (auto const& c : cases) {
-        Counted<Locale const> const locale = Locale::Create(c.id);
-        EXPECT_EQ(locale->GetId(), c.id);
-        EXPECT_EQ(locale->GetISOCode(), c.isoCode) << c.id;
-        EXPECT_EQ(locale->GetEncodedLanguage(), c.language) << c.id;
-        EXPECT_EQ(locale->ToWin32Locale().GetLength(), c.units16) << c.id;
+        Counted<Locale const> const locale = Locale::Create(id);
+        EXPECT_EQ(locale->GetId(), id);
+        EXPECT_EQ(locale->GetISOCode(), isoCode) << id;
+        EXPECT_EQ(locale->GetEncodedLanguage(), language) << id;
+        EXPECT_EQ(locale->ToWin32Locale().GetLength(), units16) << id;
     }
     EXPECT_EQ(Locale::EncodeLanguage('e', 'n'), 0x656E);
 }

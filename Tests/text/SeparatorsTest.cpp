@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <random>
 #include <string>
+#include <tuple>
 
 namespace Kernel::Test {
 namespace {
@@ -21,59 +22,38 @@ protected:
 
 TEST_F(SeparatorsTest, NumbersAreConvertedByTheSeparators)
 {
-    struct
+    // What the local text becomes, and what that becomes in turn.
+    using Row = std::tuple<unsigned int, unsigned int, char const*, char const*, char const*>;
+    for (auto const& [decimal, grouping, local, machine, back] :
+         {Row{',', '.', "1.234,5", "1234.5", "1234,5"}, Row{',', '.', "f(1,5; 2)", "f(1.5, 2)", "f(1,5; 2)"},
+          Row{'.', ',', "1,234.5", "1234.5", "1234.5"}, Row{'.', ',', "f(1.5; 2)", "f(1.5, 2)", "f(1.5; 2)"},
+          Row{'.', ' ', "f(1 000.5, 2)", "f(1000.5,2)", "f(1000.5,2)"},
+          Row{',', ' ', "1 000,5;2", "1000.5,2", "1000,5;2"},
+          Row{0x66B, 0x66C,
+              "1\xD9\254234\xD9\xAB"
+              "5",
+              "1234.5", "1234\xD9\2535"},
+          Row{',', 0x202F, "1\xE2\x80\257234,5,6", "1234.5.6", "1234,5,6"}, Row{',', ',', "1,234", "1234", "1234"},
+          Row{0, 0, "1,234.5;", "1,234.5;", "1,234.5;"}, Row{',', '.', "", "", ""}, Row{',', '.', "...", "", ""}})
     {
-        unsigned int decimal, grouping;
-        char const* local;
-        char const* machine; ///< What the local text becomes.
-        char const* back;    ///< What that becomes in turn.
-    } const cases[] = {
-        {',', '.', "1.234,5", "1234.5", "1234,5"},
-        {',', '.', "f(1,5; 2)", "f(1.5, 2)", "f(1,5; 2)"},
-        {'.', ',', "1,234.5", "1234.5", "1234.5"},
-        {'.', ',', "f(1.5; 2)", "f(1.5, 2)", "f(1.5; 2)"},
-        {'.', ' ', "f(1 000.5, 2)", "f(1000.5,2)", "f(1000.5,2)"},
-        {',', ' ', "1 000,5;2", "1000.5,2", "1000,5;2"},
-        {0x66B, 0x66C,
-         "1\xD9\xAC"
-         "234\xD9\xAB"
-         "5",
-         "1234.5",
-         "1234\xD9\xAB"
-         "5"},
-        {',', 0x202F,
-         "1\xE2\x80\xAF"
-         "234,5,6",
-         "1234.5.6", "1234,5,6"},
-        {',', ',', "1,234", "1234", "1234"},
-        {0, 0, "1,234.5;", "1,234.5;", "1,234.5;"},
-        {',', '.', "", "", ""},
-        {',', '.', "...", "", ""},
-    };
-    for (auto const& c : cases) {
-        Set(c.decimal, c.grouping);
-        EXPECT_EQ(ConvertFromLocalisedDecimal(c.local), c.machine) << c.local;
-        EXPECT_EQ(ConvertToLocalisedDecimal(c.machine), c.back) << c.local;
-        EXPECT_EQ(IsDefaultDecimalSeparator(), c.decimal == '.');
+        Set(decimal, grouping);
+        EXPECT_EQ(ConvertFromLocalisedDecimal(local), machine) << local;
+        EXPECT_EQ(ConvertToLocalisedDecimal(machine), back) << local;
+        EXPECT_EQ(IsDefaultDecimalSeparator(), decimal == '.');
     }
 }
 
 TEST_F(SeparatorsTest, OnlyTextOfOneCodePointIsTaken)
 {
-    struct
+    using Row = std::tuple<char const*, unsigned int>;
+    for (auto const& [text, expected] : {Row{",", ','}, Row{"\xD9\xAB", 0x66B}, Row{"\xF0\x9F\x98\x80", 0x1F600},
+                                         Row{"", '?'}, Row{"..", '?'}, Row{"\xD9", '?'}, Row{"\xE2\x80,", '?'}})
     {
-        char const* text;
-        unsigned int expected;
-    } const cases[] = {
-        {",", ','},    {"\xD9\xAB", 0x66B}, {"\xF0\x9F\x98\x80", 0x1F600}, {"", '?'}, {"..", '?'},
-        {"\xD9", '?'}, {"\xE2\x80,", '?'},
-    };
-    for (auto const& c : cases) {
         Set('?', '?');
-        SetLocalDecimalSeparator(String8(c.text));
-        SetLocalDigitGroupingSeparator(String8(c.text));
-        EXPECT_EQ(GetLocalDecimalSeparator(), c.expected) << c.text;
-        EXPECT_EQ(GetLocalGroupingSeparator(), c.expected) << c.text;
+        SetLocalDecimalSeparator(String8(text));
+        SetLocalDigitGroupingSeparator(String8(text));
+        EXPECT_EQ(GetLocalDecimalSeparator(), expected) << text;
+        EXPECT_EQ(GetLocalGroupingSeparator(), expected) << text;
     }
 }
 

@@ -3,34 +3,21 @@
 #include "libkernel/text/Locale.h"
 
 #include <gtest/gtest.h>
+#include <tuple>
 
 namespace Kernel::Test {
 namespace {
 
 TEST(StemmerTest, WordsAreCutDownInTheLanguageOfTheLocale)
 {
-    struct
-    {
-        char const* locale;
-        char const* word;
-        char const* stem;
-    } const cases[] = {
-        {"en-GB", "Sailing", "sail"},
-        {"en_US", "boats", "boat"},
-        {"en", "HARBOURS", "harbour"},
-        {"de-DE", "H\xC3\x84USER", "haus"},
-        {"fr", "voiles", "voil"},
-        {"english", "sailing", "sail"},
-        {"eng", "sailing", "sail"},
-        {"nb-NO", "B\xC3\xA5ten", "B\xC3\xA5ten"},
-        {"no", "b\xC3\xA5ten", "b\xC3\xA5t"},
-        {"", "Sailing", "Sailing"},
-        {"-en", "Sailing", "Sailing"},
-        {"en_GB-x", "Sailing", "Sailing"},
-        {"en", "", ""},
-    };
-    for (auto const& c : cases)
-        EXPECT_EQ(MakeCounted<Stemmer>(Locale::Create(c.locale))->Stem(c.word), c.stem) << c.locale << " " << c.word;
+    using Row = std::tuple<char const*, char const*, char const*>;
+    for (auto const& [locale, word, stem] :
+         {Row{"en-GB", "Sailing", "sail"}, Row{"en_US", "boats", "boat"}, Row{"en", "HARBOURS", "harbour"},
+          Row{"de-DE", "H\xC3\x84USER", "haus"}, Row{"fr", "voiles", "voil"}, Row{"english", "sailing", "sail"},
+          Row{"eng", "sailing", "sail"}, Row{"nb-NO", "B\xC3\xA5ten", "B\xC3\xA5ten"},
+          Row{"no", "b\xC3\xA5ten", "b\xC3\xA5t"}, Row{"", "Sailing", "Sailing"}, Row{"-en", "Sailing", "Sailing"},
+          Row{"en_GB-x", "Sailing", "Sailing"}, Row{"en", "", ""}})
+        EXPECT_EQ(MakeCounted<Stemmer>(Locale::Create(locale))->Stem(word), stem) << locale << " " << word;
     EXPECT_FALSE(MakeCounted<Stemmer>(nullptr)->IsValid());
 }
 

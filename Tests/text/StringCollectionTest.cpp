@@ -22,20 +22,15 @@ Counted<StringCollection> Make(char const* standard, std::map<char const*, char 
 TEST(StringCollectionTest, ModeSaysWhatStandsIn)
 {
     auto const both = Make("std", {{"en", "sea"}, {"fr", "mer"}}), french = Make("std", {{"fr", "mer"}});
-    struct
+    using Row = std::tuple<char const*, Mode, char const*, char const*>;
+    for (auto const& [key, mode, expected, withoutEnglish] :
+         {Row{"fr", Mode::Exact, "mer", "mer"}, Row{"de", Mode::Exact, "", ""}, Row{"", Mode::Exact, "", ""},
+          Row{"fr", Mode::Default, "mer", "mer"}, Row{"de", Mode::Default, "std", "std"},
+          Row{"", Mode::Default, "std", "std"}, Row{"fr", Mode::English, "mer", "mer"},
+          Row{"de", Mode::English, "sea", "std"}, Row{"", Mode::English, "std", "std"}})
     {
-        char const* key;
-        Mode mode;
-        char const* expected;
-        char const* withoutEnglish;
-    } const cases[] = {
-        {"fr", Mode::Exact, "mer", "mer"},   {"de", Mode::Exact, "", ""},         {"", Mode::Exact, "", ""},
-        {"fr", Mode::Default, "mer", "mer"}, {"de", Mode::Default, "std", "std"}, {"", Mode::Default, "std", "std"},
-        {"fr", Mode::English, "mer", "mer"}, {"de", Mode::English, "sea", "std"}, {"", Mode::English, "std", "std"},
-    };
-    for (auto const& c : cases) {
-        EXPECT_EQ(both->GetVariant(c.key, c.mode), c.expected) << c.key << static_cast<int>(c.mode);
-        EXPECT_EQ(french->GetVariant(c.key, c.mode), c.withoutEnglish) << c.key << static_cast<int>(c.mode);
+        EXPECT_EQ(both->GetVariant(key, mode), expected) << key << static_cast<int>(mode);
+        EXPECT_EQ(french->GetVariant(key, mode), withoutEnglish) << key << static_cast<int>(mode);
     }
 }
 

@@ -3,6 +3,7 @@
 #include <cstdlib>
 #include <gtest/gtest.h>
 #include <limits>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -24,23 +25,17 @@ protected:
 
 TEST_F(TimeTextTest, StylesFollowTheCLibrary)
 {
-    struct
+    using Row = std::tuple<TimeStampStyle, char const*, char const*>;
+    for (auto const& [style, utc, local] :
+         {Row{TimeStampStyle::DateTime, "Sat Feb 29 12:30:45 2020", "Sat Feb 29 07:30:45 2020"},
+          Row{TimeStampStyle::Date, "02/29/20", "02/29/20"}, Row{TimeStampStyle::Time, "12:30:45", "07:30:45"},
+          Row{TimeStampStyle::Iso8601, "2020-02-29T12:30:45Z", "2020-02-29T07:30:45-0500"},
+          Row{static_cast<TimeStampStyle>(4), "", ""}})
     {
-        TimeStampStyle style;
-        char const* utc;
-        char const* local;
-    } const cases[] = {
-        {TimeStampStyle::DateTime, "Sat Feb 29 12:30:45 2020", "Sat Feb 29 07:30:45 2020"},
-        {TimeStampStyle::Date, "02/29/20", "02/29/20"},
-        {TimeStampStyle::Time, "12:30:45", "07:30:45"},
-        {TimeStampStyle::Iso8601, "2020-02-29T12:30:45Z", "2020-02-29T07:30:45-0500"},
-        {static_cast<TimeStampStyle>(4), "", ""},
-    };
-    for (auto const& c : cases) {
-        EXPECT_EQ(ToString(TimeStamp(c_noon), c.style, c_utc), c.utc);
-        EXPECT_EQ(ToString(TimeStamp(c_noon), c.style, c_local), c.local);
-        if (c.style != TimeStampStyle::Iso8601) {
-            EXPECT_EQ(ToString(HighResTimeStamp(c_noon, 678), c.style, c_utc), c.utc);
+        EXPECT_EQ(ToString(TimeStamp(c_noon), style, c_utc), utc);
+        EXPECT_EQ(ToString(TimeStamp(c_noon), style, c_local), local);
+        if (style != TimeStampStyle::Iso8601) {
+            EXPECT_EQ(ToString(HighResTimeStamp(c_noon, 678), style, c_utc), utc);
         }
     }
     EXPECT_EQ(ToStringT<String16>(TimeStamp(0), TimeStampStyle::Iso8601, c_utc), u"1970-01-01T00:00:00Z");
@@ -48,17 +43,12 @@ TEST_F(TimeTextTest, StylesFollowTheCLibrary)
 
 TEST_F(TimeTextTest, HighResolutionShowsMilliseconds)
 {
-    struct
-    {
-        HighResTimeStamp stamp;
-        char const* expected;
-    } const cases[] = {
-        {HighResTimeStamp(c_noon, 678), "2020-02-29T12:30:45.678Z"},
-        {HighResTimeStamp(c_noon, 7), "2020-02-29T12:30:45.007Z"},
-        {HighResTimeStamp(-2, 250), "1969-12-31T23:59:58.250Z"},
-        {HighResTimeStamp(-1, 0), "1969-12-31T23:59:59.000Z"},
-    };
-    for (auto const& c : cases) EXPECT_EQ(ToString(c.stamp, TimeStampStyle::Iso8601, c_utc), c.expected);
+    using Row = std::tuple<HighResTimeStamp, char const*>;
+    for (auto const& [stamp, expected] : {Row{HighResTimeStamp(c_noon, 678), "2020-02-29T12:30:45.678Z"},
+                                          Row{HighResTimeStamp(c_noon, 7), "2020-02-29T12:30:45.007Z"},
+                                          Row{HighResTimeStamp(-2, 250), "1969-12-31T23:59:58.250Z"},
+                                          Row{HighResTimeStamp(-1, 0), "1969-12-31T23:59:59.000Z"}})
+        EXPECT_EQ(ToString(stamp, TimeStampStyle::Iso8601, c_utc), expected);
     EXPECT_EQ(ToString(HighResTimeStamp(c_noon, 5), TimeStampStyle::Iso8601, c_local), "2020-02-29T07:30:45.005-0500");
 }
 
