@@ -52,25 +52,6 @@ protected:
     TempFolder m_first, m_second;
 };
 
-TEST_F(TempFileTest, NamesCountUpInHexadecimalAndEndInTheExtension)
-{
-    String8 a, b, c, d;
-    ASSERT_TRUE(TempFile::GenerateTempFilePath(a, ""));
-    ASSERT_TRUE(TempFile::GenerateTempFilePath(b, "tmp"));
-    ASSERT_TRUE(TempFile::GenerateTempFilePath(c, ".tmp"));
-    ASSERT_TRUE(TempFile::GenerateTempFilePath(d, "", TempFile::c_second));
-    EXPECT_TRUE(a.BeginsWith(S(m_first.GetPath() + "/")));
-    EXPECT_TRUE(d.BeginsWith(S(m_second.GetPath() + "/")));
-    EXPECT_EQ(CounterOf(b), CounterOf(a) + 1);
-    EXPECT_EQ(CounterOf(d), CounterOf(a) + 3);
-    for (String8 const& path : {b, c}) {
-        std::string const name = FileSystem::GetFilename(path).GetData();
-        EXPECT_EQ(name.find(".tmp"), name.size() - 4);
-        EXPECT_EQ(name.find_first_not_of("0123456789abcdef"), name.size() - 4);
-    }
-    EXPECT_FALSE(FileSystem::Exists(a));
-}
-
 TEST_F(TempFileTest, NothingIsMadeWithoutTheFolderAskedFor)
 {
     String8 out = "untouched";
@@ -88,23 +69,30 @@ TEST_F(TempFileTest, NothingIsMadeWithoutTheFolderAskedFor)
     EXPECT_EQ(out, "untouched");
 }
 
-TEST_F(TempFileTest, MadeFilesAreNewEmptyAndOpen)
+TEST_F(TempFileTest, NamesCountUpInHexadecimalAndMadeFilesAreOpen)
 {
-    String8 both, out;
-    Counted<FileInOutStream> const stream = TempFile::GenerateTempInOutFile(both, "t");
-    ASSERT_TRUE(stream);
-    EXPECT_EQ(FileSystem::GetFileSize(both), 0);
+    String8 a, b, c, d, e;
+    ASSERT_TRUE(TempFile::GenerateTempFilePath(a, ""));
+    Counted<FileInOutStream> const stream = TempFile::GenerateTempInOutFile(b, "tmp");
+    Counted<FileOutStream> const writer = TempFile::GenerateTempOutFile(c, ".tmp");
+    ASSERT_TRUE(stream && writer && TempFile::GenerateTempFilePath(d, "", TempFile::c_second));
+    EXPECT_TRUE(a.BeginsWith(S(m_first.GetPath() + "/")));
+    EXPECT_TRUE(d.BeginsWith(S(m_second.GetPath() + "/")));
+    EXPECT_EQ(CounterOf(b), CounterOf(a) + 1);
+    EXPECT_EQ(CounterOf(d), CounterOf(a) + 3);
+    for (String8 const& path : {b, c}) {
+        std::string const name = FileSystem::GetFilename(path).GetData();
+        EXPECT_EQ(name.find(".tmp"), name.size() - 4);
+        EXPECT_EQ(name.find_first_not_of("0123456789abcdef"), name.size() - 4);
+        EXPECT_EQ(FileSystem::GetFileSize(path), 0);
+    }
+    EXPECT_FALSE(FileSystem::Exists(a));
     char text[3] = {};
     EXPECT_EQ(stream->WriteBlock("abc", 3), 3u);
     EXPECT_TRUE(stream->SeekInStream(SeekMethod::Beginning, 0));
     EXPECT_EQ(stream->ReadBlock(text, 3), 3u);
-    EXPECT_EQ(std::string(text, 3), "abc");
-
-    Counted<FileOutStream> const writer = TempFile::GenerateTempOutFile(out, "t");
-    ASSERT_TRUE(writer);
-    EXPECT_EQ(writer->WriteBlock("abc", 3), 3u);
-    EXPECT_TRUE(writer->Close());
-    EXPECT_EQ(ReadWholeFile(out.GetData()), "abc");
+    EXPECT_TRUE(writer->WriteBlock("abc", 3) == 3 && writer->Close());
+    EXPECT_EQ(ReadWholeFile(c.GetData()), "abc");
 }
 
 TEST_F(TempFileTest, TakenNamesArePassedOverAndLeftAlone)
@@ -112,14 +100,14 @@ TEST_F(TempFileTest, TakenNamesArePassedOverAndLeftAlone)
     // Of the next names one is a file, one a link to a document, one a link that leads nowhere, one a folder.
     TempFolder elsewhere;
     WriteWholeFile(elsewhere / "document", "precious");
-    enum Maker
-    {
-        Path,
-        InOut,
-        Out
+    using Maker = bool (*)(String8&);
+    static constexpr auto write = [](auto const& stream) { return stream && stream->WriteBlock("x", 1) == 1; };
+    static constexpr Maker c_makers[] = {
+        [](String8& path) { return TempFile::GenerateTempFilePath(path, ""); },
+        [](String8& path) { return write(TempFile::GenerateTempInOutFile(path, "")); },
+        [](String8& path) { return write(TempFile::GenerateTempOutFile(path, "")); },
     };
-    for (Maker maker : {Path, InOut, Out}) {
-        SCOPED_TRACE(int(maker));
+    for (Maker const maker : c_makers) {
         String8 last;
         ASSERT_TRUE(TempFile::GenerateTempFilePath(last, ""));
         u64 const next = CounterOf(last) + 1;
@@ -132,19 +120,7 @@ TEST_F(TempFileTest, TakenNamesArePassedOverAndLeftAlone)
         std::filesystem::create_symlink(elsewhere / "document", at(1));
         std::filesystem::create_symlink(elsewhere / "nothing", at(2));
         std::filesystem::create_directory(at(3));
-        if (maker == Path) {
-            ASSERT_TRUE(TempFile::GenerateTempFilePath(last, ""));
-        }
-        if (maker == InOut) {
-            auto const stream = TempFile::GenerateTempInOutFile(last, "");
-            ASSERT_TRUE(stream);
-            stream->WriteBlock("x", 1);
-        }
-        if (maker == Out) {
-            auto const stream = TempFile::GenerateTempOutFile(last, "");
-            ASSERT_TRUE(stream);
-            stream->WriteBlock("x", 1);
-        }
+        ASSERT_TRUE(maker(last));
         EXPECT_EQ(last, S(at(4)));
         EXPECT_EQ(ReadWholeFile(at(0)), "file");
         EXPECT_EQ(ReadWholeFile(elsewhere / "document"), "precious");
@@ -215,22 +191,22 @@ TEST_F(TempFileTest, ThreadsNeverGetOneName)
 TEST_F(TempFileTest, StartEmptiesTheFoldersButKeepsMidStreamlineFiles)
 {
     WriteWholeFile(m_first / "left", Header(11, 4));
-    std::filesystem::create_directory(m_first / "folder");
+    TempFolder elsewhere;
+    WriteWholeFile(elsewhere / "document", "precious");
+    std::filesystem::create_symlink(elsewhere / "document", m_first / "link");
+    for (TempFolder const* folder : {&m_first, &m_second}) std::filesystem::create_directory(*folder / "folder");
     WriteWholeFile(m_second / "junk", "junk");
-    std::filesystem::create_directory(m_second / "folder");
     WriteWholeFile(m_second / "rescue", Header(11, 5) + "more");
     std::vector<String8> rescued = {"before"};
     TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
     EXPECT_EQ(rescued, (std::vector<String8>{"before", S(m_second / "rescue")}));
-    EXPECT_TRUE(FileSystem::Exists(S(m_second / "rescue")));
-    EXPECT_FALSE(FileSystem::Exists(S(m_second / "junk")));
-    EXPECT_FALSE(FileSystem::Exists(S(m_first / "left")));
-    EXPECT_TRUE(FileSystem::IsDirectory(S(m_first / "folder")));
-    EXPECT_TRUE(FileSystem::IsDirectory(S(m_second / "folder")));
-}
+    for (std::string const& gone : {m_first / "left", m_first / "link", m_second / "junk"})
+        EXPECT_FALSE(std::filesystem::is_symlink(gone) || std::filesystem::exists(gone)) << gone;
+    for (std::string const& kept :
+         {m_first / "folder", m_second / "folder", m_second / "rescue", elsewhere / "document"})
+        EXPECT_TRUE(std::filesystem::exists(kept)) << kept;
 
-TEST_F(TempFileTest, FileThatCannotBeAskedForItsMarkStays)
-{
+    // One that cannot be asked for its mark stays.
     struct Case
     {
         FileCall call;
@@ -238,13 +214,12 @@ TEST_F(TempFileTest, FileThatCannotBeAskedForItsMarkStays)
         bool stays;
     };
     FaultyFiles faults;
-    for (Case const& c : {Case{FileCall::Open, EMFILE, true}, Case{FileCall::Open, EACCES, true},
-                          Case{FileCall::Read, EIO, true}, Case{FileCall::Open, ENOENT, false}})
-    {
+    for (Case const& c :
+         {Case{FileCall::Open, EMFILE, true}, {FileCall::Read, EIO, true}, {FileCall::Open, ENOENT, false}}) {
         WriteWholeFile(m_second / "rescue", Header(11, 4));
         faults.Clear();
         faults.Plan({.call = c.call, .error = c.error, .path = "rescue"});
-        std::vector<String8> rescued;
+        rescued.clear();
         TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
         EXPECT_TRUE(rescued.empty());
         EXPECT_EQ(FileSystem::Exists(S(m_second / "rescue")), c.stays) << c.error;

@@ -1,10 +1,7 @@
 #include "libkernel/platform/Lock.h"
 
-#include "libkernel/platform/Random.h"
 #include "libkernel/platform/Thread.h"
-#include "libkernel/platform/Time.h"
 
-#include <cstring>
 #include <gtest/gtest.h>
 #include <thread>
 #include <vector>
@@ -37,27 +34,6 @@ TEST(RecursiveLock, CountsAreExactUnderContention)
     }
 }
 
-TEST(RecursiveLock, OthersWaitUntilTheLastRelease)
-{
-    RecursiveLock lock(0, 0);
-    auto const othersGetIt = [&] {
-        bool got = false;
-        std::thread([&] {
-            got = lock.TryAcquire();
-            if (got) lock.Release();
-        }).join();
-        return got;
-    };
-    lock.Acquire();
-    EXPECT_TRUE(lock.TryAcquire());
-    EXPECT_TRUE(lock.IsHeldByCurrentThread());
-    lock.Release();
-    EXPECT_FALSE(othersGetIt());
-    lock.Release();
-    EXPECT_FALSE(lock.IsHeldByCurrentThread());
-    EXPECT_TRUE(othersGetIt());
-}
-
 #ifndef NDEBUG
 TEST(RecursiveLockDeathTest, WrongOrdersEndTheProcess)
 {
@@ -81,61 +57,10 @@ TEST(RecursiveLockDeathTest, WrongOrdersEndTheProcess)
 }
 #endif
 
-TEST(WaitOnWord, ComesBackForAChangeAWakeOrTheTime)
+TEST(Thread, OnlyOneThatRunsIsRunnable)
 {
-    std::atomic<u32> word{5};
-    EXPECT_TRUE(WaitOnWord(word, 4, -1)) << "the word differs already";
-    EXPECT_FALSE(WaitOnWord(word, 5, 1'000'000));
-    std::thread waiter([&] {
-        while (word.load() == 5) WaitOnWord(word, 5, -1);
-    });
-    word = 6;
-    WakeWord(word, 1);
-    waiter.join();
-}
-
-TEST(Thread, DetachedThreadRunsUnderItsOwnId)
-{
-    std::atomic<u32> id{0};
-    ASSERT_TRUE(StartDetachedThread(
-        [](void* context) {
-            auto* const word = static_cast<std::atomic<u32>*>(context);
-            *word = static_cast<u32>(GetCurrentThreadId());
-            WakeWord(*word, 1);
-        },
-        &id));
-    while (id == 0) WaitOnWord(id, 0, -1);
-    EXPECT_NE(GetCurrentThreadId(), id.load());
     EXPECT_TRUE(IsThreadRunnable(GetCurrentThreadId()));
     EXPECT_FALSE(IsThreadRunnable(0));
-    EXPECT_GE(CountCpus().logical, CountCpus().cores);
-    EXPECT_GE(CountCpus().cores, 1);
-}
-
-TEST(Random, BytesDifferFromCallToCall)
-{
-    unsigned char a[32] = {};
-    unsigned char b[32] = {};
-    EXPECT_TRUE(RandomBytes(a, sizeof a));
-    EXPECT_TRUE(RandomBytes(b, sizeof b));
-    EXPECT_NE(0, std::memcmp(a, b, sizeof a));
-    EXPECT_TRUE(RandomBytes(nullptr, 0));
-}
-
-TEST(Time, CivilFieldsGoThereAndBack)
-{
-    for (i64 const seconds : {i64{0}, i64{-1}, i64{951'782'399}, i64{4'102'444'800}, i64{-62'135'596'800}}) {
-        std::tm fields = {};
-        i64 back = 7;
-        EXPECT_TRUE(ToCivilUtc(seconds, fields));
-        EXPECT_TRUE(FromCivilUtc(fields, back));
-        EXPECT_EQ(seconds, back);
-        EXPECT_TRUE(ToCivilLocal(seconds, fields));
-        EXPECT_TRUE(FromCivilLocal(fields, back));
-        EXPECT_EQ(seconds, back);
-    }
-    std::tm fields = {};
-    EXPECT_FALSE(ToCivilUtc(INT64_MAX, fields));
 }
 
 } // namespace

@@ -1,8 +1,6 @@
 #include "libkernel/platform/PlatformFile.h"
 
 #include "libkernel/platform/Errors.h"
-#include "libkernel/platform/StdioFile.h"
-#include "support/FaultyFiles.h"
 #include "support/TempFolder.h"
 
 #include <gtest/gtest.h>
@@ -106,17 +104,12 @@ TEST(PlatformFile, ShareModesRefuseWhomTheyName)
     TempFolder const folder;
     std::string const path = folder / "file";
     WriteWholeFile(path, "text");
-    struct Opener
-    {
-        char const* what;
-        OpenFlags flags;
-    };
-    Opener const openers[] = {
-        {"reads", c_read},
-        {"reads, denies", {.read = true, .share = FileShare::DenyWrite}},
-        {"writes only", {.write = true}},
-        {"reads and writes", c_readWrite},
-        {"writes, denies", {.read = true, .write = true, .share = FileShare::DenyWrite}},
+    OpenFlags const openers[] = {
+        c_read,
+        {.read = true, .share = FileShare::DenyWrite},
+        {.write = true},
+        c_readWrite,
+        {.read = true, .write = true, .share = FileShare::DenyWrite},
     };
     // Row: who holds the file. Column: who comes.
     bool const granted[5][5] = {
@@ -125,14 +118,14 @@ TEST(PlatformFile, ShareModesRefuseWhomTheyName)
     };
     for (int i = 0; i < 5; ++i) {
         for (int k = 0; k < 5; ++k) {
-            SCOPED_TRACE(std::string(openers[i].what) + " / " + openers[k].what);
-            OpenHandle const first(path, openers[i].flags);
+            SCOPED_TRACE(std::to_string(i) + " / " + std::to_string(k));
+            OpenHandle const first(path, openers[i]);
             ASSERT_EQ(0, first.error);
-            OpenHandle const second(path, openers[k].flags);
+            OpenHandle const second(path, openers[k]);
             EXPECT_EQ(granted[i][k] ? 0 : EACCES, second.error);
         }
     }
-    OpenHandle const after(path, openers[4].flags);
+    OpenHandle const after(path, openers[4]);
     EXPECT_EQ(0, after.error) << "a closed handle still denies";
 }
 
@@ -199,85 +192,15 @@ TEST(PlatformFile, CountsStopAtTheEndAndOffsetsAreChecked)
     EXPECT_EQ(EBADF, Calls().flush(c_noHandle, FlushKind::Data));
 }
 
-TEST(PlatformFile, UnlinkLeavesFoldersAloneAndAMissingOneCannotBeFlushed)
-{
-    TempFolder const folder;
-    ASSERT_EQ(0, Calls().makeFolder((folder / "sub").c_str()));
-    EXPECT_NE(0, Calls().unlink((folder / "sub").c_str()));
-    EXPECT_EQ(0, Calls().flushFolder((folder / "sub").c_str()));
-    EXPECT_EQ(ENOENT, Calls().flushFolder((folder / "none").c_str()));
-}
-
 TEST(PlatformFile, FolderOfAPathIsWhatItsNameLiesIn)
 {
-    struct Case
-    {
-        char const* path;
-        char const* folder;
-    };
-    for (Case const& c : {Case{"/a/b", "/a"},
-                          {"/a", "/"},
-                          {"a", "."},
-                          {"a/b/", "a"},
-                          {"a//b", "a"},
-                          {"/", "/"},
-                          {"", "."},
-                          {"//a", "/"}})
-    {
-        EXPECT_EQ(c.folder, GetFolderOf(c.path)) << c.path;
-    }
+    constexpr char const* c_folders[][2] = {{"/a/b", "/a"}, {"/a", "/"}, {"a", "."}, {"a/b/", "a"},
+                                            {"a//b", "a"},  {"/", "/"},  {"", "."},  {"//a", "/"}};
+    for (auto const& [path, folder] : c_folders) EXPECT_EQ(folder, GetFolderOf(path)) << path;
     EXPECT_EQ(".", GetFolderOf(nullptr));
-}
-
-class StdioTest : public testing::Test
-{
-protected:
-    std::FILE* Open(OpenFlags const& flags, char const* mode)
-    {
-        FileHandle handle = c_noHandle;
-        int error = Calls().open((m_folder / "file").c_str(), flags, handle);
-        return error ? nullptr : MakeStdioFile(handle, mode, error);
-    }
-
-    TempFolder m_folder;
-};
-
-TEST_F(StdioTest, StreamReadsWritesAndSeeksItsHandle)
-{
-    TestSupport::FaultyFiles files;
-    std::FILE* const file = Open(c_create, "w+");
-    ASSERT_TRUE(file);
-    EXPECT_EQ(10u, std::fwrite("0123456789", 1, 10, file));
-    EXPECT_EQ(0, std::fseek(file, -4, SEEK_END));
-    EXPECT_EQ("0123456789", ReadWholeFile(m_folder / "file"));
-    char text[8] = {};
-    EXPECT_EQ(4u, std::fread(text, 1, 8, file));
-    EXPECT_STREQ("6789", text);
-    EXPECT_TRUE(std::feof(file));
-    u64 size = 0;
-    EXPECT_EQ(0, Calls().getSize(GetStdioHandle(file), size));
-    EXPECT_EQ(10u, size);
-    EXPECT_EQ(0, std::fclose(file));
-    EXPECT_EQ(0, files.GetOpenHandles());
-    EXPECT_EQ(2, GetStdioHandle(stderr)) << "a stream made elsewhere has its own descriptor";
-    EXPECT_EQ(c_noHandle, GetStdioHandle(nullptr));
-}
-
-TEST_F(StdioTest, FaultShowsThroughTheStream)
-{
-    TestSupport::FaultyFiles files;
-    std::FILE* const file = Open(c_create, "w");
-    ASSERT_TRUE(file);
-    std::setvbuf(file, nullptr, _IONBF, 0);
-    files.Plan({.call = TestSupport::FileCall::Write, .error = ENOSPC, .part = TestSupport::Fault::Part::Half});
-    errno = 0;
-    EXPECT_EQ(5u, std::fwrite("0123456789", 1, 10, file));
-    EXPECT_EQ(ENOSPC, errno);
-    EXPECT_TRUE(std::ferror(file));
-    files.Plan({.call = TestSupport::FileCall::Close, .error = EIO});
-    EXPECT_EQ(EOF, std::fclose(file));
-    EXPECT_EQ(0, files.GetOpenHandles()) << "a failed close must not leak the handle";
-    EXPECT_EQ("01234", ReadWholeFile(m_folder / "file"));
+    TempFolder const folder;
+    EXPECT_NE(0, Calls().unlink(folder.GetPath().c_str())) << "folders are left alone";
+    EXPECT_EQ(ENOENT, Calls().flushFolder((folder / "none").c_str()));
 }
 
 } // namespace

@@ -128,6 +128,10 @@ TEST_F(FileTest, PositionsSizesAndOwnership)
     EXPECT_EQ(file.GetPosition(), 5);
     EXPECT_TRUE(file.SetPosition(-1, File::Offset::End));
     EXPECT_EQ(file.GetPosition(), 9);
+    char text[8] = {};
+    EXPECT_EQ(std::fread(text, 1, 8, file), 1u);
+    EXPECT_EQ(text[0], '9');
+    EXPECT_TRUE(std::feof(file));
     EXPECT_TRUE(file.SetPosition(4, static_cast<File::Offset>(7)));
     EXPECT_EQ(file.GetPosition(), 4);
     EXPECT_TRUE(file.ForceFlush());
@@ -151,6 +155,8 @@ TEST_F(FileTest, AFailedWriteShowsWhenTheStreamIsFlushedOrClosed)
         EXPECT_EQ(std::fwrite("x", 1, 1, file), 1u);
         faults.Plan({.call = FileCall::Write, .forEver = true, .error = ENOSPC});
         EXPECT_FALSE(closing ? file.Close() : file.Flush());
+        faults.Clear();
+        faults.Plan({.call = FileCall::Close, .error = EIO});
         file.Close();
         faults.Clear();
     }
