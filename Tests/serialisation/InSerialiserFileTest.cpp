@@ -40,48 +40,42 @@ TEST(InSerialiserFileTest, EmptyFileOfEveryFormatVersionParses)
         EXPECT_EQ(file->GetFileIDTag(), IDTag("Test"));
         EXPECT_EQ(file->GetFileVersion(), 3);
         EXPECT_EQ(file->GetBuildIndex(), version < 2 ? 0u : 24u);
-        EXPECT_TRUE(file->GetFilePath().IsEmpty());
-        EXPECT_FALSE(file->FoundMissingFiles());
     }
 }
 
-TEST(InSerialiserFileTest, LaterFormatVersionIsToldByException)
+TEST(InSerialiserFileTest, WhatTheReaderIsTooOldForIsToldByException)
 {
-    PropertyBytes b;
-    b.Header(3).End();
-    for (bool checks : {true, false}) {
-        TraceCapture trace;
-        try {
-            Parse(b.bytes, checks);
-            FAIL();
-        } catch (FutureVersionException const& e) {
-            EXPECT_FALSE(e.WasRefused());
+    auto const start = [] { return PropertyBytes().Header(); };
+    PropertyBytes const wrongElement = BeginRoot().Item(0xB1, "Kids").U32(1).Object(1).RootClass("RdSh");
+    struct
+    {
+        PropertyBytes bytes;
+        char const* trace;
+        bool wasRefused, isUnknownClass;
+    } const cases[] = {
+        {PropertyBytes().Header(3).End(), ">>> Future file version: 3 (2 max)\n", false, false},
+        {start().Item(0x78, "Numb").End(), ">>> Use of unknown prop type: 120\n", false, false},
+        {start().Item(0x7F, "Numb").End(), ">>> Use of unknown prop type: 127\n", false, false},
+        {start().Item(0xF8, "Numb").End(), ">>> Use of unknown prop type: 120\n", false, false},
+        {BeginRoot().U32Item("Refu", 1).End().End(), ">>> Failed to load object: RdNo\n", true, false},
+        {PropertyBytes(wrongElement).U32Item("Numb", 1).End().End().End(), ">>> Failed to load object: RdNo\n", true,
+         false},
+        {start().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").End().End(), ">>> Unknown class: Xxxx\n", false, true},
+    };
+    for (auto const& c : cases) {
+        for (bool checks : {true, false}) {
+            if (c.isUnknownClass && !checks) continue;
+            TraceCapture trace;
+            try {
+                Parse(c.bytes.bytes, checks);
+                ADD_FAILURE() << c.trace;
+            } catch (FutureVersionException const& e) {
+                EXPECT_EQ(e.WasRefused(), c.wasRefused);
+                auto const* const unknown = dynamic_cast<UnknownClassUIDException const*>(&e);
+                EXPECT_EQ(unknown && unknown->GetClassUID() == ClassUID("Xxxx"), c.isUnknownClass);
+            }
+            EXPECT_EQ(trace.GetText(), c.trace);
         }
-        EXPECT_EQ(trace.GetText(), ">>> Future file version: 3 (2 max)\n");
-    }
-}
-
-TEST(InSerialiserFileTest, UnknownPropertyTypeIsToldByException)
-{
-    for (u8 type : {u8(0x78), u8(0x7F), u8(0xF8)}) {
-        PropertyBytes b;
-        b.Header().Item(type, "Numb").End();
-        TraceCapture trace;
-        EXPECT_THROW(Parse(b.bytes), FutureVersionException);
-        EXPECT_EQ(trace.GetText(), ">>> Use of unknown prop type: " + std::to_string(type & 0x7F) + "\n");
-    }
-}
-
-TEST(InSerialiserFileTest, OtherFormatsAndCutHeadersGiveNull)
-{
-    PropertyBytes b;
-    b.Header().End();
-    std::vector<u8> wrong = b.bytes;
-    wrong[3] = 'L';
-    EXPECT_FALSE(Parse(wrong));
-    for (size_t size = 0; size < b.bytes.size(); ++size) {
-        for (Delivery delivery : c_deliveries)
-            EXPECT_FALSE(Parse({b.bytes.begin(), b.bytes.begin() + static_cast<i64>(size)}, true, delivery)) << size;
     }
 }
 
@@ -89,37 +83,28 @@ TEST(InSerialiserFileTest, OtherFormatsAndCutHeadersGiveNull)
 
 TEST(InSerialiserFileTest, StreamIsLeftJustBehindTheList)
 {
-    PropertyBytes const list = EveryItemForm();
-    PropertyBytes b;
-    b.Text("before").Append(list).Text("behind the list");
-    for (Delivery delivery : c_deliveries) {
-        Counted<InStream> const in = Deliver(b.bytes, delivery);
-        char before[6];
-        ASSERT_EQ(in->ReadBlock(before, 6), 6u);
-        ASSERT_TRUE(InSerialiserFile::ParseWithChecks(*in));
-        EXPECT_EQ(GetTaken(*in), 6 + list.bytes.size());
-        char behind[16] = {};
-        EXPECT_EQ(in->ReadBlock(behind, 15), 15u);
-        EXPECT_STREQ(behind, "behind the list");
-    }
-}
-
-TEST(InSerialiserFileTest, SkippingAndLookingLeaveTheStreamJustBehindTheListToo)
-{
-    PropertyBytes b;
-    b.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").Append(EveryValueForm()).Item(0x2D, "Last").U32(1).U8(5);
-    b.End().End();
-    size_t const size = b.bytes.size();
-    b.Text("behind");
-    for (Delivery delivery : c_deliveries) {
-        Counted<InStream> const skipped = Deliver(b.bytes, delivery);
-        ASSERT_TRUE(InSerialiserFile::ParseSkipUnknownClasses(*skipped));
-        EXPECT_EQ(GetTaken(*skipped), size);
-        Counted<InStream> const looked = Deliver(b.bytes, delivery);
-        PropertyStreamReport const report = CheckPropertyStream(*looked);
-        ASSERT_TRUE(report.IsGood()) << report.reason.GetData();
-        EXPECT_EQ(report.offset, size);
-        EXPECT_EQ(GetTaken(*looked), size);
+    PropertyBytes list;
+    list.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").Append(EveryValueForm()).Item(0x2D, "Last");
+    list.U32(1).U8(5).End().End();
+    PropertyBytes const known = EveryItemForm();
+    for (PropertyBytes const& b : {known, list}) {
+        u64 const end = 6 + b.bytes.size();
+        PropertyBytes const all = PropertyBytes().Text("before").Append(b).Text("behind");
+        for (Delivery delivery : c_deliveries) {
+            for (int way : {0, 1, 2}) {
+                if (way == 0 && b.bytes.size() != known.bytes.size()) continue; // Its class is unknown.
+                Counted<InStream> const in = Deliver(all.bytes, delivery);
+                char text[7] = {};
+                ASSERT_EQ(in->ReadBlock(text, 6), 6u);
+                bool const parsed = way == 0   ? bool(InSerialiserFile::ParseWithChecks(*in))
+                                    : way == 1 ? bool(InSerialiserFile::ParseSkipUnknownClasses(*in))
+                                               : CheckPropertyStream(*in).offset == b.bytes.size();
+                EXPECT_TRUE(parsed);
+                EXPECT_EQ(GetTaken(*in), end);
+                EXPECT_EQ(in->ReadBlock(text, 6), 6u);
+                EXPECT_STREQ(text, "behind");
+            }
+        }
     }
 }
 
@@ -141,52 +126,6 @@ TEST(InSerialiserFileTest, SmallPropertiesNeedFewReads)
 
 // Objects.
 
-TEST(InSerialiserFileTest, ObjectThatHoldsItselfLoads)
-{
-    int const before = ReaderNode::s_alive;
-    PropertyBytes b = BeginRoot();
-    b.Item(0x31, "Chld").BackReference(0).Item(0x31, "Refr").BackReference(0).End().End();
-    {
-        Counted<InSerialiserFile> const file = Parse(b.bytes);
-        ASSERT_TRUE(file);
-        Counted<ReaderNode> const root = LoadRoot(*file);
-        ASSERT_TRUE(root);
-        EXPECT_EQ(root->child, root);
-        EXPECT_TRUE(root->sawUnloaded);
-        root->Drop();
-    }
-    EXPECT_EQ(ReaderNode::s_alive, before);
-}
-
-TEST(InSerialiserFileTest, LoadThatRefusesEndsTheParse)
-{
-    PropertyBytes b = BeginRoot();
-    b.U32Item("Refu", 1).End().End();
-    for (bool checks : {true, false}) {
-        TraceCapture trace;
-        try {
-            Parse(b.bytes, checks);
-            FAIL();
-        } catch (UnknownClassUIDException const&) {
-            FAIL();
-        } catch (FutureVersionException const& e) {
-            EXPECT_TRUE(e.WasRefused());
-        }
-        EXPECT_EQ(trace.GetText(), ">>> Failed to load object: RdNo\n");
-    }
-}
-
-TEST(InSerialiserFileTest, ArrayElementOfAnotherClassIsRefused)
-{
-    PropertyBytes b = BeginRoot();
-    b.Item(0xB1, "Kids").U32(1).Object(1).RootClass("RdLg").End().End().End();
-    Counted<InSerialiserFile> const file = Parse(b.bytes);
-    ASSERT_TRUE(file); // RdLg is a RdNo.
-    PropertyBytes shared = BeginRoot();
-    shared.Item(0xB1, "Kids").U32(1).Object(1).RootClass("RdSh").U32Item("Numb", 1).End().End().End();
-    EXPECT_THROW(Parse(shared.bytes), FutureVersionException);
-}
-
 TEST(InSerialiserFileTest, ClassThatMakesNoObjectGivesNull)
 {
     constexpr char c_classes[][5] = {"RdAb", "RdNu"};
@@ -196,40 +135,6 @@ TEST(InSerialiserFileTest, ClassThatMakesNoObjectGivesNull)
         EXPECT_FALSE(Parse(b.bytes)) << uid;
         EXPECT_FALSE(Parse(b.bytes, false)) << uid;
     }
-}
-
-TEST(InSerialiserFileTest, EqualSharedObjectsBecomeOne)
-{
-    PropertyBytes b;
-    b.Header().Item(0xB1, "Shrs").U32(3).Object(0).RootClass("RdSh").U32Item("Numb", 4001).End();
-    b.Object(1).KnownClass("RdSh").U32Item("Numb", 4001).End().Object(2).KnownClass("RdSh").U32Item("Numb", 4002);
-    b.End().End();
-    Counted<InSerialiserFile> const first = Parse(b.bytes);
-    Counted<InSerialiserFile> const second = Parse(b.bytes);
-    std::vector<Consolidated<ReaderShared>> a;
-    std::vector<Consolidated<ReaderShared>> again;
-    ASSERT_TRUE(first && first->LoadSharedObjects("Shrs", a));
-    ASSERT_TRUE(second && second->LoadSharedObjects("Shrs", again));
-    EXPECT_TRUE(a[0] == a[1]);
-    EXPECT_FALSE(a[0] == a[2]);
-    EXPECT_TRUE(a[2] == again[2]);
-    EXPECT_TRUE(a[0]->IsConsolidated());
-}
-
-TEST(InSerialiserFileTest, IndicesMayComeInAnyOrder)
-{
-    PropertyBytes b;
-    b.Header().Item(0xB1, "Arry").U32(4);
-    b.Object(0xFFFFFFFF).RootClass("RdNo").U32Item("Numb", 1).End();
-    b.Object(7).KnownClass("RdNo").U32Item("Numb", 2).End();
-    b.BackReference(0xFFFFFFFF).BackReference(7).End();
-    Counted<InSerialiserFile> const file = Parse(b.bytes);
-    ASSERT_TRUE(file);
-    std::vector<Counted<ReaderNode>> nodes;
-    ASSERT_TRUE(file->LoadObjects("Arry", nodes));
-    EXPECT_EQ(nodes[0], nodes[2]);
-    EXPECT_EQ(nodes[1], nodes[3]);
-    EXPECT_EQ(nodes[3]->number, 2u);
 }
 
 TEST(InSerialiserFileTest, ListKeptBeyondItsLoadIsEmpty)
@@ -253,7 +158,6 @@ TEST(InSerialiserFileTest, ListKeptBeyondItsLoadIsEmpty)
     Counted<InSerialiserFile> const file = Parse(b.bytes);
     std::vector<Counted<ReaderNode>> nodes;
     ASSERT_TRUE(file && file->LoadObjects("Arry", nodes));
-    EXPECT_EQ(nodes[1]->name, "two");
     EXPECT_FALSE(s_kept->HasPropertyOrDefault("Name"));
     s_kept.Reset();
 }
@@ -402,29 +306,14 @@ TEST(InSerialiserFileTest, UnknownClassBecomesNullInATolerantParse)
     }
 }
 
-TEST(InSerialiserFileTest, UnknownClassIsToldByAParseWithChecks)
-{
-    try {
-        PropertyBytes b;
-        b.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").End().End();
-        Parse(b.bytes);
-        FAIL();
-    } catch (FutureVersionException const& e) {
-        EXPECT_FALSE(e.WasRefused());
-        auto const* const unknown = dynamic_cast<UnknownClassUIDException const*>(&e);
-        ASSERT_TRUE(unknown);
-        EXPECT_EQ(unknown->GetClassUID(), ClassUID("Xxxx"));
-    }
-}
-
 TEST(InSerialiserFileTest, ReferenceToASkippedObjectGivesNull)
 {
-    PropertyBytes b;
-    b.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx").End().Item(0x31, "Refr").BackReference(0).End();
-    EXPECT_FALSE(Parse(b.bytes, false));
-    PropertyBytes inside;
-    inside.Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx");
+    PropertyBytes const start = PropertyBytes().Header().Item(0x31, "Unkn").Object(0).RootClass("Xxxx");
+    PropertyBytes itself = start;
+    PropertyBytes inside = start;
+    itself.End().Item(0x31, "Refr").BackReference(0).End();
     inside.Item(0x31, "Chld").Object(1).RootClass("RdNo").End().End().Item(0x31, "Refr").BackReference(1).End();
+    EXPECT_FALSE(Parse(itself.bytes, false));
     EXPECT_FALSE(Parse(inside.bytes, false));
 }
 

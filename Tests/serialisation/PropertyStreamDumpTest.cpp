@@ -71,8 +71,8 @@ TEST(PropertyStreamDumpTest, EveryFormShowsAsItsKind)
             {"DlyN", R"({"tag":"DlyN","type":51,"value":null})"},
             {"NulO", R"({"tag":"NulO","type":49,"value":null})"},
             {"NulA", R"({"tag":"NulA","type":49,"array":true,"value":[null,null,null,null]})"},
-            {"Shrs", R"({"tag":"Shrs","type":49,"array":true,"value":[{"ref":4},{"ref":1}]})"},
-            {"Shar", R"({"tag":"Shar","type":49,"object":4,"classes":[{"uid":"RdSh"}],"properties":[)"
+            {"Shrs", R"({"tag":"Shrs","type":49,"array":true,"value":[{"ref":4294967295},{"ref":1}]})"},
+            {"Shar", R"({"tag":"Shar","type":49,"object":4294967295,"classes":[{"uid":"RdSh"}],"properties":[)"
                      R"({"tag":"Numb","type":3,"value":6},{"tag":"Next","type":49,"ref":1}]})"},
         };
         for (auto const& c : cases) EXPECT_EQ(items.at(c.tag).dump(), c.json);
@@ -100,14 +100,8 @@ TEST(PropertyStreamDumpTest, CodesAndTextsAreAlwaysValidJson)
     EXPECT_EQ(items.at("Text")["value"], "a\xEF\xBF\xBD\xEF\xBF\xBD");
     EXPECT_EQ(items.at("Path").dump(), R"({"tag":"Path","type":51,"class":"Type","path":"a/b"})");
     EXPECT_EQ(items.at("NoNu").dump(), R"({"tag":"NoNu","type":9,"value":null})");
+    EXPECT_EQ(Dump(PropertyBytes().Header(1).End())["buildIndex"], 0);
     EXPECT_TRUE(items.contains(std::string("\xC2\x80\0\0\1", 5)));
-}
-
-TEST(PropertyStreamDumpTest, FormatVersion1ShowsBuildIndex0)
-{
-    PropertyBytes b;
-    b.Header(1).End();
-    EXPECT_EQ(Dump(b)["buildIndex"], 0);
 }
 
 TEST(PropertyStreamDumpTest, ReportNamesTheFirstWrongByte)

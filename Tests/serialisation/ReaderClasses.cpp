@@ -199,9 +199,15 @@ PropertyBytes EveryItemForm(bool everySize)
     b.Item(0xB1, "Kids").U32(3).U8(0).Object(3).KnownClass("RdNo").End().BackReference(2).End();
     b.Item(0x31, "NulO").U8(0);
     b.Item(0xB1, "NulA").U32(4).Raw({0, 0, 0, 0});
-    b.Item(0x31, "Shar").Object(4).KnownClass("RdSh").U32Item("Numb", 6).Item(0x31, "Next").BackReference(1).End();
-    b.Item(0xB1, "Shrs").U32(2).BackReference(4).BackReference(1);
-    b.Item(0x31, "Lgcy").Object(5).RootClass("RdLg").U32Item("Numb", 77).End();
+    b.Item(0x31, "Shar")
+        .Object(0xFFFFFFFF)
+        .KnownClass("RdSh")
+        .U32Item("Numb", 6)
+        .Item(0x31, "Next")
+        .BackReference(1)
+        .End();
+    b.Item(0xB1, "Shrs").U32(2).BackReference(0xFFFFFFFF).BackReference(1);
+    b.Item(0x31, "Lgcy").Object(7).RootClass("RdLg").U32Item("Numb", 77).End();
     return b.End();
 }
 
