@@ -12,11 +12,9 @@ public:
     ~AllocationWatch();
     AllocationWatch(AllocationWatch const&) = delete;
 
-    /// False where another allocator is in charge, as under a sanitiser.
-    static bool IsAvailable();
-    /// The most bytes that were in use at once, beyond those at the start.
+    /// The most bytes that were in use at once, beyond those at the start; 0 under a sanitiser, which has the heap to
+    /// itself.
     static u64 GetPeak();
-    static u64 GetCount();
 };
 
 } // namespace Kernel::Test

@@ -3,7 +3,6 @@
 #include "libkernel/core/Limits.h"
 #include "libkernel/serialisation/InSerialiser.h"
 #include "libkernel/serialisation/SerialiseTo.h"
-#include "libkernel/streams/FileInStream.h"
 #include "serialisation/ReaderClasses.h"
 #include "support/TempFolder.h"
 
@@ -14,48 +13,6 @@ namespace Kernel::Test {
 namespace {
 
 constexpr IDTag c_kind("Test");
-
-Counted<ReaderNode> MakeTree(u32 depth, u32& count)
-{
-    Counted<ReaderNode> node(new ReaderNode);
-    node->number = count++;
-    std::string const name = "node " + std::to_string(node->number);
-    node->name = String8(name.c_str());
-    for (u32 i = 0; depth > 0 && i < 3; ++i) node->kids.push_back(MakeTree(depth - 1, count));
-    if (!node->kids.empty()) node->reference = node->kids[0];
-    Counted<ReaderShared> shared(new ReaderShared);
-    shared->number = node->number % 5;
-    node->shared = Consolidate(Counted<SharedSerialisable>(shared));
-    return node;
-}
-
-bool AreEqual(ReaderNode const& a, ReaderNode const& b)
-{
-    if (a.number != b.number || !(a.name == b.name) || !(a.shared == b.shared) || a.kids.size() != b.kids.size())
-        return false;
-    if (!a.kids.empty() && b.reference.Get() != b.kids[0].Get()) return false;
-    for (size_t i = 0; i < a.kids.size(); ++i)
-        if (!AreEqual(*a.kids[i], *b.kids[i])) return false;
-    return true;
-}
-
-TEST(SerialiseFromTest, GraphComesBackFromAFilePlainAndCompressed)
-{
-    TestSupport::TempFolder const folder;
-    u32 count = 0;
-    Counted<ReaderNode> const root = MakeTree(6, count);
-    for (int level : {0, 6}) {
-        std::string const path = folder / (level ? "packed" : "plain");
-        ASSERT_TRUE(SerialiseToFile(
-            path.c_str(), c_kind, 4, [&](OutSerialiser& out, IDTag tag) { out.SaveObject(tag, root); }, level));
-        Counted<ReaderNode> loaded;
-        auto const load = [&](InSerialiser& in, IDTag tag) { return in.LoadObject(tag, loaded) && loaded; };
-        EXPECT_TRUE(SerialiseFromFile(path.c_str(), c_kind, 4, load, level != 0));
-        ASSERT_TRUE(loaded);
-        EXPECT_TRUE(AreEqual(*root, *loaded));
-        EXPECT_FALSE(SerialiseFromFile(path.c_str(), c_kind, 4, load, level == 0));
-    }
-}
 
 TEST(SerialiseFromTest, KindAndVersionAreChecked)
 {
@@ -94,21 +51,6 @@ TEST(SerialiseFromTest, WhateverIsThrownGivesFalse)
                                      [](InSerialiser&, IDTag) { return false; }));
     EXPECT_FALSE(SerialiseFromFile("/nowhere/at/all", c_kind, 9, yes, false));
     EXPECT_FALSE(SerialiseFromFile(nullptr, c_kind, 9, yes, false));
-}
-
-TEST(SerialiseFromTest, FileStreamLabelsTheResult)
-{
-    TestSupport::TempFolder const folder;
-    std::string const path = folder / "file";
-    PropertyBytes b;
-    b.Header().End();
-    TestSupport::WriteWholeFile(path, std::string(b.bytes.begin(), b.bytes.end()));
-    String8 seen;
-    EXPECT_TRUE(SerialiseFromStream(FileInStream::Open(path.c_str()), c_kind, 9, [&](InSerialiser& in, IDTag) {
-        seen = in.GetFilePath();
-        return true;
-    }));
-    EXPECT_EQ(seen.GetView(), path);
 }
 
 TEST(SerialiseFromTest, DeepestGraphThatCanBeSavedCanBeRead)

@@ -1,5 +1,8 @@
 #include "libkernel/serialisation/SerialiseTo.h"
 
+#include "libkernel/serialisation/InSerialiser.h"
+#include "libkernel/serialisation/SerialiseFrom.h"
+#include "libkernel/streams/FileInStream.h"
 #include "serialisation/WriterTestSupport.h"
 #include "support/TempFolder.h"
 
@@ -62,25 +65,36 @@ protected:
     TestSupport::TempFolder m_folder;
 };
 
-TEST_F(SerialiseToFileTest, ReplacesTheFileWhole)
+TEST_F(SerialiseToFileTest, ReplacesTheFileWholePlainOrCompressed)
 {
     TestSupport::WriteWholeFile(Path(), std::string(1000, 'x'));
-    ASSERT_TRUE(SerialiseToFile(Path().c_str(), "Sett", 9, SaveOne, 0));
-    EXPECT_EQ(Show(TestSupport::ReadWholeFile(Path())), Show(OneFile()));
-    EXPECT_EQ(CountFiles(), 1);
-}
+    for (int const level : {0, 6}) {
+        ASSERT_TRUE(SerialiseToFile(Path().c_str(), "Sett", 9, SaveOne, level));
+        EXPECT_EQ(CountFiles(), 1);
+        std::string bytes = TestSupport::ReadWholeFile(Path());
+        if (level) {
+            std::string const packed = bytes;
+            uLongf size = 1000;
+            bytes.resize(size);
+            ASSERT_EQ(uncompress(reinterpret_cast<Bytef*>(bytes.data()), &size,
+                                 reinterpret_cast<Bytef const*>(packed.data()), packed.size()),
+                      Z_OK);
+            bytes.resize(size);
+        }
+        EXPECT_EQ(Show(bytes), Show(OneFile()));
 
-TEST_F(SerialiseToFileTest, CompressesAtALevel)
-{
-    ASSERT_TRUE(SerialiseToFile(Path().c_str(), "Sett", 9, SaveOne, 6));
-    std::string const packed = TestSupport::ReadWholeFile(Path());
-    std::string unpacked(1000, '\0');
-    uLongf size = unpacked.size();
-    ASSERT_EQ(uncompress(reinterpret_cast<Bytef*>(unpacked.data()), &size,
-                         reinterpret_cast<Bytef const*>(packed.data()), packed.size()),
-              Z_OK);
-    EXPECT_EQ(Show(unpacked.substr(0, size)), Show(OneFile()));
-    EXPECT_EQ(CountFiles(), 1);
+        String8 seen;
+        auto const load = [&](InSerialiser& in, IDTag tag) {
+            u8 value = 0;
+            seen = in.GetFilePath();
+            return in.LoadType(tag, value) && value == 7;
+        };
+        EXPECT_TRUE(SerialiseFromFile(Path().c_str(), "Sett", 9, load, level != 0));
+        EXPECT_FALSE(SerialiseFromFile(Path().c_str(), "Sett", 9, load, level == 0));
+        if (level) continue;
+        EXPECT_TRUE(SerialiseFromStream(FileInStream::Open(Path().c_str()), "Sett", 9, load));
+        EXPECT_EQ(seen.GetView(), Path());
+    }
 }
 
 TEST_F(SerialiseToFileTest, FailureLeavesTheOldFileAndNoTemporary)

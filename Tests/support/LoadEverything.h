@@ -35,43 +35,6 @@ u64 LoadNumbers(InSerialiser const& in, IDTag tag)
     return (u64(0) + ... + LoadNumber<T>(in, tag));
 }
 
-inline u64 LoadDataStream(InSerialiserPropertyDataStream& stream)
-{
-    u64 loads = 0;
-    while (stream.GetCurrentPropType() != PropType::EndOfList) {
-        u8 buffer[256];
-        u64 count = 0;
-        u64 value = 0;
-        double real = 0;
-        bool flag = false;
-        String8 text;
-        std::vector<String16> texts;
-        std::vector<bool> flags;
-        std::vector<u32> numbers;
-        RawDataBlock raw;
-        EnumSerialiser none;
-        int number = 0;
-        std::vector<int> enums;
-        PropType const type = stream.GetCurrentPropType();
-        u32 const size = c_propSizes[static_cast<u8>(type)];
-        try {
-            bool const loaded = stream.LoadValue(flag) || stream.LoadValues(flags) || stream.LoadValue(text) ||
-                                stream.LoadValues(texts) || stream.LoadValue(value) || stream.LoadValue(real) ||
-                                stream.LoadValues(numbers) || stream.LoadValueRaw(raw) ||
-                                stream.LoadValueI(type, buffer, size) || stream.LoadValueArrayI(type, size, count) ||
-                                (stream.GetStructByteSize() <= sizeof(buffer) &&
-                                 stream.LoadValueCustomI(buffer, stream.GetStructByteSize())) ||
-                                stream.LoadValueCustomArrayI(stream.GetStructByteSize(), count) ||
-                                stream.LoadEnumI(none, number) || stream.LoadEnumI(none, enums);
-            if (!loaded) return loads;
-        } catch (UnknownEnumVersionException const&) {
-            return loads;
-        }
-        ++loads;
-    }
-    return loads;
-}
-
 inline u64 LoadOne(InSerialiser const& in, IDTag tag)
 {
     u64 loads = LoadNumbers<u8, u16, u32, u64, i8, i16, i32, i64, float, double, IDTag, ClassUID>(in, tag);
@@ -92,7 +55,7 @@ inline u64 LoadOne(InSerialiser const& in, IDTag tag)
     Counted<FragmentedRawData> fragmented;
     InSerialiserPropertyDataStream stream;
     loads += u64(in.LoadRawData(tag, raw)) + in.LoadRawData(tag, raw, true) + in.LoadFragmentedRawData(tag, fragmented);
-    if (in.LoadDataStream(tag, stream)) loads += 1 + LoadDataStream(stream);
+    loads += in.LoadDataStream(tag, stream);
     EnumSerialiser const noEnums;
     FlagSerialiser const noFlags;
     int number = 0;
