@@ -1,29 +1,19 @@
 #include "libkernel/archive/ArchiveExceptions.h"
 #include "libkernel/filestore/FileStoreItemType.h"
 #include "libkernel/filestore/FileStorePostSaveInterface.h"
-#include "libkernel/filesystem/TempFile.h"
 #include "support/ArchiveFixture.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
 
-#include <atomic>
-#include <filesystem>
 #include <gtest/gtest.h>
 #include <set>
 #include <stdexcept>
-#include <thread>
 
 namespace KernelTest {
 namespace {
 
 using namespace Kernel;
 
-class ArchiveAftermathTest : public testing::Test
-{
-protected:
-    TestSupport::TempFolder m_folder;
-    std::string const m_path = m_folder / "doc";
-};
+using ArchiveAftermathTest = DocumentTest;
 
 class FailingPostSave : public FileStorePostSaveInterface
 {
@@ -36,27 +26,24 @@ private:
 
 TEST_F(ArchiveAftermathTest, FailureOfAPostSaveObjectLeavesTheArchiveAtTheNewState)
 {
-    Counted<Archive> archive = CreateDocument(m_path);
-    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
-    Archive::CreateResult result;
-    ASSERT_TRUE(archive->AddScratchFile(Str(m_folder / "scratch"), result));
-    ASSERT_TRUE(Save(*archive, {{"a", "2"}, {"b", "2"}}, true));
+    m_archive = CreateDocument(m_path);
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
+    AddScratch();
+    ASSERT_TRUE(Save(*m_archive, {{"a", "2"}, {"b", "2"}}, true));
 
     ArchiveSessionHandle handle;
-    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
     handle->CreateFile(Str("c"), MakeCounted<BytesItem>("3"));
     handle->AddPostSaveObject(MakeCounted<FailingPostSave>());
-    EXPECT_THROW(archive->CloseSession(handle, false), std::runtime_error);
+    EXPECT_THROW(m_archive->CloseSession(handle, false), std::runtime_error);
 
-    EXPECT_FALSE(archive->HaveScratchRevisions());
-    ASSERT_TRUE(Save(*archive, {{"d", std::string(1000, 'd')}}, true));
+    EXPECT_FALSE(m_archive->HaveScratchRevisions());
+    ASSERT_TRUE(Save(*m_archive, {{"d", std::string(1000, 'd')}}, true));
     std::map<std::string, std::string> const expected = {
         {"a", "2"}, {"b", "2"}, {"c", "3"}, {"d", std::string(1000, 'd')}};
-    EXPECT_EQ(GetAll(*archive), expected);
-    archive = nullptr;
-    archive = OpenDocument(m_folder / "scratch");
-    ASSERT_TRUE(archive);
-    EXPECT_EQ(GetAll(*archive), expected);
+    EXPECT_EQ(GetAll(*m_archive), expected);
+    Reopen(m_scratchPath);
+    EXPECT_EQ(GetAll(*m_archive), expected);
 }
 
 TEST_F(ArchiveAftermathTest, EnumerationSessionNamesWhatItemsNameAndWritesNothing)
@@ -71,23 +58,22 @@ TEST_F(ArchiveAftermathTest, EnumerationSessionNamesWhatItemsNameAndWritesNothin
             return &s_type;
         }
     };
-    Counted<Archive> const archive = CreateDocument(m_path);
+    m_archive = CreateDocument(m_path);
     std::string const before = ReadWhole(m_path);
     auto const root = MakeCounted<Folder>();
     root->onSave = [](FileStoreOut& out) { out.CreateFile(Str("root/part"), MakeCounted<BytesItem>("1")); };
     ArchiveSessionHandle handle;
-    ASSERT_TRUE(archive->CreateFileEnumerationSession(handle, nullptr));
+    ASSERT_TRUE(m_archive->CreateFileEnumerationSession(handle, nullptr));
     handle->SetEnumerateUsedFiles(true);
     handle->CreateFile(Str("root"), root);
     EXPECT_EQ(handle->GetEnumeratedPaths(), (std::set<String8>{Str("root"), Str("root/part")}));
-    archive->CloseSession(handle, false);
+    m_archive->CloseSession(handle, false);
     EXPECT_EQ(ReadWhole(m_path), before);
 }
 
 TEST_F(ArchiveAftermathTest, GuardWhoseStepOnlySeemedToFailIsStillOurs)
 {
-    Counted<Archive> const archive = CreateDocument(m_path);
-    ArchiveSessionHandle handle;
+    m_archive = CreateDocument(m_path);
     {
         // All bytes that matter arrive, each time.
         TestSupport::FaultyFiles files;
@@ -95,46 +81,41 @@ TEST_F(ArchiveAftermathTest, GuardWhoseStepOnlySeemedToFailIsStillOurs)
                     .forEver = true,
                     .error = EIO,
                     .part = TestSupport::Fault::Part::AllButOne});
-        EXPECT_EQ(archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
-                  Archive::SessionFileUnusable);
+        EXPECT_EQ(SessionResult(*m_archive), Archive::SessionFileUnusable);
     }
-    EXPECT_EQ(archive->GetLastRestoreResult(), Archive::RestoreGuardUnwritable);
-    ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+    EXPECT_EQ(m_archive->GetLastRestoreResult(), Archive::RestoreGuardUnwritable);
+    ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
     // A step that is not ours is still seen.
     WriteWhole(m_path, ReadWhole(m_path).replace(68, 1, "\x7F"));
-    EXPECT_EQ(archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
-              Archive::SessionFileUnusable);
-    EXPECT_EQ(archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
+    EXPECT_EQ(SessionResult(*m_archive), Archive::SessionFileUnusable);
+    EXPECT_EQ(m_archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
 }
 
 TEST_F(ArchiveAftermathTest, FileThatHasMovedIsUsedWhereItIsThoughItsFolderCannotBeFlushed)
 {
-    TempFile::SetTempPath(Str(m_folder.GetPath()));
     std::string const path = m_folder / "to";
     ASSERT_TRUE(Save(*CreateDocument(m_path), {{"a", "1"}}));
     TestSupport::FaultyFiles files;
     TestSupport::Fault const fault{.call = TestSupport::FileCall::FlushFolder, .forEver = true, .error = EIO};
     files.Plan(fault);
     Archive::OpenResult opened{};
-    Counted<Archive> archive = Archive::OpenMigrate(Str(m_path), Str(path), c_documentTag, opened);
-    ASSERT_TRUE(archive);
-    Archive::CreateResult result;
-    ASSERT_TRUE(archive->AddScratchFile(Str(m_folder / "scratch"), result));
-    EXPECT_EQ(archive->MigratePrepare(Str(m_folder / "moved")), Archive::MigrateDone);
-    EXPECT_EQ(archive->MigrateRestore(Str(m_folder / "moved")), Archive::OpenOk);
-    EXPECT_EQ(Get(*archive, "a"), "1");
-    archive = nullptr;
+    m_archive = Archive::OpenMigrate(Str(m_path), Str(path), c_documentTag, opened);
+    ASSERT_TRUE(m_archive);
+    AddScratch();
+    EXPECT_EQ(m_archive->MigratePrepare(Str(m_folder / "moved")), Archive::MigrateDone);
+    EXPECT_EQ(m_archive->MigrateRestore(Str(m_folder / "moved")), Archive::OpenOk);
+    EXPECT_EQ(Get(*m_archive, "a"), "1");
+    m_archive = nullptr;
     // A save that may not last is no success, but stays where it is.
-    archive = Archive::CreateWithAdjacentTemporary(Str(path), c_documentTag, result, {});
-    ASSERT_TRUE(archive);
-    EXPECT_THROW(Save(*archive, {{"a", "new"}}), ArchiveFileException);
-    EXPECT_EQ(Get(*archive, "a"), "new");
-    archive = nullptr;
-    archive = OpenDocument(path);
-    EXPECT_EQ(archive->CaptureToThrowaway(), Archive::CaptureDone);
-    EXPECT_EQ(Get(*archive, "a"), "new");
-    archive = nullptr;
-    TempFile::SetTempPath(String8());
+    Archive::CreateResult result;
+    m_archive = Archive::CreateWithAdjacentTemporary(Str(path), c_documentTag, result, {});
+    ASSERT_TRUE(m_archive);
+    EXPECT_THROW(Save(*m_archive, {{"a", "new"}}), ArchiveFileException);
+    EXPECT_EQ(Get(*m_archive, "a"), "new");
+    Reopen(path);
+    EXPECT_EQ(m_archive->CaptureToThrowaway(), Archive::CaptureDone);
+    EXPECT_EQ(Get(*m_archive, "a"), "new");
+    m_archive = nullptr;
 }
 
 } // namespace

@@ -24,6 +24,7 @@ struct View
 {
     R result = R::OpenNotFound;
     Items items; // Only those that read.
+    bool hasThumbnails = false;
 };
 
 class ArchiveDamageTest : public testing::Test
@@ -48,7 +49,7 @@ protected:
         m_bytes = builder.Build();
     }
 
-    View Look(Opener open, std::string const& bytes)
+    View Look(Opener open, std::string const& bytes, bool saves = false)
     {
         m_disk.Load({{c_path, std::make_shared<std::string const>(bytes)}});
         View view;
@@ -57,7 +58,14 @@ protected:
             EXPECT_EQ(view.result, R::OpenOk);
             view.items = GetAll(*archive);
             std::erase_if(view.items, [](auto const& item) { return item.second == "(unreadable)"; });
-            archive->LoadThumbnails();
+            view.hasThumbnails = static_cast<bool>(archive->LoadThumbnails());
+            if (!saves) return view;
+            EXPECT_TRUE(Save(*archive, {{"saved", "after"}}));
+        }
+        if (saves && view.result == R::OpenOk) {
+            Items after = GetAll(*OpenDocument(c_path));
+            EXPECT_EQ(after["saved"], "after");
+            for (auto const& [path, bytes] : view.items) EXPECT_EQ(after[path], bytes);
         }
         return view;
     }
@@ -98,7 +106,8 @@ TEST_F(ArchiveDamageTest, EveryOtherValueOfEveryByteIsRefusedOrReads)
             std::string bytes = m_bytes;
             bytes[at] = static_cast<char>(bytes[at] ^ change);
             SCOPED_TRACE(testing::Message() << "byte " << at << " xor " << change);
-            View const found = Look(Archive::Open, bytes);
+            bool const isBit = (change & (change - 1)) == 0;
+            View const found = Look(Archive::Open, bytes, isBit);
             ASSERT_TRUE(IsWhole(found)) << found.result;
             View const searched = Look(Archive::RecoverArchive, bytes);
             ASSERT_TRUE(IsWhole(searched)) << searched.result;
@@ -127,14 +136,28 @@ TEST_F(ArchiveDamageTest, EveryTruncationLeavesTheStateThatItHolds)
 {
     for (u64 size = 0; size <= m_bytes.size(); ++size) {
         SCOPED_TRACE(size);
+        R const expected = size < 12                   ? R::OpenNotArchive
+                           : size < c_guardEnd         ? R::OpenBadInfo
+                           : size < m_secondTable + 59 ? R::OpenTruncated
+                           : size < m_secondEnd        ? R::OpenCorrupt
+                                                       : R::OpenOk;
         std::string const bytes = m_bytes.substr(0, size);
         View const found = Look(Archive::Open, bytes);
         View const searched = Look(Archive::RecoverArchive, bytes);
-        ASSERT_TRUE(IsWhole(found));
+        ASSERT_EQ(found.result, expected);
+        // The headers alone are there when only the newest body is cut.
+        ASSERT_EQ(Test(bytes), expected == R::OpenCorrupt ? R::OpenOk : expected);
+        ASSERT_EQ(found.hasThumbnails, size == m_bytes.size());
         ASSERT_TRUE(IsWhole(searched));
         EXPECT_EQ(found.items, size >= m_secondEnd ? m_new : Items());
         EXPECT_EQ(searched.items, size >= m_secondEnd ? m_new : size >= m_firstEnd ? m_old : Items());
     }
+    // In front of the first table: link and reference path.
+    TestSupport::ArchiveBuilder builder;
+    builder.link = {0, 1, "/nowhere"};
+    builder.reference = "reference";
+    for (u64 size = c_guardEnd; size < builder.GetFrontSize(); ++size)
+        EXPECT_EQ(Look(Archive::Open, builder.Build().substr(0, size)).result, R::OpenTruncated) << size;
 }
 
 } // namespace

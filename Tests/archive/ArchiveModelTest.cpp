@@ -1,5 +1,4 @@
 #include "support/ArchiveFixture.h"
-#include "support/TempFolder.h"
 
 #include <algorithm>
 #include <gtest/gtest.h>
@@ -30,7 +29,7 @@ struct Model
     size_t masterRevisions = 0, scratchRevisions = 0;
 };
 
-class ArchiveModelTest : public testing::TestWithParam<u32>
+class ArchiveModelTest : public DocumentTest, public testing::WithParamInterface<u32>
 {
 protected:
     void Compare()
@@ -53,9 +52,7 @@ protected:
             ASSERT_EQ(scratch.linkSaveCount, master.saveCount);
             ASSERT_EQ(scratch.linkSaveTimeStamp, master.saveTimeStamp);
         }
-        std::vector<Counted<Archive::Revision const>> revisions;
-        m_archive->GetRevisions(revisions);
-        ASSERT_EQ(revisions.size(), m_model.masterRevisions + m_model.scratchRevisions);
+        ASSERT_EQ(RevisionsOf(*m_archive).size(), m_model.masterRevisions + m_model.scratchRevisions);
     }
 
     Changes MakeChanges()
@@ -145,24 +142,19 @@ protected:
     }
 
     std::mt19937 m_random{GetParam()};
-    TestSupport::TempFolder m_folder;
-    Counted<Archive> m_archive;
     Model m_model;
     std::set<std::string> m_scratchTouched;
 };
 
 TEST_P(ArchiveModelTest, RandomSavesMatchThePlainModel)
 {
-    std::string const path = m_folder / "doc";
-    std::string const scratchPath = m_folder / "scratch";
-    m_archive = CreateDocument(path);
+    m_archive = CreateDocument(m_path);
     ASSERT_TRUE(m_archive);
     for (int step = 0; step < 150; ++step) {
         SCOPED_TRACE(step);
         Archive::SessionType const type = m_random() % 2 ? Archive::SessionTypeFull : Archive::SessionTypeIncremental;
         if (step == 20) {
-            Archive::CreateResult result;
-            ASSERT_TRUE(m_archive->AddScratchFile(Str(scratchPath), result));
+            AddScratch();
             m_model.scratchTotal = m_model.masterTotal;
             m_model.scratchDead = m_model.masterDead;
             m_model.scratchSaves = 1;
@@ -182,9 +174,7 @@ TEST_P(ArchiveModelTest, RandomSavesMatchThePlainModel)
         }
         ASSERT_NO_FATAL_FAILURE(Compare());
         if (m_random() % 4 != 0) continue;
-        m_archive = nullptr;
-        m_archive = OpenDocument(step >= 20 ? scratchPath : path);
-        ASSERT_TRUE(m_archive);
+        Reopen(step >= 20 ? m_scratchPath : m_path);
         ASSERT_NO_FATAL_FAILURE(Compare());
     }
 }
@@ -200,12 +190,9 @@ TEST_P(ArchiveModelTest, RandomSavesKeepStatesAndPathCounts)
         int tag = 0;            // Of the newest revision that has it.
         bool inScratch = false; // And that one lies in the scratch file.
     };
-    std::string const path = m_folder / "doc";
-    std::string const scratchPath = m_folder / "scratch";
     FileStoreOut::IndexedPathParts const parts[2] = {{Str("a/"), Str("")}, {Str("b/"), Str(".x")}};
-    m_archive = CreateDocument(path);
-    Archive::CreateResult result;
-    ASSERT_TRUE(m_archive->AddScratchFile(Str(scratchPath), result));
+    m_archive = CreateDocument(m_path);
+    AddScratch();
     std::map<std::string, Known> items;
     for (int i = 0; i < 8; ++i) items["i" + std::to_string(i)].item = MakeCounted<BytesItem>(std::to_string(i));
     u64 counters[2] = {};
@@ -232,6 +219,10 @@ TEST_P(ArchiveModelTest, RandomSavesKeepStatesAndPathCounts)
         std::string digits;
         for (u64 n = ++next[pair]; n != 0; n /= 16) digits += "0123456789abcdef"[n % 16];
         ASSERT_EQ(generated, parts[pair].prefix + Str(digits) + parts[pair].suffix);
+        // It stays the object's for the session.
+        ASSERT_TRUE(handle->GenerateIndexedPath(parts[pair], items["i0"].item.Get(), nullptr, generated));
+        ASSERT_EQ(generated, parts[pair].prefix + Str(digits) + parts[pair].suffix);
+        ASSERT_FALSE(handle->GenerateIndexedPath(parts[pair], nullptr, nullptr, generated));
 
         bool committed = !scratch && scratchHasRevisions;
         std::set<std::string> written;
@@ -261,9 +252,7 @@ TEST_P(ArchiveModelTest, RandomSavesKeepStatesAndPathCounts)
             ASSERT_TRUE(!has || static_cast<int>(state) == known.state) << name;
         }
         if (m_random() % 5 != 0) continue;
-        m_archive = nullptr;
-        m_archive = OpenDocument(scratchPath);
-        ASSERT_TRUE(m_archive);
+        Reopen(m_scratchPath);
         for (auto& [name, known] : items) {
             bool const saved = m_archive->HasFile(Str(name));
             known.item = MakeCounted<BytesItem>(known.item->bytes);

@@ -1,21 +1,17 @@
 #include "libkernel/archive/ArchiveErrorCallback.h"
 #include "libkernel/archive/ArchiveExceptions.h"
 #include "libkernel/filestore/BackstoreException.h"
-#include "libkernel/filestore/DelayLoadHolder.h"
 #include "libkernel/filestore/FileStoreBackData.h"
-#include "libkernel/filesystem/TempFile.h"
 #include "libkernel/streams/InStream.h"
 #include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
 #include "support/FaultyFiles.h"
-#include "support/TempFolder.h"
 
 #include <atomic>
 #include <cerrno>
 #include <chrono>
 #include <condition_variable>
 #include <cstdlib>
-#include <filesystem>
 #include <fstream>
 #include <functional>
 #include <future>
@@ -35,28 +31,18 @@ using TestSupport::ArchiveBuilder;
 using Items = std::map<std::string, std::string>;
 using BackData = Counted<FileStoreBackData const>;
 
-class ArchiveReadTest : public testing::Test
+class ArchiveReadTest : public DocumentTest
 {
 protected:
     void SetUp() override
     {
-        Archive::PostShutdown(); // Buckets of other tests lie in other folders.
-        std::filesystem::create_directory(m_folder / "temp");
-        TempFile::SetTempPath(Str(m_folder / "temp"));
         m_archive = CreateDocument(m_path);
         ASSERT_TRUE(m_archive);
-    }
-    void TearDown() override
-    {
-        m_archive = nullptr;
-        Archive::PostShutdown();
-        TempFile::SetTempPath(String8());
     }
     std::vector<u64> GetBucketSizes() const
     {
         std::vector<u64> sizes;
-        for (auto const& entry : std::filesystem::directory_iterator(m_folder / "temp"))
-            sizes.push_back(entry.file_size());
+        for (auto const& entry : std::filesystem::directory_iterator(m_temporaries)) sizes.push_back(entry.file_size());
         return sizes;
     }
     BackData Copy(std::string const& path)
@@ -93,10 +79,6 @@ protected:
         file.seekp(static_cast<std::streamoff>(offset));
         file.put(byte);
     }
-
-    TestSupport::TempFolder const m_folder;
-    std::string const m_path = m_folder / "doc";
-    Counted<Archive> m_archive;
 };
 
 TEST_F(ArchiveReadTest, EachRevisionIsReadAsItWas)
@@ -106,8 +88,7 @@ TEST_F(ArchiveReadTest, EachRevisionIsReadAsItWas)
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}, {"b", "1"}}));
     ASSERT_TRUE(Save(*m_archive, {{"a", "22"}, {"c", "3"}}, false, Archive::SessionTypeIncremental));
     ASSERT_TRUE(Save(*m_archive, {{"a", std::nullopt}}));
-    std::vector<Counted<Archive::Revision const>> revisions;
-    m_archive->GetRevisions(revisions);
+    auto const revisions = RevisionsOf(*m_archive);
     for (size_t at = states.size(); at-- > 0;) {
         SCOPED_TRACE(at);
         EXPECT_EQ(m_archive->GetRewindCount(), states.size() - 1 - at);
@@ -315,12 +296,14 @@ TEST_F(ArchiveReadTest, BucketThatCannotBeMadeOrFilledIsSaid)
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
     {
         TestSupport::FaultyFiles files;
-        files.Plan({TestSupport::FileCall::Open, 1, true, ENOSPC, TestSupport::Fault::Part::Nothing, false, "/temp/"});
+        files.Plan(
+            {TestSupport::FileCall::Open, 1, true, ENOSPC, TestSupport::Fault::Part::Nothing, false, "/temporaries/"});
         EXPECT_FALSE(Copy("a"));
     }
     for (int const error : {ENOSPC, EIO}) {
         TestSupport::FaultyFiles files;
-        files.Plan({TestSupport::FileCall::Write, 1, true, error, TestSupport::Fault::Part::Nothing, false, "/temp/"});
+        files.Plan(
+            {TestSupport::FileCall::Write, 1, true, error, TestSupport::Fault::Part::Nothing, false, "/temporaries/"});
         try {
             Copy("a");
             FAIL();
@@ -336,8 +319,7 @@ TEST_F(ArchiveReadTest, BucketThatCannotBeMadeOrFilledIsSaid)
 TEST_F(ArchiveReadTest, ReaderOfScratchBytesKeepsThemWhileMasterAndScratchMoveOn)
 {
     std::string const bytes(2'500'000, 's');
-    Archive::CreateResult result;
-    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    AddScratch();
     ASSERT_TRUE(Save(*m_archive, {{"a", bytes}}, true));
     Counted<InStream> in = m_archive->OpenFileInStream(Str("a"));
     std::string text(bytes.size(), 0);
@@ -353,8 +335,7 @@ TEST_F(ArchiveReadTest, ReaderOfScratchBytesKeepsThemWhileMasterAndScratchMoveOn
     ASSERT_TRUE(Save(*m_archive, {{"b", "3"}}, true));
     EXPECT_LT(StateOf(*m_archive, Archive::ChoiceScratch).fileEnd, 1000u);
     EXPECT_FALSE(m_archive->IsBroken());
-    m_archive = nullptr;
-    m_archive = OpenDocument(m_folder / "scratch");
+    Reopen(m_scratchPath);
     EXPECT_EQ(Get(*m_archive, "b"), "3");
     EXPECT_TRUE(Get(*m_archive, "a") == bytes);
 }
@@ -372,8 +353,7 @@ FileStoreItemType const c_watchedType(
 
 TEST_F(ArchiveReadTest, LoadThatASaveOvertakesFindsTheBytesWhereTheyWent)
 {
-    Archive::CreateResult result;
-    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    AddScratch();
     ASSERT_TRUE(Save(*m_archive, {{"a", "bytes"}}, true));
     Counted<DelayLoadHolder> const holder = m_archive->CreateDelayLoadHolderDirect(Str("a"), &c_watchedType, nullptr);
     s_onCreate = [&] { EXPECT_TRUE(Save(*m_archive, {{"m", "rolls down"}})); };
@@ -442,8 +422,7 @@ TEST_F(ArchiveReadTest, OfflinedDocumentLoadsWithoutItsFile)
     ASSERT_TRUE(Save(*m_archive, {{"a", "old"}, {"gone", "g"}}));
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}, {"b", items.at("b")}, {"empty", ""}, {"gone", std::nullopt}}));
     ASSERT_TRUE(Save(*m_archive, {{"p", "packed"}}, false, Archive::SessionTypeFull, true));
-    Counted<DelayLoadHolder> const holder =
-        m_archive->CreateDelayLoadHolderDirect(Str("b"), &BytesItem::c_type, nullptr);
+    Counted<DelayLoadHolder> const holder = HolderOf(*m_archive, "b");
     m_archive->StopOffline();
     EXPECT_EQ(m_archive->GetOffliningState(), Archive::OffliningNotStarted);
     m_archive->SetKeepOpen(false);
@@ -458,8 +437,7 @@ TEST_F(ArchiveReadTest, OfflinedDocumentLoadsWithoutItsFile)
     EXPECT_FALSE(m_archive->IsBroken());
     ExpectLoads(items);
     ExpectLoads({{"p", "packed"}});
-    JailCounted<FileStoreItem> loaded;
-    EXPECT_TRUE(holder->GetItemBase(loaded) && loaded);
+    EXPECT_EQ(BytesOf(*holder), items.at("b"));
     m_archive->StartOffline(updater); // Not from any state but the first.
     EXPECT_TRUE(m_archive->IsOffliningCompleted());
 }
@@ -493,8 +471,7 @@ TEST_F(ArchiveReadTest, OffliningGivesWayToReadersAndSaves)
 TEST_F(ArchiveReadTest, OffliningForgetsScratchBlocksThatASaveMadeStale)
 {
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
-    Archive::CreateResult result;
-    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    AddScratch();
     ASSERT_TRUE(Save(*m_archive, {{"a", "scratch"}, {"b", "scratch too"}, {"c", "third"}}, true));
     auto const updater = MakeCounted<Updater>();
     Counted<InStream> reader = m_archive->OpenFileInStream(Str("a"));
@@ -559,8 +536,7 @@ TEST_F(ArchiveReadTest, CopiesLoadsAndSavesOnManyThreadsNeverWaitForEachOtherInA
     Changes first;
     for (int i = 0; i < 8; ++i) first[std::to_string(i)] = std::string(20'000, static_cast<char>('a' + i));
     ASSERT_TRUE(Save(*m_archive, first));
-    Archive::CreateResult result;
-    ASSERT_TRUE(m_archive->AddScratchFile(Str(m_folder / "scratch"), result));
+    AddScratch();
     std::atomic<bool> stop{false};
     std::atomic<int> wrong{0};
     std::vector<std::thread> threads;
@@ -575,19 +551,20 @@ TEST_F(ArchiveReadTest, CopiesLoadsAndSavesOnManyThreadsNeverWaitForEachOtherInA
         if (copy && bytes.find_first_not_of(bytes[0]) != std::string::npos) ++wrong;
     });
     run([&](std::string const& path) {
-        Counted<DelayLoadHolder> const holder =
-            m_archive->CreateDelayLoadHolderDirect(Str(path), &BytesItem::c_type, nullptr);
-        JailCounted<FileStoreItem> item;
-        if (holder && !(holder->GetItemBase(item) && item)) ++wrong;
+        Counted<DelayLoadHolder> const holder = HolderOf(*m_archive, path);
+        if (holder && BytesOf(*holder).size() != 20'000) ++wrong;
     });
     run([&](std::string const& path) {
-        if (!m_archive->OpenFileInStream(Str(path)) || !m_archive->HasFile(Str(path))) ++wrong;
+        std::string text(20'000, 0);
+        Counted<InStream> const in = m_archive->OpenFileInStream(Str(path));
+        if (!in || in->ReadBlock(text.data(), text.size()) != text.size() || !m_archive->HasFile(Str(path))) ++wrong;
+        if (text.find_first_not_of(text[0]) != std::string::npos || !Get(*m_archive, path)) ++wrong;
         m_archive->CheckForReadOnlyChange();
         m_archive->LoadThumbnails();
     });
     for (int n = 0; n < 40; ++n) {
         Changes const changes = {{std::to_string(n % 8), std::string(20'000, static_cast<char>('A' + n % 26))}};
-        ASSERT_TRUE(Save(*m_archive, changes, n % 3 != 2));
+        ASSERT_TRUE(Save(*m_archive, changes, n % 3 != 2, Archive::SessionTypeFull, n % 2 == 0));
         if (n % 5 == 0) m_archive->StartOffline(nullptr);
     }
     stop = true;

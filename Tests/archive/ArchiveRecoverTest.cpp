@@ -1,10 +1,8 @@
 #include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
 #include "support/FakeClock.h"
-#include "support/TempFolder.h"
 
 #include <gtest/gtest.h>
-#include <random>
 
 // Opening by search: the newest state that can be reached, whatever became of the info block.
 
@@ -18,7 +16,7 @@ using Items = std::map<std::string, std::string>;
 constexpr u64 c_infoPos = 12;
 constexpr u64 c_infoSize = 52;
 
-class ArchiveRecoverTest : public testing::Test
+class ArchiveRecoverTest : public DocumentTest
 {
 protected:
     Counted<Archive> Recover(std::string const& path, Archive::OpenResult expected = Archive::OpenOk)
@@ -52,9 +50,7 @@ protected:
         WriteWhole(path, file);
     }
 
-    TestSupport::TempFolder m_folder;
     TestSupport::FakeClock m_clock;
-    std::string const m_path = m_folder / "doc";
 };
 
 TEST_F(ArchiveRecoverTest, NewestStateComesBackFromAnyDamageOfTheInfoBlock)
@@ -169,55 +165,29 @@ TEST_F(ArchiveRecoverTest, OfTwoTablesBehindOneTheLaterIsTriedFirst)
 
 TEST_F(ArchiveRecoverTest, ScratchFilesComeBackWithTheirMasterAndOnlyInItsExactState)
 {
-    std::string const scratch = m_folder / "scratch";
     {
         Counted<Archive> const archive = CreateDocument(m_path);
         Archive::CreateResult result;
         ASSERT_TRUE(Save(*archive, {{"a", "master"}}));
-        ASSERT_TRUE(archive->AddScratchFile(Str(scratch), result));
+        ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), result));
         // Leaves tables in the scratch file that are dead once the master is saved.
         for (int n = 0; n < 4; ++n) ASSERT_TRUE(Save(*archive, {{"a", std::string(500, 'x')}}, true));
         ASSERT_TRUE(Save(*archive, {{"b", "rolled down"}}));
         ASSERT_TRUE(Save(*archive, {{"a", "scratch"}}, true));
     }
     std::string const master = ReadWhole(m_path);
-    Smash(scratch, c_infoPos + 4, TestSupport::Little(999, 8));
+    Smash(m_scratchPath, c_infoPos + 4, TestSupport::Little(999, 8));
     {
-        Counted<Archive> const archive = Recover(scratch);
+        Counted<Archive> const archive = Recover(m_scratchPath);
         ASSERT_TRUE(archive);
         EXPECT_EQ(GetAll(*archive), (Items{{"a", "scratch"}, {"b", "rolled down"}}));
         EXPECT_TRUE(archive->HaveScratchRevisions());
     }
     // Of a master that has to be searched nobody can say that it is the one the scratch file means.
     Smash(m_path, c_infoPos + 4, TestSupport::Little(999, 8));
-    EXPECT_FALSE(Recover(scratch, Archive::OpenCorrupt));
+    EXPECT_FALSE(Recover(m_scratchPath, Archive::OpenCorrupt));
     ExpectRecovered({{"a", std::string(500, 'x')}, {"b", "rolled down"}});
-    EXPECT_FALSE(Recover(scratch, Archive::OpenLinkMismatch));
-}
-
-TEST_F(ArchiveRecoverTest, RandomHistoriesComeBackAtTheirNewestState)
-{
-    for (u32 seed = 1; seed <= 20; ++seed) {
-        SCOPED_TRACE(seed);
-        std::mt19937 random(seed);
-        Items newest;
-        {
-            Counted<Archive> const archive = CreateDocument(m_path);
-            for (u32 saves = 1 + random() % 12; saves > 0; --saves) {
-                // Each save writes, so each table follows a block.
-                Changes changes = {{"n" + std::to_string(random() % 5), std::string(random() % 900, 'n')}};
-                if (random() % 2) changes.emplace("n" + std::to_string(random() % 5), std::nullopt);
-                ASSERT_TRUE(Save(*archive, changes, false, Archive::SessionTypeRewrite, random() % 2 == 0));
-            }
-            newest = GetAll(*archive);
-        }
-        std::string noise(c_infoSize, 0);
-        for (char& c : noise) c = static_cast<char>(random());
-        if (random() % 2) noise.replace(0, 4, "#Inf");
-        Smash(m_path, c_infoPos, noise);
-        ExpectRecovered(newest);
-        std::remove(m_path.c_str());
-    }
+    EXPECT_FALSE(Recover(m_scratchPath, Archive::OpenLinkMismatch));
 }
 
 TEST_F(ArchiveRecoverTest, LongChainsOnABrokenTableAreGivenUpAtOnce)

@@ -1,10 +1,9 @@
 #include "libkernel/archive/ArchiveExceptions.h"
-#include "libkernel/filesystem/TempFile.h"
+#include "libkernel/archive/ArchiveStreamline.h"
 #include "libkernel/streams/FileInOutStream.h"
 #include "libkernel/streams/OutStream.h"
 #include "support/ArchiveBuilder.h"
 #include "support/ArchiveFixture.h"
-#include "support/TempFolder.h"
 
 #include <fstream>
 #include <gtest/gtest.h>
@@ -15,7 +14,7 @@ namespace {
 
 using namespace Kernel;
 
-class ArchiveSessionTest : public testing::Test
+class ArchiveSessionTest : public DocumentTest
 {
 protected:
     void SetUp() override
@@ -23,22 +22,6 @@ protected:
         m_archive = CreateDocument(m_path);
         ASSERT_TRUE(m_archive);
     }
-    void AddScratch()
-    {
-        Archive::CreateResult result;
-        ASSERT_TRUE(m_archive->AddScratchFile(Str(m_scratchPath), result));
-    }
-    void Reopen(std::string const& path)
-    {
-        m_archive = nullptr;
-        m_archive = OpenDocument(path);
-        ASSERT_TRUE(m_archive);
-    }
-
-    TestSupport::TempFolder m_folder;
-    std::string const m_path = m_folder / "doc";
-    std::string const m_scratchPath = m_folder / "doc.scratch";
-    Counted<Archive> m_archive;
 };
 
 TEST_F(ArchiveSessionTest, ClosingWithoutChangesWritesNothing)
@@ -125,8 +108,7 @@ TEST_F(ArchiveSessionTest, MasterSaveRecordsWhatTheScratchFileDeletedAndEmptiesI
     ASSERT_TRUE(Save(*m_archive, {{"extra", "e"}}));
     EXPECT_EQ(StateOf(*m_archive, Archive::ChoiceScratch).fileEnd, 86 + m_path.size());
     EXPECT_EQ(StateOf(*m_archive, Archive::ChoiceScratch).firstFAT, 0u);
-    std::vector<Counted<Archive::Revision const>> revisions;
-    m_archive->GetRevisions(revisions);
+    auto const revisions = RevisionsOf(*m_archive);
     ASSERT_EQ(revisions.size(), 2u);
     auto const info = m_archive->GetFileInfo(Str("deleted"));
     ASSERT_TRUE(info && revisions[1]->Find(*info));
@@ -169,9 +151,7 @@ TEST_F(ArchiveSessionTest, SecondWriterIsSeenBeforeAnythingIsWritten)
         EXPECT_EQ(e.GetWhatFile(), ArchiveFileException::WhatFile::Master);
     }
     EXPECT_EQ(ReadWhole(m_path), bytes);
-    ArchiveSessionHandle next;
-    EXPECT_EQ(m_archive->CreateSessionAdv(next, Archive::SessionTypeFull, nullptr, false),
-              Archive::SessionFileUnusable);
+    EXPECT_EQ(SessionResult(*m_archive), Archive::SessionFileUnusable);
     EXPECT_EQ(m_archive->GetLastRestoreResult(), Archive::RestoreNotTheFile);
 }
 
@@ -184,39 +164,23 @@ TEST_F(ArchiveSessionTest, RefusalsComeInTheirOrder)
     ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
     EXPECT_EQ(m_archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false),
               Archive::SessionHandleInUse);
-    ArchiveSessionHandle other;
-    EXPECT_EQ(m_archive->CreateSessionAdv(other, Archive::SessionTypeFull, nullptr, false), Archive::SessionActive);
+    EXPECT_EQ(SessionResult(*m_archive), Archive::SessionActive);
     handle.Release();
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
     m_archive->RewindWorkingRevision();
-    EXPECT_EQ(m_archive->CreateSessionAdv(other, Archive::SessionTypeFull, nullptr, false), Archive::SessionNotAtHead);
-    EXPECT_THROW(m_archive->CloseSession(other, false), OutStream::WriteException);
+    EXPECT_EQ(SessionResult(*m_archive), Archive::SessionNotAtHead);
+    EXPECT_THROW(m_archive->CloseSession(handle, false), OutStream::WriteException);
 }
 
-TEST_F(ArchiveSessionTest, GeneratedPathIsTheObjectsForTheSessionAndInReversedHexadecimal)
-{
-    FileStoreOut::IndexedPathParts const parts{Str("img/"), Str(".png")};
-    std::vector<Counted<BytesItem>> items;
-    ArchiveSessionHandle handle;
-    ASSERT_TRUE(m_archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
-    String8 path;
-    EXPECT_FALSE(handle->GenerateIndexedPath(parts, nullptr, nullptr, path));
-    for (int i = 1; i <= 16; ++i) {
-        items.push_back(MakeCounted<BytesItem>());
-        EXPECT_TRUE(handle->GenerateIndexedPath(parts, items.back(), nullptr, path));
-    }
-    EXPECT_EQ(path, "img/01.png");
-    EXPECT_TRUE(handle->GenerateIndexedPath(parts, items[0], nullptr, path));
-    EXPECT_EQ(path, "img/1.png");
-}
-
-TEST_F(ArchiveSessionTest, PathOf65535BytesIsSavedAndOneMoreIsRefused)
+TEST_F(ArchiveSessionTest, PathOf65535BytesIsSavedAndStreamlinedAndOneMoreIsRefused)
 {
     std::string const longest(65535, 'p');
     ASSERT_TRUE(Save(*m_archive, {{longest, "1"}}));
     EXPECT_THROW(Save(*m_archive, {{longest + "p", "1"}}), OutStream::WriteException);
+    ASSERT_TRUE(Save(*m_archive, {{longest, "2"}}));
+    EXPECT_EQ(m_archive->Streamline(nullptr, nullptr, nullptr), Archive::StreamlineDone);
     Reopen(m_path);
-    EXPECT_EQ(Get(*m_archive, longest), "1");
+    EXPECT_EQ(Get(*m_archive, longest), "2");
 }
 
 TEST_F(ArchiveSessionTest, ItemThatIsNotNestableMayNotNameFiles)
@@ -253,8 +217,7 @@ TEST_F(ArchiveSessionTest, StoredFilesMoveBetweenArchivesWithoutBeingUnpacked)
 {
     std::string const bytes(200'000, 'q');
     ASSERT_TRUE(Save(*m_archive, {{"img", bytes}}, false, Archive::SessionTypeFull, true));
-    Counted<DelayLoadHolder> const holder =
-        m_archive->CreateDelayLoadHolderDirect(Str("img"), &BytesItem::c_type, nullptr);
+    Counted<DelayLoadHolder> const holder = HolderOf(*m_archive, "img");
     ASSERT_TRUE(holder);
     std::string const otherPath = m_folder / "other";
     Counted<Archive> other = CreateDocument(otherPath);
@@ -276,28 +239,20 @@ TEST_F(ArchiveSessionTest, StoredFilesMoveBetweenArchivesWithoutBeingUnpacked)
 
 TEST_F(ArchiveSessionTest, HoldersOfScratchVersionsKeepTheirBytesThroughARollDownAndAFrontThatGrows)
 {
-    TestSupport::TempFolder const copies;
-    TempFile::SetTempPath(Str(copies.GetPath()));
     AddScratch();
     ASSERT_TRUE(Save(*m_archive, {{"img", "old bytes"}, {"head", "head bytes"}}, true));
     std::map<std::string, Counted<DelayLoadHolder>> holders;
-    for (char const* path : {"img", "head"})
-        holders[path] = m_archive->CreateDelayLoadHolderDirect(Str(path), &BytesItem::c_type, nullptr);
+    for (char const* path : {"img", "head"}) holders[path] = HolderOf(*m_archive, path);
     ASSERT_TRUE(Save(*m_archive, {{"img", "new bytes"}}, true));
     m_archive->SetReferenceInfo(MakeCounted<ArchiveReferenceInfo>(Str(std::string(100, 'r'))));
     ASSERT_TRUE(Save(*m_archive, {{"other", "1"}}));
     EXPECT_FALSE(m_archive->IsBroken());
     EXPECT_FALSE(holders["head"]->GetBackData()); // Its bytes have moved with it.
     for (auto const& [path, bytes] : {std::pair("img", "old bytes"), std::pair("head", "head bytes")}) {
-        JailCounted<FileStoreItem> item;
-        ASSERT_TRUE(holders[path]->GetItemBase(item) && item) << path;
-        EXPECT_EQ(dynamic_cast<BytesItem&>(*item).bytes, bytes);
+        EXPECT_EQ(BytesOf(*holders[path]), bytes);
     }
     EXPECT_EQ(Get(*m_archive, "img"), "new bytes");
     Reopen(m_scratchPath);
-    holders.clear();
-    Archive::PostShutdown();
-    TempFile::SetTempPath(String8());
 }
 
 TEST_F(ArchiveSessionTest, ScratchEntryThatNoRecordNamesIsNotRolledDown)
@@ -335,31 +290,6 @@ TEST_F(ArchiveSessionTest, ManyThreadsMayOfferFiles)
     std::map<std::string, std::string> const all = GetAll(*m_archive);
     ASSERT_EQ(all.size(), static_cast<size_t>(threads * each));
     for (auto const& [name, bytes] : all) EXPECT_EQ(bytes, name + std::string(1000, 'b'));
-}
-
-TEST_F(ArchiveSessionTest, ReadersGoOnDuringSavesAndSeeWholeStates)
-{
-    ASSERT_TRUE(Save(*m_archive, {{"a", std::string(100'000, '0')}, {"b", std::string(100'000, '0')}}));
-    std::atomic<bool> stop{false};
-    std::atomic<int> wrong{0};
-    std::vector<std::thread> readers;
-    for (int r = 0; r < 2; ++r)
-        readers.emplace_back([&] {
-            while (!stop.load()) {
-                std::optional<std::string> const bytes = Get(*m_archive, "a");
-                if (!bytes || bytes->find_first_not_of((*bytes)[0]) != std::string::npos) ++wrong;
-                Counted<InStream> const in = m_archive->OpenFileInStream(Str("b"));
-                std::string text(100'000, 0);
-                if (!in || in->ReadBlock(text.data(), text.size()) != text.size()) ++wrong;
-            }
-        });
-    for (int i = 0; i < 30; ++i) {
-        std::string const bytes(100'000, static_cast<char>('a' + i % 26));
-        ASSERT_TRUE(Save(*m_archive, {{"a", bytes}, {"b", bytes}}, false, Archive::SessionTypeFull, i % 2 == 0));
-    }
-    stop = true;
-    for (std::thread& reader : readers) reader.join();
-    EXPECT_EQ(wrong.load(), 0);
 }
 
 } // namespace

@@ -3,9 +3,14 @@
 #include "libkernel/archive/Archive.h"
 #include "libkernel/archive/ArchiveRevision.h"
 #include "libkernel/archive/ArchiveSession.h"
+#include "libkernel/archive/ArchiveThumbnails.h"
+#include "libkernel/filestore/DelayLoadHolder.h"
+#include "libkernel/filesystem/TempFile.h"
 #include "support/BytesItem.h"
 #include "support/TempFolder.h"
 
+#include <algorithm>
+#include <filesystem>
 #include <gtest/gtest.h>
 #include <map>
 #include <optional>
@@ -83,6 +88,41 @@ inline bool Save(Kernel::Archive& archive, Changes const& changes, bool scratch 
     return true;
 }
 
+/// One record that holds these bytes.
+inline Kernel::Counted<Kernel::ArchiveThumbnails> MakeThumbnails(std::string const& picture)
+{
+    auto thumbnails = Kernel::MakeCounted<Kernel::ArchiveThumbnails>();
+    auto const data = Kernel::MakeCounted<Kernel::RawData>(picture.size());
+    std::copy(picture.begin(), picture.end(), data->GetBytes());
+    thumbnails->AddFile(Kernel::ArchiveThumbnails::FileType::Picture, data);
+    return thumbnails;
+}
+
+/// What a session that is asked for now would get.
+inline Kernel::Archive::CreateSessionResult SessionResult(Kernel::Archive& archive)
+{
+    Kernel::ArchiveSessionHandle handle;
+    return archive.CreateSessionAdv(handle, Kernel::Archive::SessionTypeFull, nullptr, false);
+}
+
+inline Kernel::Counted<Kernel::DelayLoadHolder> HolderOf(Kernel::Archive& archive, std::string const& path)
+{
+    return archive.CreateDelayLoadHolderDirect(Str(path), &BytesItem::c_type, nullptr);
+}
+
+inline std::string BytesOf(Kernel::DelayLoadHolder& holder)
+{
+    Kernel::JailCounted<Kernel::FileStoreItem> item;
+    return holder.GetItemBase(item) && item ? dynamic_cast<BytesItem&>(*item).bytes : "(nothing)";
+}
+
+inline std::vector<Kernel::Counted<Kernel::Archive::Revision const>> RevisionsOf(Kernel::Archive& archive)
+{
+    std::vector<Kernel::Counted<Kernel::Archive::Revision const>> revisions;
+    archive.GetRevisions(revisions);
+    return revisions;
+}
+
 inline Kernel::Archive::FileState StateOf(Kernel::Archive& archive,
                                           Kernel::Archive::ArchiveChoice which = Kernel::Archive::ChoiceMaster)
 {
@@ -90,5 +130,43 @@ inline Kernel::Archive::FileState StateOf(Kernel::Archive& archive,
     archive.GetFileState(which, state);
     return state;
 }
+
+/// A folder for one document with its scratch file, and folders for temporaries within it.
+class DocumentTest : public testing::Test
+{
+protected:
+    DocumentTest()
+    {
+        std::filesystem::create_directory(m_temporaries);
+        std::filesystem::create_directory(m_second);
+        std::vector<Kernel::String8> rescued;
+        Kernel::TempFile::SetTempPath(Str(m_temporaries), Str(m_second), rescued);
+    }
+    ~DocumentTest() override
+    {
+        m_archive = nullptr;
+        Kernel::Archive::PostShutdown(); // Copies of bytes that the process shares lie in the folder that goes.
+        Kernel::TempFile::SetTempPath(Kernel::String8());
+    }
+    /// Lets go of the archive first.
+    void Reopen(std::string const& path, Kernel::Archive::OpenMode mode = Kernel::Archive::OpenModeReadWrite)
+    {
+        m_archive = nullptr;
+        m_archive = OpenDocument(path, mode);
+        ASSERT_TRUE(m_archive);
+    }
+    void AddScratch()
+    {
+        Kernel::Archive::CreateResult result;
+        ASSERT_TRUE(m_archive->AddScratchFile(Str(m_scratchPath), result));
+    }
+
+    TestSupport::TempFolder const m_folder;
+    std::string const m_temporaries = m_folder / "temporaries";
+    std::string const m_second = m_folder / "second"; ///< For what overwrites a master.
+    std::string const m_path = m_folder / "doc";
+    std::string const m_scratchPath = m_folder / "scratch";
+    Kernel::Counted<Kernel::Archive> m_archive;
+};
 
 } // namespace KernelTest

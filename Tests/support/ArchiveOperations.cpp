@@ -330,6 +330,12 @@ std::vector<ArchiveOperation> MakeOperations()
          },
          "open * links differ"},
         {"full save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeFull, false), save},
+        {"save of several buffers", StartState::Document,
+         [](World& w) {
+             OpenIn(w, c_doc);
+             w.item = MakeCounted<BytesItem>(std::string(2'000'000, 'n'));
+         },
+         Saving(Type::SessionTypeFull, false), save},
         {"incremental save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeIncremental, false), save},
         {"rewrite save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeRewrite, false), save},
         {"export save", StartState::Document, Opened(c_doc), Saving(Type::SessionTypeExport, false), save},
