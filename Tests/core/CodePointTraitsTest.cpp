@@ -3,9 +3,11 @@
 #include "libkernel/core/ConvertEnc.h"
 
 #include <algorithm>
+#include <array>
 #include <gtest/gtest.h>
 #include <memory>
 #include <random>
+#include <tuple>
 #include <unicode/uchar.h>
 #include <unicode/ustring.h>
 
@@ -50,6 +52,15 @@ StringT<Enc> Make(std::u32string const& text)
     return result;
 }
 
+// Calls for each of the three encodings.
+template <class Check>
+void InAllEncodings(Check const& check)
+{
+    check(TEncUtf8());
+    check(TEncUtf16());
+    check(TEncUtf32());
+}
+
 template <class Enc>
 void ExpectFinds(std::u32string const& text, std::u32string const& needle, size_t start)
 {
@@ -76,11 +87,11 @@ void ExpectFinds(std::u32string const& text, std::u32string const& needle, size_
               expected);
     ASSERT_EQ(matched, expectedLength);
 
-    bool const begins = SlowMatch(folded, 0, foldedNeedle) >= 0;
     bool ends = false;
     for (size_t at = 0; at < text.size(); ++at)
         ends |= SlowMatch(folded, at, foldedNeedle) == static_cast<int>(text.size() - at);
-    ASSERT_EQ(Traits::BeginsWithNoCase(exact.get(), all.GetLength(), wanted.GetData(), wanted.GetLength()), begins);
+    ASSERT_EQ(Traits::BeginsWithNoCase(exact.get(), all.GetLength(), wanted.GetData(), wanted.GetLength()),
+              SlowMatch(folded, 0, foldedNeedle) >= 0);
     ASSERT_EQ(Traits::EndsWithNoCase(exact.get(), all.GetLength(), wanted.GetData(), wanted.GetLength()), ends);
 }
 
@@ -99,9 +110,7 @@ TEST(CodePointTraitsTest, CaseBlindSearchAgreesWithFoldingEverything)
         for (char32_t& c : needle) c = letter(variety);
         size_t const start = text.empty() ? 0 : random() % (text.size() / 4 + 1);
         SCOPED_TRACE(round);
-        ExpectFinds<TEncUtf8>(text, needle, start);
-        ExpectFinds<TEncUtf16>(text, needle, start);
-        ExpectFinds<TEncUtf32>(text, needle, start);
+        InAllEncodings([&]<class Enc>(Enc) { ExpectFinds<Enc>(text, needle, start); });
         if (HasFatalFailure()) return;
     }
 }
@@ -124,42 +133,31 @@ TEST(CodePointTraitsTest, EveryCodePointIsFoundByItsFolding)
 
 TEST(CodePointTraitsTest, OrderWithoutCaseIsThatOfTheFoldings)
 {
-    struct Case
-    {
-        char const* a;
-        char const* b;
-        int order;
-    };
-    for (Case const& c : {Case{"Stra\u00DFe", "STRASSE", 0}, Case{"\u00DF", "s", 1}, Case{"s", "\u1E9E", -1},
-                          Case{"", "", 0}, Case{"", "a", -1}, Case{"a", "B", -1}, Case{"Z", "a", 1},
-                          Case{"\u00C9", "\u00E9", 0}, Case{"\u00E9", "z", 1}, Case{"\u03A3", "\u03C2", 0},
-                          Case{"[", "A", -1}, Case{"\U00010400", "\U00010428", 0}, Case{"\uFFFD", "\U00010400", -1}})
-    {
-        SCOPED_TRACE(c.a);
-        String8 const a(c.a), b(c.b);
-        String16 const wideA = ConvertedTo<TEncUtf16>(a), wideB = ConvertedTo<TEncUtf16>(b);
-        auto const sign = [](int order) { return (order > 0) - (order < 0); };
-        using Narrow = CharTraits<TEncUtf8>;
-        using Wide = CharTraits<TEncUtf16>;
-        EXPECT_EQ(sign(Narrow::CompareNoCase(c.a, a.GetLength(), c.b, b.GetLength())), c.order);
-        EXPECT_EQ(sign(Narrow::CompareNoCase(c.b, b.GetLength(), c.a, a.GetLength())), -c.order);
-        EXPECT_EQ(sign(Wide::CompareNoCase(wideA.GetData(), wideA.GetLength(), wideB.GetData(), wideB.GetLength())),
-                  c.order);
-    }
+    using Row = std::tuple<char32_t const*, char32_t const*, int>;
+    for (auto const& [first, second, order] :
+         {Row{U"Stra\u00DFe", U"STRASSE", 0}, Row{U"\u00DF", U"s", 1}, Row{U"s", U"\u1E9E", -1}, Row{U"", U"", 0},
+          Row{U"", U"a", -1}, Row{U"a", U"B", -1}, Row{U"Z", U"a", 1}, Row{U"\u00C9", U"\u00E9", 0},
+          Row{U"\u00E9", U"z", 1}, Row{U"\u03A3", U"\u03C2", 0}, Row{U"[", U"A", -1},
+          Row{U"\U00010400", U"\U00010428", 0}, Row{U"\uFFFD", U"\U00010400", -1}})
+        InAllEncodings([a = first, b = second, order = order]<class Enc>(Enc) {
+            StringT<Enc> const x = Make<Enc>(a), y = Make<Enc>(b);
+            auto const compare = [](StringT<Enc> const& l, StringT<Enc> const& r) {
+                int const n = CharTraits<Enc>::CompareNoCase(l.GetData(), l.GetLength(), r.GetData(), r.GetLength());
+                return (n > 0) - (n < 0);
+            };
+            EXPECT_EQ(compare(x, y), order);
+            EXPECT_EQ(compare(y, x), -order);
+        });
 }
 
-TEST(CodePointTraitsTest, MatchesCoverWholeCodePoints)
+TEST(CodePointTraitsTest, MatchesCoverWholeCodePointsFromAnyStart)
 {
-    using Traits = CharTraits<TEncUtf8>;
-    auto const find = [](String8 const& text, String8 const& needle, int start) {
-        return Traits::FindNoCase(text.GetData(), text.GetLength(), needle.GetData(), needle.GetLength(), start);
-    };
-    EXPECT_EQ(find("Wei\u00DFbier", "s", 0), -1);
-    EXPECT_EQ(find("Wei\u00DFbier", "isS", 0), -1 + 3);
-    EXPECT_EQ(find("\uFB01n", "in", 0), -1);
-    EXPECT_EQ(find("ab", "", 1), 1);
-    EXPECT_EQ(find("ab", "", 3), -1);
-    EXPECT_EQ(find("aA", "A", -5), 0);
+    using Row = std::tuple<String8, String8, int, int>;
+    for (auto const& [text, needle, start, found] : {Row{"Wei\u00DFbier", "s", 0, -1}, Row{"\uFB01n", "in", 0, -1},
+                                                     Row{"ab", "", 1, 1}, Row{"ab", "", 3, -1}, Row{"aA", "A", -5, 0}})
+        EXPECT_EQ(CharTraits<TEncUtf8>::FindNoCase(text.GetData(), text.GetLength(), needle.GetData(),
+                                                   needle.GetLength(), start),
+                  found);
 }
 
 TEST(CodePointTraitsTest, CutTextIsReadToItsEndOnly)
@@ -184,51 +182,38 @@ TEST(CodePointTraitsTest, CutTextIsReadToItsEndOnly)
 
 TEST(CodePointTraitsTest, FindAnyOfGivesTheUnitsOfTheFirstMember)
 {
-    struct Case
-    {
-        char32_t const* text;
-        char32_t const* set;
-        int start;
-        IndexRange in8, in16, in32;
-    };
-    for (Case const& c :
-         {Case{U"a\u20ACb", U"b\u20AC", 0, {1, 3}, {1, 1}, {1, 1}},
-          Case{U"a\U0001F600", U"\U0001F600", 0, {1, 4}, {1, 2}, {1, 1}},
-          Case{U"abcab", U"ab", 2, {3, 1}, {3, 1}, {3, 1}},
-          Case{U"\u00E9", U"\u00C3\u00A9", 0, {-1, 0}, {-1, 0}, {-1, 0}},
-          Case{U"a", U"\u0161", 0, {-1, 0}, {-1, 0}, {-1, 0}}, // Equal low bits.
-          Case{U"abc", U"", 0, {-1, 0}, {-1, 0}, {-1, 0}}, Case{U"", U"a", 0, {-1, 0}, {-1, 0}, {-1, 0}}})
-    {
-        auto const check = [&]<class Enc>(Enc, IndexRange expected) {
-            StringT<Enc> const text = Make<Enc>(c.text), set = Make<Enc>(c.set);
-            String32 const points = Make<TEncUtf32>(c.set);
-            using Traits = CharTraits<Enc>;
-            EXPECT_EQ(Traits::FindAnyOf(text.GetData(), text.GetLength(), set.GetData(), set.GetLength(), c.start),
-                      expected);
-            EXPECT_EQ(
-                Traits::FindAnyOf(text.GetData(), text.GetLength(), points.GetData(), points.GetLength(), c.start),
-                expected);
-        };
-        check(TEncUtf8(), c.in8);
-        check(TEncUtf16(), c.in16);
-        check(TEncUtf32(), c.in32);
-    }
+    using Row = std::tuple<char32_t const*, char32_t const*, int,
+                           std::array<IndexRange, 5>>; // The place by the size of a unit.
+    IndexRange const none(-1, 0);
+    for (auto const& [in, members, from, places] :
+         {Row{U"a\u20ACb", U"b\u20AC", 0, {{{}, {1, 3}, {1, 1}, {}, {1, 1}}}},
+          Row{U"a\U0001F600", U"\U0001F600", 0, {{{}, {1, 4}, {1, 2}, {}, {1, 1}}}},
+          Row{U"abcab", U"ab", 2, {{{}, {3, 1}, {3, 1}, {}, {3, 1}}}},
+          Row{U"\u00E9", U"\u00C3\u00A9", 0, {{{}, none, none, {}, none}}},
+          Row{U"a", U"\u0161", 0, {{{}, none, none, {}, none}}}, // Equal low bits.
+          Row{U"abc", U"", 0, {{{}, none, none, {}, none}}}, Row{U"", U"a", 0, {{{}, none, none, {}, none}}}})
+        InAllEncodings([a = in, b = members, start = from, expected = places]<class Enc>(Enc) {
+            StringT<Enc> const text = Make<Enc>(a), set = Make<Enc>(b);
+            String32 const points = Make<TEncUtf32>(b);
+            auto const find = [&](auto const& any) {
+                return CharTraits<Enc>::FindAnyOf(text.GetData(), text.GetLength(), any.GetData(), any.GetLength(),
+                                                  start);
+            };
+            EXPECT_EQ(find(set), expected[sizeof(typename Enc::Unit)]);
+            EXPECT_EQ(find(points), expected[sizeof(typename Enc::Unit)]);
+        });
 }
 
 TEST(CodePointTraitsTest, ReversalKeepsEachCodePointWhole)
 {
     std::u32string const text = U"a\u00E9\u20AC\U0001F600z";
-    std::u32string const backward(text.rbegin(), text.rend());
-    auto const check = [&]<class Enc>(Enc) {
+    InAllEncodings([&]<class Enc>(Enc) {
         StringT<Enc> const from = Make<Enc>(text);
         typename Enc::Unit* to;
         StringT<Enc> reversed(from.GetLength(), to);
         CharTraits<Enc>::Reverse(to, from.GetData(), from.GetLength());
-        EXPECT_TRUE(reversed == Make<Enc>(backward));
-    };
-    check(TEncUtf8());
-    check(TEncUtf16());
-    check(TEncUtf32());
+        EXPECT_TRUE(reversed == Make<Enc>(std::u32string(text.rbegin(), text.rend())));
+    });
 }
 
 } // namespace

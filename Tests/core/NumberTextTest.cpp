@@ -66,55 +66,33 @@ TEST(NumberTextTest, EveryStyleAndWidthReadsByTheRules)
 
 TEST(NumberTextTest, EveryWidthShowsItsLimits)
 {
-    EXPECT_EQ(ToString(static_cast<char>(-128)), "-128");
-    EXPECT_EQ(ToString(u8{255}), "255");
-    EXPECT_EQ(ToString(static_cast<short>(-32768)), "-32768");
-    EXPECT_EQ(ToString(u16{65535}), "65535");
-    EXPECT_EQ(ToString(INT32_MIN), "-2147483648");
-    EXPECT_EQ(ToString(UINT32_MAX), "4294967295");
-    EXPECT_EQ(ToString(INT64_MIN), "-9223372036854775808");
-    EXPECT_EQ(ToString(UINT64_MAX), "18446744073709551615");
-    EXPECT_EQ(ToString(std::numeric_limits<long>::min()), "-9223372036854775808");
-    EXPECT_EQ(ToString(std::numeric_limits<unsigned long>::max()), "18446744073709551615");
-    EXPECT_EQ(ToString(std::numeric_limits<long long>::max()), "9223372036854775807");
-    EXPECT_EQ(ToString(std::numeric_limits<unsigned long long>::max()), "18446744073709551615");
+    auto const check = []<class T>(T) {
+        EXPECT_EQ(ToString(std::numeric_limits<T>::min()), std::to_string(std::numeric_limits<T>::min()).c_str());
+        EXPECT_EQ(ToString(std::numeric_limits<T>::max()), std::to_string(std::numeric_limits<T>::max()).c_str());
+    };
+    std::apply(
+        [&](auto... n) { (check(n), ...); },
+        std::tuple<char, u8, short, u16, int, u32, i64, u64, long, unsigned long, long long, unsigned long long>());
     EXPECT_EQ(ToStringNumber(INT64_MIN), "-9,223,372,036,854,775,808");
     EXPECT_EQ(ToStringT<String16>(-12), u"-12");
     unsigned int const wide[] = {'1', ',', '2', '3', '4', 0};
     EXPECT_EQ(ToStringTNumber<String32>(1234), wide);
 }
 
-TEST(NumberTextTest, SignsAndGroups)
+// One of each rule, which the slow reading may have wrong in the same way.
+TEST(NumberTextTest, SignsGroupsAndFieldsReadAsPromised)
 {
-    using Row = std::tuple<i64, SignStyle, CharacterGrouping const*, char const*>;
-    for (auto const& [value, sign, grouping, expected] :
-         {Row{1234567, SignStyle::None, CharacterGroupingNumber(), "1,234,567"},
-          Row{100, SignStyle::None, CharacterGroupingNumber(), "100"}, Row{0, SignStyle::None, nullptr, "0"},
-          Row{0, SignStyle::Plus, nullptr, "+0"}, Row{0, SignStyle::Space, nullptr, " 0"},
-          Row{-7, SignStyle::Plus, nullptr, "-7"}, Row{12345, SignStyle::None, CharacterGroupingHexBytes(), "1 23 45"},
-          Row{123456789, SignStyle::None, CharacterGroupingHexWords(), "1 2345 6789"}})
-    {
-        SCOPED_TRACE(expected);
-        EXPECT_EQ(ToString(value, sign, grouping), expected);
-    }
-}
-
-TEST(NumberTextTest, FieldsAreFilled)
-{
-    constexpr auto left = PadStyle::SpacesLeft;
-    constexpr auto zeros = PadStyle::ZerosLeft;
-    constexpr auto right = PadStyle::SpacesRight;
-    using Row = std::tuple<int, int, PadStyle, SignStyle, bool, char const*>;
-    for (auto const& [value, width, pad, sign, grouped, expected] :
-         {Row{-5, 6, zeros, SignStyle::None, false, "-00005"}, Row{-5, 6, left, SignStyle::None, false, "    -5"},
-          Row{-5, 6, right, SignStyle::None, false, "-5    "}, Row{7, -9, zeros, SignStyle::None, false, "7"},
-          Row{123456, 3, left, SignStyle::None, false, "123456"},
-          Row{1234, 9, zeros, SignStyle::None, true, "0,001,234"},
-          Row{1234, 8, zeros, SignStyle::None, true, "0001,234"}, Row{-123, 5, zeros, SignStyle::None, true, "-0123"}})
-    {
-        SCOPED_TRACE(expected);
-        EXPECT_EQ(ToStringPadded(value, width, pad, sign, grouped ? CharacterGroupingNumber() : nullptr), expected);
-    }
+    EXPECT_EQ(ToString(0, SignStyle::Plus), "+0");
+    EXPECT_EQ(ToString(0, SignStyle::Space), " 0");
+    EXPECT_EQ(ToString(12345, SignStyle::None, CharacterGroupingHexBytes()), "1 23 45");
+    EXPECT_EQ(ToString(123456789, SignStyle::None, CharacterGroupingHexWords()), "1 2345 6789");
+    using Row = std::tuple<int, int, PadStyle, bool, char const*>;
+    for (auto const& [value, width, pad, grouped, expected] :
+         {Row{-5, 6, PadStyle::ZerosLeft, false, "-00005"}, Row{-5, 6, PadStyle::SpacesLeft, false, "    -5"},
+          Row{-5, 6, PadStyle::SpacesRight, false, "-5    "}, Row{7, -9, PadStyle::ZerosLeft, false, "7"},
+          Row{1234, 9, PadStyle::ZerosLeft, true, "0,001,234"}, Row{1234, 8, PadStyle::ZerosLeft, true, "0001,234"}})
+        EXPECT_EQ(ToStringPadded(value, width, pad, SignStyle::None, grouped ? CharacterGroupingNumber() : nullptr),
+                  expected);
     EXPECT_EQ(ToStringPadded(5u, 3, PadStyle::ZerosLeft), "005");
 }
 

@@ -1,6 +1,7 @@
 #include "libkernel/core/StringConverter.h"
 
 #include "libkernel/core/ConvertEnc.h"
+#include "support/Rows.h"
 #include "support/TempFolder.h"
 
 #include <cstring>
@@ -32,15 +33,11 @@ TEST(StringConverter, EveryRoadGivesTheSameText)
         EXPECT_EQ(EncodedToUtf16(bytes.c_str(), charset), ConvertedTo<TEncUtf16>(String8(text)));
         EXPECT_STREQ(Utf8ToEncoded(text, charset).get(), bytes.c_str());
     }
+    StringConverter again("ISO-2022-JP");
+    EXPECT_EQ(again.Convert("\x1B$B$\""), "\u3042"); // Left in the Japanese set.
+    EXPECT_EQ(again.Convert("a"), "a");
     auto const wide = Utf8ToEncoded("a", "UTF-32BE");
     EXPECT_EQ(std::string(wide.get(), 8), "\0\0\0a\0\0\0\0"s);
-}
-
-TEST(StringConverter, OneConverterServesManyTexts)
-{
-    StringConverter converter("ISO-2022-JP");
-    EXPECT_EQ(converter.Convert("\x1B$B$\""), "\u3042"); // Left in the Japanese set.
-    EXPECT_EQ(converter.Convert("a"), "a");
 }
 
 TEST(StringConverter, SurrogatesWithoutPartnerAreReplaced)
@@ -67,24 +64,17 @@ TEST(StringConverter, UnknownCharsetsAndCutTextsHaveTheirAnswers)
 
 TEST(StringConverter, EachByteKnowsItsUnit)
 {
-    struct
-    {
-        char const* charset;
-        char const* text;
-        std::string bytes;
-        std::vector<int> sources;
-    } const cases[] = {
+    std::vector<char> bytes{'x'};
+    std::vector<int> sources{1};
+    Rows<char const*, String8, std::string, std::vector<int>> const cases = {
         {"windows-1252", "a\u20ACb", "a\200b", {0, 1, 2}},
         {"Shift_JIS", "a\u3042b", "a\x82\240b", {0, 1, 1, 2}},
         {"UTF-8", "\U0001F600b", "\U0001F600b", {0, 0, 0, 0, 2}},
-        {"windows-1252", "", "", {}},
-    };
-    std::vector<char> bytes{'x'};
-    std::vector<int> sources{1};
-    for (auto const& c : cases) {
-        EXPECT_TRUE(Utf16ToEncoded(bytes, sources, ConvertedTo<TEncUtf16>(String8(c.text)), c.charset));
-        EXPECT_EQ(std::string(bytes.begin(), bytes.end()), c.bytes);
-        EXPECT_EQ(sources, c.sources);
+        {"windows-1252", "", "", {}}};
+    for (auto const& [charset, text, encoded, places] : cases) {
+        EXPECT_TRUE(Utf16ToEncoded(bytes, sources, ConvertedTo<TEncUtf16>(text), charset));
+        EXPECT_EQ(std::string(bytes.begin(), bytes.end()), encoded);
+        EXPECT_EQ(sources, places);
     }
     EXPECT_FALSE(Utf16ToEncoded(bytes, sources, String16(u"a"), "no such"));
     EXPECT_TRUE(bytes.empty() && sources.empty());

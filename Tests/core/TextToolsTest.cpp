@@ -22,23 +22,18 @@ TEST(TextToolsTest, LineEndsOfEverySortBecomeOneLineFeed)
 
 TEST(TextToolsTest, WordsAreCutBehindTheLastOneWanted)
 {
-    struct Case
+    using Row = std::tuple<String8, int, bool, char const*>;
+    for (auto const& [whole, count, ellipsis, cut] :
+         {Row{"one two three", 2, false, "one two"}, Row{"one two three", 2, true, "one two\u2026"},
+          Row{"one two", 2, true, "one two"}, Row{"one two ", 2, true, "one two\u2026"},
+          Row{"one two three", 0, true, "one two three"}, Row{"one two", -1, true, "one two"},
+          Row{"  one\t\ntwo  x", 2, false, "  one\t\ntwo"}, Row{"\u00E9\u00E9\u2003b", 1, false, "\u00E9\u00E9"},
+          Row{"a\u00A0b", 1, true, "a\u2026"}, Row{"", 1, true, ""}, Row{"   ", 1, true, "   "},
+          Row{"a\xE2\x80", 1, true, "a\xE2\x80"}})
     {
-        char const* text;
-        int count;
-        bool ellipsis;
-        char const* cut;
-    };
-    for (Case const& c : {Case{"one two three", 2, false, "one two"}, Case{"one two three", 2, true, "one two\u2026"},
-                          Case{"one two", 2, true, "one two"}, Case{"one two ", 2, true, "one two\u2026"},
-                          Case{"one two three", 0, true, "one two three"}, Case{"one two", -1, true, "one two"},
-                          Case{"  one\t\ntwo  x", 2, false, "  one\t\ntwo"},
-                          Case{"\u00E9\u00E9\u2003b", 1, false, "\u00E9\u00E9"}, Case{"a\u00A0b", 1, true, "a\u2026"},
-                          Case{"", 1, true, ""}, Case{"   ", 1, true, "   "}, Case{"a\xE2\x80", 1, true, "a\xE2\x80"}})
-    {
-        String8 text(c.text);
-        ApplyMaxWordCount(text, c.count, c.ellipsis);
-        EXPECT_EQ(text, c.cut) << c.text << c.count;
+        String8 text(whole);
+        ApplyMaxWordCount(text, count, ellipsis);
+        EXPECT_EQ(text, cut) << count;
     }
 }
 

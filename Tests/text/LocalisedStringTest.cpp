@@ -3,6 +3,7 @@
 #include "libkernel/serialisation/FutureVersionException.h"
 #include "libkernel/serialisation/InSerialiserFile.h"
 #include "libkernel/text/StringLocaliser.h"
+#include "support/Rows.h"
 #include "text/TextSaving.h"
 
 namespace Kernel::Test {
@@ -72,32 +73,20 @@ TEST_F(LocalisedStringTest, SavedPropertiesFollowTheKindOfText)
     shown.ToString();
     StringLocaliser::GetInstance().SetLocalisationSink(nullptr);
     same.ToString();
-    struct
-    {
-        char const* what;
-        LocalisedString text;
-        char const* list;
-    } const cases[] = {
+    Rows<char const*, LocalisedString, char const*> const cases = {
         {"fake", Fake("oar"), "2B [LStr] 03000000 'oar' 00"},
         {"not shown", Make("sail"), "2B [Str_] 04000000 'sail' 2B [Ctxt] 04000000 'Boat' 00"},
         {"shown", shown, "2B [Str_] 04000000 'sail' 2B [Ctxt] 04000000 'Boat' 2B [LStr] 05000000 'voile' 00"},
         {"shown as it is", same, "2B [Str_] 04000000 'keel' 2B [Ctxt] 04000000 'Boat' 00"},
         {"empty", LocalisedString(), "2B [Str_] 00000000 2B [Ctxt] 00000000 00"},
     };
-    for (auto const& c : cases)
-        EXPECT_EQ(Show(SaveList([&](OutSerialiser& out) { c.text.Save(out); })), Show(Bytes(c.list))) << c.what;
+    for (auto const& [what, text, list] : cases)
+        EXPECT_EQ(Show(SaveList([&text = text](OutSerialiser& out) { text.Save(out); })), Show(Bytes(list))) << what;
 }
 
 TEST_F(LocalisedStringTest, RunningLanguageWinsOverTheStoredOne)
 {
-    struct
-    {
-        char const* what;
-        std::map<char const*, char const*> stored;
-        bool loads;
-        char const* base;
-        char const* text;
-    } const cases[] = {
+    Rows<char const*, std::map<char const*, char const*>, bool, char const*, char const*> const cases = {
         {"fake", {{"LStr", "oar"}}, true, "", "oar"},
         {"no stored text", {{"Str_", "sail"}, {"Ctxt", "Boat"}}, true, "sail", "voile"},
         {"stored text", {{"Str_", "sail"}, {"Ctxt", "Boat"}, {"LStr", "Segel"}}, true, "sail", "voile"},
@@ -107,15 +96,15 @@ TEST_F(LocalisedStringTest, RunningLanguageWinsOverTheStoredOne)
         {"context and text lost", {{"Str_", "sail"}}, false, "was", "Boat|was"},
         {"nothing", {}, false, "was", "Boat|was"},
     };
-    for (auto const& c : cases) {
-        auto const list = Parsed([&](OutSerialiser& out) {
-            for (auto const& [tag, value] : c.stored) out.SaveType(TagOf(tag), value);
+    for (auto const& [what, stored, loads, base, shown] : cases) {
+        auto const list = Parsed([&stored = stored](OutSerialiser& out) {
+            for (auto const& [tag, value] : stored) out.SaveType(TagOf(tag), value);
         });
         LocalisedString text = Make("was");
         text.ToString();
-        EXPECT_EQ(text.Load(*list, LocalisedString::GetClassUID(), 1), c.loads) << c.what;
-        EXPECT_EQ(text.GetBaseString(), c.base) << c.what;
-        EXPECT_EQ(text.ToString(), c.text) << c.what;
+        EXPECT_EQ(text.Load(*list, LocalisedString::GetClassUID(), 1), loads) << what;
+        EXPECT_EQ(text.GetBaseString(), base) << what;
+        EXPECT_EQ(text.ToString(), shown) << what;
     }
 }
 

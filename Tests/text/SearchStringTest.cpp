@@ -1,6 +1,7 @@
 #include "libkernel/text/SearchString.h"
 
 #include <gtest/gtest.h>
+#include <tuple>
 
 namespace Kernel {
 namespace {
@@ -14,24 +15,18 @@ TEST(SearchStringTest, TextIsSplitAtRunsOfBlanks)
 
 TEST(SearchStringTest, TokensMatchInOrderWithoutOverlap)
 {
-    struct Case
-    {
-        char const* search;
-        bool flag;
-        char const* text;
-        u64 found;
-    };
-    for (Case const& c :
-         {Case{"b a", false, "ab", 1}, Case{"a b", false, "ab", 2}, Case{"aa aa", false, "aaa", 1},
-          Case{"A", false, "a", 0}, Case{"A", true, "a", 1}, Case{"strasse WEG", true, "Stra\u00DFe: weg", 2},
+    using Row = std::tuple<char const*, bool, char const*, u64>;
+    for (auto const& [tokens, flag, text, found] :
+         {Row{"b a", false, "ab", 1}, Row{"a b", false, "ab", 2}, Row{"aa aa", false, "aaa", 1},
+          Row{"A", false, "a", 0}, Row{"A", true, "a", 1}, Row{"strasse WEG", true, "Stra\u00DFe: weg", 2},
           // The match is shorter than its token, then longer.
-          Case{"sss s", true, "\u00DFss", 2}, Case{"\u00DF s", true, "ss", 1}, Case{"\u1E9E s", true, "ss-s", 2},
-          Case{"", true, "any", 0}})
+          Row{"sss s", true, "\u00DFss", 2}, Row{"\u00DF s", true, "ss", 1}, Row{"\u1E9E s", true, "ss-s", 2},
+          Row{"", true, "any", 0}})
     {
-        SCOPED_TRACE(c.search);
-        SearchString const search(c.search, c.flag);
-        EXPECT_EQ(search.TestSubset(c.text, 0), c.found);
-        EXPECT_EQ(search.Test(c.text), c.found == search.GetTokens().size());
+        SCOPED_TRACE(tokens);
+        SearchString const search(tokens, flag);
+        EXPECT_EQ(search.TestSubset(text, 0), found);
+        EXPECT_EQ(search.Test(text), found == search.GetTokens().size());
     }
 }
 

@@ -1,5 +1,7 @@
 #include "libkernel/text/StringParser.h"
 
+#include "support/Rows.h"
+
 #include <gtest/gtest.h>
 
 namespace Kernel {
@@ -7,15 +9,7 @@ namespace {
 
 TEST(StringParserTest, NumbersReadAsTheLanguageWritesThem)
 {
-    struct
-    {
-        char const* language;
-        char const* text;
-        bool parsed;
-        double number;
-        bool isLong;
-        long whole;
-    } const cases[] = {
+    Rows<char const*, char const*, bool, double, bool, long> const cases = {
         {"en-US", "1,234.5", true, 1234.5, true, 1234},
         {"de-DE", "1.234,5", true, 1234.5, true, 1234},
         {"de-DE", "-7", true, -7.0, true, -7},
@@ -26,15 +20,15 @@ TEST(StringParserTest, NumbersReadAsTheLanguageWritesThem)
         {"en-US", "", false, 0.0, false, 0},
         {"en-US", "\xFF\xFE", false, 0.0, false, 0},
     };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.text);
-        Counted<Locale const> const locale = Locale::Create(c.language);
+    for (auto const& [language, text, parsed, expected, isLong, expectedLong] : cases) {
+        SCOPED_TRACE(text);
+        Counted<Locale const> const locale = Locale::Create(language);
         double number = 99.0;
-        EXPECT_EQ(StringParser::ParseAsDouble(c.text, locale, number), c.parsed);
-        EXPECT_EQ(number, c.parsed ? c.number : 99.0);
+        EXPECT_EQ(StringParser::ParseAsDouble(text, locale, number), parsed);
+        EXPECT_EQ(number, parsed ? expected : 99.0);
         long whole = 99;
-        EXPECT_EQ(StringParser::ParseAsLong(c.text, locale, whole), c.isLong);
-        EXPECT_EQ(whole, c.isLong ? c.whole : 99);
+        EXPECT_EQ(StringParser::ParseAsLong(text, locale, whole), isLong);
+        EXPECT_EQ(whole, isLong ? expectedLong : 99);
     }
     double number;
     EXPECT_TRUE(StringParser::ParseAsDouble("5", nullptr, number)) << "the user's own language";
