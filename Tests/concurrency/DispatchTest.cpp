@@ -124,12 +124,15 @@ TEST(Dispatch, EveryForgottenJobRunsOnceOnAnotherThreadWhateverItsPriority)
     ::sched_setaffinity(0, sizeof one, &one);
 
     std::pair<int, int> const jobs[] = {{0, 30}, {2, 20}, {7, 21}, {3, 10}, {1, 31}, {2, 22}, {3, 11}, {0, 32}};
+    std::atomic<bool> busy{false};
     std::atomic<bool> queued{false};
     std::atomic<size_t> ran{0};
     int order[std::size(jobs)] = {};
     Dispatch::DispatchAndForget([&] {
+        busy = true;
         while (!queued) std::this_thread::yield();
     });
+    while (!busy) std::this_thread::yield();
     for (auto const& [priority, number] : jobs)
         Dispatch::DispatchAndForget(
             [&, number = number] {
@@ -260,7 +263,7 @@ TEST(DispatchScope, LoopBeginsAndEndsAroundEveryIndexInTheOrderOfRegistration)
 void (*s_sunkFunction)(void*) = nullptr;
 void* s_sunkContext = nullptr;
 
-TEST(Dispatch, MainThreadIsReachedThroughTheSink)
+TEST(Dispatch, MainThreadIsReachedThroughTheSinkAndThreadsHaveTheirOwnPurpose)
 {
     int runs = 0;
     Dispatch::DispatchOnMainThread([&] { ++runs; }); // No sink: dropped.
@@ -270,8 +273,14 @@ TEST(Dispatch, MainThreadIsReachedThroughTheSink)
         s_sunkFunction = function;
         s_sunkContext = context;
     });
+    Dispatch::SetCurrentThreadPurpose(static_cast<Purpose>(9));
+    std::thread([] {
+        EXPECT_FALSE(Dispatch::IsMainThread());
+        EXPECT_EQ(Purpose::None, Dispatch::GetCurrentThreadPurpose());
+    }).join();
     EXPECT_TRUE(Dispatch::IsMainThread());
-    std::thread([] { EXPECT_FALSE(Dispatch::IsMainThread()); }).join();
+    EXPECT_EQ(static_cast<Purpose>(9), Dispatch::GetCurrentThreadPurpose());
+    Dispatch::SetCurrentThreadPurpose(Purpose::None);
     Dispatch::DispatchOnMainThread([&] { ++runs; });
     EXPECT_EQ(0, runs);
     s_sunkFunction(s_sunkContext);
@@ -283,12 +292,8 @@ TEST(Dispatch, MainThreadIsReachedThroughTheSink)
     Dispatch::SetMainThreadId(0);
 }
 
-TEST(Dispatch, PurposeBelongsToTheThreadAndSleepGoesThroughTheClock)
+TEST(Dispatch, SleepGoesThroughTheClock)
 {
-    Dispatch::SetCurrentThreadPurpose(static_cast<Purpose>(9));
-    std::thread([] { EXPECT_EQ(Purpose::None, Dispatch::GetCurrentThreadPurpose()); }).join();
-    EXPECT_EQ(static_cast<Purpose>(9), Dispatch::GetCurrentThreadPurpose());
-    Dispatch::SetCurrentThreadPurpose(Purpose::None);
     TestSupport::FakeClock clock;
     Dispatch::Sleep(1000);
     Dispatch::Yield(Dispatch::YieldPolicy::Default);

@@ -75,52 +75,34 @@ TEST(BasicProgressReporter, ValuesAreCutAndEachCallTells)
     }
 }
 
-TEST(CounterProgressReporter, FractionFollowsCountAndSubProgress)
+TEST(CounterProgressReporter, FractionFollowsCountAndSubProgressAndOnlyRealChangesTell)
 {
     auto const counter = MakeCounted<CounterProgressReporter>();
-    EXPECT_EQ(0.0, counter->GetProgress());
-    counter->Init(0);
     counter->Finalise();
-    EXPECT_EQ(0.0, counter->GetProgress());
-
-    counter->Init(10);
-    counter->Set(3);
-    counter->SetSubProgress(0.5);
-    EXPECT_DOUBLE_EQ(0.35, counter->GetProgress());
-    counter->SetSubProgress(7.0);
-    EXPECT_EQ(7.0, counter->GetSubProgress());
-    EXPECT_DOUBLE_EQ(0.4, counter->GetProgress());
-    counter->Increment();
-    EXPECT_EQ(0.0, counter->GetSubProgress());
-    EXPECT_DOUBLE_EQ(0.4, counter->GetProgress());
-    counter->Finalise();
-    EXPECT_EQ(1.0, counter->GetProgress());
-    counter->Increment();
-    EXPECT_EQ(11u, counter->GetCount());
-    EXPECT_EQ(1.0, counter->GetProgress());
-    counter->Set(~u64{0});
-    EXPECT_EQ(1.0, counter->GetProgress());
-}
-
-TEST(CounterProgressReporter, OnlyRealChangesTell)
-{
-    auto const counter = MakeCounted<CounterProgressReporter>(10);
+    EXPECT_EQ(0.0, counter->GetProgress()) << "the end of nothing";
     auto const shown = MakeCounted<Shown>(counter);
-    Rows<char const*, std::function<void()>, int> const cases = {
-        {"init without a count", [&] { counter->Init(4); }, 0},
-        {"sub-progress unchanged", [&] { counter->SetSubProgress(0.0); }, 0},
-        {"sub-progress", [&] { counter->SetSubProgress(0.5); }, 1},
-        {"the same again", [&] { counter->SetSubProgress(0.5); }, 1},
-        {"increment", [&] { counter->Increment(); }, 2},
-        {"set to the same count", [&] { counter->Set(1); }, 3},
-        {"finalise", [&] { counter->Finalise(); }, 4},
-        {"sub-progress behind the end", [&] { counter->SetSubProgress(0.7); }, 4},
-        {"init with a count", [&] { counter->Init(4); }, 5},
+    Rows<char const*, std::function<void()>, double, int> const steps = {
+        {"init without a count", [&] { counter->Init(10); }, 0.0, 0},
+        {"sub-progress unchanged", [&] { counter->SetSubProgress(0.0); }, 0.0, 0},
+        {"set", [&] { counter->Set(3); }, 0.3, 1},
+        {"set to the same count", [&] { counter->Set(3); }, 0.3, 2},
+        {"sub-progress", [&] { counter->SetSubProgress(0.5); }, 0.35, 3},
+        {"the same again", [&] { counter->SetSubProgress(0.5); }, 0.35, 3},
+        {"more than a step", [&] { counter->SetSubProgress(7.0); }, 0.4, 4},
+        {"increment", [&] { counter->Increment(); }, 0.4, 5},
+        {"finalise", [&] { counter->Finalise(); }, 1.0, 6},
+        {"sub-progress behind the end", [&] { counter->SetSubProgress(0.7); }, 1.0, 6},
+        {"past the end", [&] { counter->Increment(); }, 1.0, 7},
+        {"far past it", [&] { counter->Set(~u64{0}); }, 1.0, 8},
+        {"init with a count", [&] { counter->Init(4); }, 0.0, 9},
     };
-    for (auto const& [what, act, calls] : cases) {
+    for (auto const& [what, act, progress, calls] : steps) {
         act();
+        EXPECT_DOUBLE_EQ(progress, counter->GetProgress()) << what;
         EXPECT_EQ(calls, shown->calls) << what;
     }
+    EXPECT_EQ(0u, counter->GetCount());
+    EXPECT_EQ(0.0, counter->GetSubProgress());
 }
 
 TEST(ParallelProgressReporter, GivesTheWeightedMean)
@@ -168,20 +150,15 @@ TEST(SequenceProgressReporter, ItemsBeforeTheCurrentOneCountInFull)
     EXPECT_FALSE(sequence->ItemComplete());
     EXPECT_EQ(1.0, sequence->GetProgress());
     EXPECT_EQ(2, shown->calls);
+    Counted<SequenceProgressReporter> const weighted(new SequenceProgressReporter{1.0f, 2.0f, 1.0f});
+    auto const work = MakeCounted<BasicProgressReporter>();
+    weighted->BeginItemAtIndex(2)->SetReporter(work);
+    work->SetProgress(0.5);
+    EXPECT_EQ(0.875, weighted->GetProgress());
+    weighted->BeginItemAtIndex(0);
+    EXPECT_EQ(0.125, weighted->GetProgress()) << "a later item counts its own progress";
     EXPECT_EQ(0.0, MakeCounted<SequenceProgressReporter>()->GetProgress());
     EXPECT_EQ(1.0, MakeCounted<SequenceProgressReporter>(std::vector<float>{0.0f})->GetProgress());
-}
-
-TEST(SequenceProgressReporter, LaterItemsCountTheirOwnProgress)
-{
-    SequenceProgressReporter* const made = new SequenceProgressReporter{1.0f, 2.0f, 1.0f};
-    Counted<SequenceProgressReporter> const sequence(made);
-    auto const work = MakeCounted<BasicProgressReporter>();
-    sequence->BeginItemAtIndex(2)->SetReporter(work);
-    work->SetProgress(0.5);
-    EXPECT_EQ(0.875, sequence->GetProgress());
-    sequence->BeginItemAtIndex(0);
-    EXPECT_EQ(0.125, sequence->GetProgress());
 }
 
 TEST(SequenceProgressReporter, UnknownItemsChangeNothing)

@@ -192,14 +192,19 @@ TEST(BaseCharTraitsTest, TrimmingTouchesNothingOutsideTheUnitsGiven)
     EXPECT_STREQ(text, "a");
 }
 
-TEST(BaseCharTraitsTest, FindingStaysInsideTheText)
+TEST(BaseCharTraitsTest, FindingStaysInsideTheTextAndAgreesWithTheStandardLibrary)
 {
-    using Row = std::tuple<char const*, int, int>;
-    for (auto const& [needle, start, found] :
-         {Row{"ab", 0, 0}, Row{"ab", 1, 3}, Row{"ab", -5, 0}, Row{"ab", 4, -1}, Row{"abc", 0, 3}, Row{"abcd", 0, -1},
-          Row{"", 6, 6}, Row{"", 7, -1}, Row{"c", 9, -1}})
-        // The text ends before the "d".
-        EXPECT_EQ(Chars::Find("ab-abcd", 6, needle, Chars::GetLength(needle), start), found) << needle;
+    std::string_view const whole = "abracadabra abcabcabd";
+    for (int length = 0; length <= 21; ++length)
+        for (std::string_view const needle :
+             {"a", "abr", "abcabd", "z", "abracadabra abcabcabd", "abracadabra abcabcabdx", "", "d"})
+            for (int start = -1; start <= length + 1; ++start) {
+                size_t const found =
+                    whole.substr(0, static_cast<size_t>(length)).find(needle, static_cast<size_t>(std::max(start, 0)));
+                EXPECT_EQ(Chars::Find(whole.data(), length, needle.data(), static_cast<int>(needle.size()), start),
+                          found == needle.npos ? -1 : static_cast<int>(found))
+                    << needle << start;
+            }
 }
 
 } // namespace
