@@ -259,30 +259,6 @@ TEST(OutSerialiserItems, AlignedDataIsPaddedWithZeros)
     EXPECT_EQ(Show(ReadAndSave(padded)), Show(Bytes("2D [Data] 01 00 00 00 | AA | 00")));
 }
 
-std::string Number(u32 value)
-{
-    return std::string(reinterpret_cast<char const*>(&value), 4);
-}
-
-TEST(OutSerialiserItems, BlocksLargerThanTheBufferKeepTheirPlace)
-{
-    std::string expected;
-    std::string const list = SaveList([&](OutSerialiser& out) {
-        for (u32 i = 0; i < 40; ++i) {
-            std::string const block(i * 1500, static_cast<char>('a' + i % 26));
-            out.SaveRawData(IDTag(i + 1), block.data(), block.size());
-            u32 const size = static_cast<u32>(block.size());
-            expected += '\x2D';
-            expected += Number(i + 1) + Number(size);
-            expected += block;
-        }
-        std::vector<bool> const bits(100000, true);
-        out.SaveTypes("Bits", bits);
-    });
-    expected += Bytes("A9 [Bits] A0 86 01 00") + std::string(12500, '\xFF') + '\0';
-    EXPECT_TRUE(list == expected);
-}
-
 TEST(OutSerialiserItems, DataStreamHoldsUntaggedValuesInOrder)
 {
     u8 const raw[] = {0xAB};

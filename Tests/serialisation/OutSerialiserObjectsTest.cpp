@@ -1,75 +1,11 @@
-#include "libkernel/core/Hash.h"
-#include "libkernel/serialisation/CompareContext.h"
 #include "serialisation/WriterTestSupport.h"
 
 namespace KernelTest {
 namespace {
 
-/// An object whose properties and description the test gives.
-class Thing : public Serialisable
-{
-public:
-    explicit Thing(ClassProperties const* description, SaveFunction save = {})
-        : m_description(description), m_save(std::move(save))
-    {
-    }
-    void Save(OutSerialiser& out) const override
-    {
-        if (m_save) m_save(out);
-    }
-    bool Load(InSerialiser const&, FileStore&, unsigned short) override { return false; }
-    ClassProperties const* GetObjectClassProperties() const override { return m_description; }
-
-    ClassProperties const* m_description;
-    SaveFunction m_save;
-
-protected:
-    ~Thing() override = default;
-};
-
-class SharedThing : public SharedSerialisable
-{
-public:
-    SharedThing(SharedClassProperties const* description, u8 value, SaveFunction save = {})
-        : m_description(description), m_value(value), m_save(std::move(save))
-    {
-    }
-    void Save(OutSerialiser& out) const override
-    {
-        out.SaveType("Valu", m_value);
-        if (m_save) m_save(out);
-    }
-    bool Load(InSerialiser const&, FileStore&, unsigned short) override { return false; }
-    void AccumulateHash(HashAccumulator& hash) const override { hash.AddToHash(&m_value, 1); }
-    SharedClassProperties const* GetObjectClassProperties() const override { return m_description; }
-    bool CompareMembers(SharedSerialisable const& other, CompareContext const&) const override
-    {
-        return m_value == static_cast<SharedThing const&>(other).m_value;
-    }
-
-    SharedClassProperties const* m_description;
-    u8 m_value;
-    SaveFunction m_save;
-
-protected:
-    ~SharedThing() override = default;
-};
-
-Consolidated<SharedSerialisable> MakeShared(SharedClassProperties const& description, u8 value, SaveFunction save = {})
-{
-    return description.ConsolidateObjectSacrifice(MakeCounted<SharedThing>(&description, value, std::move(save)));
-}
-
-ClassProperties MakeClass(ClassUID uid, std::vector<Defaults::Item> const& defaults = {Defaults::Item()},
-                          ClassPropertiesBase const* parent = nullptr)
-{
-    return ClassProperties(uid, static_cast<ClassProperties::CreateFunc>(nullptr), 2, defaults.data(), parent);
-}
-
 SharedClassProperties const& SharedClass()
 {
-    static SharedClassProperties const description("Shar", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1,
-                                                   nullptr, nullptr);
+    static SharedClassProperties const description = MakeSharedClass("Shar");
     return description;
 }
 
@@ -299,8 +235,7 @@ TEST(OutSerialiserObjects, ObjectsBeforeItDoNotChangeHowAnObjectIsSaved)
 
 TEST(OutSerialiserObjects, SharedObjectThatReachesItselfIsRefused)
 {
-    SharedClassProperties const description("Cycl", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1, nullptr,
-                                            nullptr);
+    SharedClassProperties const description = MakeSharedClass("Cycl");
     Consolidated<SharedSerialisable> object;
     object = MakeShared(description, 1, [&](OutSerialiser& out) { out.SaveSharedObject("Self", object); });
     EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveSharedObject("Item", object); }), 5);
@@ -314,8 +249,7 @@ TEST(OutSerialiserObjects, DefaultObjectOfTheClassBeingDescribedIsRefused)
     ClassProperties const outer = MakeClass("Outr", Defaults::Make(Defaults::Object("Defa", value)));
     // The default's class has the same object among its own defaults.
     auto const defaults = Defaults::Make(Defaults::Object("Self", value));
-    SharedClassProperties const cyclic("Cycl", static_cast<SharedClassProperties::CreateFunc>(nullptr), 1,
-                                       defaults.data(), nullptr);
+    SharedClassProperties const cyclic = MakeSharedClass("Cycl", defaults);
     auto const user = cyclic.ConsolidateObjectSacrifice(MakeCounted<SharedThing>(&cyclic, u8{1}));
     static_cast<SharedThing*>(value.Get())->m_description = &cyclic;
     EXPECT_EQ(ListCode([&](OutSerialiser& out) { out.SaveSharedObject("Item", user); }), 5);

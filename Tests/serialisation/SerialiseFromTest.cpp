@@ -14,43 +14,35 @@ namespace {
 
 constexpr IDTag c_kind("Test");
 
-TEST(SerialiseFromTest, KindAndVersionAreChecked)
+TEST(SerialiseFromTest, KindAndVersionAreCheckedAndWhateverIsThrownGivesFalse)
 {
-    PropertyBytes b;
-    b.Header().End(); // Kind "Test", version 3.
+    PropertyBytes const good = PropertyBytes().Header().End(); // Kind "Test", version 3.
+    PropertyBytes const newer = PropertyBytes().Header(3).End();
+    using Load = std::function<bool(InSerialiser&, IDTag)>;
+    int calls = 0;
+    Load const yes = [&](InSerialiser&, IDTag tag) { return ++calls && tag == IDTag("Item"); };
     struct
     {
+        PropertyBytes const& bytes;
         IDTag kind;
         u16 version;
+        Load load;
         bool loads;
-    } const cases[] = {{"Test", 3, true}, {"Test", 9, true}, {"Test", 2, false}, {"Othr", 3, false}};
-    for (auto const& c : cases) {
-        bool called = false;
-        EXPECT_EQ(SerialiseFromStream(Deliver(b.bytes, Delivery::Memory), c.kind, c.version,
-                                      [&](InSerialiser&, IDTag tag) {
-                                          called = true;
-                                          return tag == IDTag("Item");
-                                      }),
-                  c.loads);
-        EXPECT_EQ(called, c.loads);
-    }
-}
-
-TEST(SerialiseFromTest, WhateverIsThrownGivesFalse)
-{
-    PropertyBytes good;
-    good.Header().End();
-    PropertyBytes newer;
-    newer.Header(3).End();
-    auto const yes = [](InSerialiser&, IDTag) { return true; };
+    } const cases[] = {
+        {good, "Test", 3, yes, true},
+        {good, "Test", 9, yes, true},
+        {good, "Test", 2, yes, false},
+        {good, "Othr", 3, yes, false},
+        {newer, "Test", 9, yes, false},
+        {good, "Test", 9, [](InSerialiser&, IDTag) -> bool { throw 5; }, false},
+        {good, "Test", 9, [](InSerialiser&, IDTag) { return false; }, false},
+    };
+    for (auto const& c : cases)
+        EXPECT_EQ(SerialiseFromStream(Deliver(c.bytes.bytes, Delivery::Memory), c.kind, c.version, c.load), c.loads);
     EXPECT_FALSE(SerialiseFromStream(nullptr, c_kind, 9, yes));
-    EXPECT_FALSE(SerialiseFromStream(Deliver(newer.bytes, Delivery::Memory), c_kind, 9, yes));
-    EXPECT_FALSE(SerialiseFromStream(Deliver(good.bytes, Delivery::Memory), c_kind, 9,
-                                     [](InSerialiser&, IDTag) -> bool { throw 5; }));
-    EXPECT_FALSE(SerialiseFromStream(Deliver(good.bytes, Delivery::Memory), c_kind, 9,
-                                     [](InSerialiser&, IDTag) { return false; }));
     EXPECT_FALSE(SerialiseFromFile("/nowhere/at/all", c_kind, 9, yes, false));
     EXPECT_FALSE(SerialiseFromFile(nullptr, c_kind, 9, yes, false));
+    EXPECT_EQ(calls, 2);
 }
 
 TEST(SerialiseFromTest, DeepestGraphThatCanBeSavedCanBeRead)
