@@ -103,11 +103,24 @@ std::string SaveInto(World& world, Archive::SessionType type, bool scratch, How 
     return "ok";
 }
 
-std::string SaveNew(World& world, std::string const& result)
+// An archive that @p make gives, with its result, for the world to keep; and a first save into it if @p saves.
+template <class Result, class Make>
+std::function<std::string(World&)> Making(Make make, bool saves)
 {
-    if (result != "ok") return result;
-    world.item = MakeCounted<BytesItem>(std::string(900, 'f'));
-    return SaveInto(world, Archive::SessionTypeFull, false);
+    return [=](World& world) {
+        Result result{};
+        Counted<Archive> const archive = make(world, result);
+        std::string const kept = Kept(world.archive, archive, result);
+        if (kept != "ok" || !saves) return kept;
+        world.item = MakeCounted<BytesItem>(std::string(900, 'f'));
+        return SaveInto(world, Archive::SessionTypeFull, false);
+    };
+}
+
+template <class Make>
+std::function<std::string(World&)> Creating(Make make, bool saves = true)
+{
+    return Making<Archive::CreateResult>(make, saves);
 }
 
 std::function<std::string(World&)> Saving(Archive::SessionType type, bool scratch, How how = How::Plain)
@@ -115,13 +128,15 @@ std::function<std::string(World&)> Saving(Archive::SessionType type, bool scratc
     return [=](World& world) { return SaveInto(world, type, scratch, how); };
 }
 
+template <class Make>
+std::function<std::string(World&)> OpeningBy(Make make)
+{
+    return Making<Archive::OpenResult>(make, false);
+}
+
 std::function<std::string(World&)> Opening(Archive::OpenMode mode, char const* path)
 {
-    return [=](World& world) {
-        Archive::OpenResult result{};
-        Counted<Archive> const archive = Archive::Open(Str(path), mode, c_documentTag, result);
-        return Kept(world.archive, archive, result);
-    };
+    return OpeningBy([=](World&, auto& result) { return Archive::Open(Str(path), mode, c_documentTag, result); });
 }
 
 template <class T>
@@ -216,6 +231,11 @@ std::string SettingsBack(World&)
 
 void Nothing(World&) {}
 
+void OpenedOther(World& world)
+{
+    world.other = OpenDocument(c_doc);
+}
+
 // What any file of a save may fail with, by name: no session for want of a file, or the session's own exceptions.
 char const* const c_saveFailures = "session 9 no session file 0 file 1 file 2 file 3 file 4 file 5 file 7 file 8 write";
 
@@ -225,54 +245,28 @@ std::vector<ArchiveOperation> MakeOperations()
     std::string const save = c_saveFailures;
     std::vector<ArchiveOperation> list = {
         {"create", StartState::Nothing, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = Archive::Create(Str(c_new), c_documentTag, result);
-             return Kept(w.archive, archive, result);
-         },
+         Creating([](World&, auto& result) { return Archive::Create(Str(c_new), c_documentTag, result); }, false),
          "create *"},
         {"create as scratch", StartState::Nothing, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = Archive::CreateAsScratch(Str(c_new), c_documentTag, nullptr, result);
-             return Kept(w.archive, archive, result);
-         },
+         Creating(
+             [](World&, auto& result) { return Archive::CreateAsScratch(Str(c_new), c_documentTag, nullptr, result); },
+             false),
          "create *"},
         {"create throw-away and save", StartState::Nothing, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = Archive::CreateAsThrowAway(c_documentTag, result);
-             return SaveNew(w, Kept(w.archive, archive, result));
-         },
+         Creating([](World&, auto& result) { return Archive::CreateAsThrowAway(c_documentTag, result); }),
          "create * " + save},
         {"create with temporary and save", StartState::Document, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = Archive::CreateWithTemporary(Str(c_doc), c_documentTag, result);
-             return SaveNew(w, Kept(w.archive, archive, result));
-         },
+         Creating([](World&, auto& result) { return Archive::CreateWithTemporary(Str(c_doc), c_documentTag, result); }),
          "create * " + save},
         {"create new with temporary and save", StartState::Nothing, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = Archive::CreateWithTemporary(Str(c_new), c_documentTag, result);
-             return SaveNew(w, Kept(w.archive, archive, result));
-         },
+         Creating([](World&, auto& result) { return Archive::CreateWithTemporary(Str(c_new), c_documentTag, result); }),
          "create * " + save},
-        {"create with adjacent temporary and save", StartState::Document, Nothing,
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive =
-                 Archive::CreateWithAdjacentTemporary(Str(c_doc), c_documentTag, result, {});
-             return SaveNew(w, Kept(w.archive, archive, result));
-         },
+        {"create with adjacent temporary and save", StartState::Document, Nothing, Creating([](World&, auto& result) {
+             return Archive::CreateWithAdjacentTemporary(Str(c_doc), c_documentTag, result, {});
+         }),
          "create * " + save},
-        {"replace and save", StartState::Document, [](World& w) { w.other = OpenDocument(c_doc); },
-         [](World& w) {
-             Archive::CreateResult result;
-             Counted<Archive> const archive = w.other->CreateReplacementWithTemporary(result, {});
-             return SaveNew(w, Kept(w.archive, archive, result));
-         },
+        {"replace and save", StartState::Document, OpenedOther,
+         Creating([](World& w, auto& result) { return w.other->CreateReplacementWithTemporary(result, {}); }),
          "create * " + save},
         {"add scratch file", StartState::Document, Opened(c_doc),
          [](World& w) {
@@ -288,35 +282,20 @@ std::vector<ArchiveOperation> MakeOperations()
          "open *"},
         {"open coordinated", StartState::Document, Nothing, Opening(Archive::OpenModeCoordinated, c_doc), "open *"},
         {"open as scratch", StartState::Alone, Nothing,
-         [](World& w) {
-             Archive::OpenResult result{};
-             Counted<Archive> const archive = Archive::OpenAsScratch(Str(c_scratch), c_documentTag, result);
-             return Kept(w.archive, archive, result);
-         },
-         "open *"},
-        {"open throw-away", StartState::Document, [](World& w) { w.other = OpenDocument(c_doc); },
+         OpeningBy([](World&, auto& r) { return Archive::OpenAsScratch(Str(c_scratch), c_documentTag, r); }), "open *"},
+        {"open throw-away", StartState::Document, OpenedOther,
          [](World& w) {
              auto const data = MakeCounted<FragmentedRawData>(4096);
              if (int const result = w.other->StreamlineToFragmentedRawData(*data)) return Streamlined(result);
-             Archive::OpenResult result{};
-             Counted<Archive> const archive = Archive::OpenAsThrowaway(*data, c_documentTag, result);
-             return Kept(w.archive, archive, result);
+             return OpeningBy([&](World&, auto& r) { return Archive::OpenAsThrowaway(*data, c_documentTag, r); })(w);
          },
          "open * streamline 2 streamline 4"},
         {"open migrate", StartState::Document, Nothing,
-         [](World& w) {
-             Archive::OpenResult result{};
-             Counted<Archive> const archive = Archive::OpenMigrate(Str(c_doc), Str(c_moved), c_documentTag, result);
-             return Kept(w.archive, archive, result);
-         },
+         OpeningBy([](World&, auto& r) { return Archive::OpenMigrate(Str(c_doc), Str(c_moved), c_documentTag, r); }),
          "open *"},
-        {"recover", StartState::Damaged, Nothing,
-         [](World& w) {
-             Archive::OpenResult result{};
-             Counted<Archive> const archive =
-                 Archive::RecoverArchive(Str(c_doc), Archive::OpenModeReadWrite, c_documentTag, result);
-             return Kept(w.archive, archive, result);
-         },
+        {"recover", StartState::Damaged, Nothing, OpeningBy([](World&, auto& r) {
+             return Archive::RecoverArchive(Str(c_doc), Archive::OpenModeReadWrite, c_documentTag, r);
+         }),
          "open *"},
         {"look at links", StartState::Pair, Nothing,
          [](World&) {
@@ -415,9 +394,7 @@ std::string RunOperation(ArchiveOperation const& operation, World& world)
     try {
         return operation.run(world);
     } catch (ArchiveFileException const& e) {
-        return Numbered("file", static_cast<int>(e.GetReason())) == "ok"
-                   ? "file 0"
-                   : "file " + std::to_string(static_cast<int>(e.GetReason()));
+        return "file " + std::to_string(static_cast<int>(e.GetReason()));
     } catch (OutStream::WriteException const&) {
         return "write";
     } catch (AbortException const&) {

@@ -9,8 +9,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstdio>
 #include <gtest/gtest.h>
+#include <iostream>
 #include <mutex>
 #include <set>
 #include <thread>
@@ -327,14 +327,11 @@ protected:
 
     void Print(char const* what, u64 operations) const
     {
-        double const seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - m_start).count();
-        std::printf("%s: %llu operations, %llu faults fired, %llu runs failed (%llu of them with the new state), %llu "
-                    "retried on the same objects, %llu copies left as named, %.1f s\n",
-                    what, static_cast<unsigned long long>(operations), static_cast<unsigned long long>(m_figures.fired),
-                    static_cast<unsigned long long>(m_figures.failed),
-                    static_cast<unsigned long long>(m_figures.committed),
-                    static_cast<unsigned long long>(m_figures.sameObjects),
-                    static_cast<unsigned long long>(m_figures.leftCopies), seconds);
+        std::chrono::duration<double> const seconds = std::chrono::steady_clock::now() - m_start;
+        std::cout << what << ": " << operations << " operations, " << m_figures.fired << " faults fired, "
+                  << m_figures.failed << " runs failed (" << m_figures.committed << " of them with the new state), "
+                  << m_figures.sameObjects << " retried on the same objects, " << m_figures.leftCopies
+                  << " copies left as named, " << seconds.count() << " s\n";
     }
 
     TestSupport::FakeClock m_clock;
