@@ -1,10 +1,8 @@
 #include "support/ArchiveFixture.h"
 #include "support/FakeClock.h"
-#include "support/TempFolder.h"
 
 #include <cctype>
 #include <cstdio>
-#include <cstring>
 #include <gtest/gtest.h>
 
 // The expected bytes are written out from the layout of the file, field by field.
@@ -15,6 +13,8 @@ namespace {
 using namespace Kernel;
 
 constexpr i64 c_now = 0x5F5E1000; // Its bytes: 00 10 5E 5F.
+
+using ArchiveFormatTest = DocumentTest;
 
 std::string Hex(std::string const& text)
 {
@@ -41,20 +41,17 @@ std::string ToHex(std::string const& bytes)
     return text;
 }
 
-TEST(ArchiveFormatTest, FreshScratchFileLinksToItsMaster)
+TEST_F(ArchiveFormatTest, FreshScratchFileLinksToItsMaster)
 {
     TestSupport::FakeClock const clock(c_now);
-    TestSupport::TempFolder folder;
-    std::string const master = folder.GetPath() + "/m";
-    std::string const scratch = folder.GetPath() + "/s";
-    Counted<Archive> const archive = CreateDocument(master);
+    Counted<Archive> const archive = CreateDocument(m_path);
     ASSERT_TRUE(archive);
     Archive::CreateResult result;
-    ASSERT_TRUE(archive->AddScratchFile(Str(scratch), result));
+    ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), result));
 
-    std::string const bytes = ReadWhole(scratch);
-    u64 const n = master.size();
-    EXPECT_EQ(ReadWhole(master).size(), 72u);
+    std::string const bytes = ReadWhole(m_scratchPath);
+    u64 const n = m_path.size();
+    EXPECT_EQ(ReadWhole(m_path).size(), 72u);
     ASSERT_EQ(bytes.size(), 86 + n);
     std::string expected = Hex("00 FF 4B 41  0B 00  01 00  75 63 6F 44"
                                "23 49 6E 66  00 00 00 00 00 00 00 00");
@@ -66,19 +63,17 @@ TEST(ArchiveFormatTest, FreshScratchFileLinksToItsMaster)
                     "00 10 5E 5F 00 00 00 00  01 00 00 00"); // the master's time stamp and save count
     expected += static_cast<char>(n);
     expected += '\0';
-    expected += master;
+    expected += m_path;
     EXPECT_EQ(ToHex(bytes), ToHex(expected));
 }
 
-TEST(ArchiveFormatTest, OneItemDocumentIsBlockTableAndNewInfo)
+TEST_F(ArchiveFormatTest, OneItemDocumentIsBlockTableAndNewInfo)
 {
     TestSupport::FakeClock const clock(c_now);
-    TestSupport::TempFolder folder;
-    std::string const path = folder.GetPath() + "/a";
-    Counted<Archive> const archive = CreateDocument(path);
+    Counted<Archive> const archive = CreateDocument(m_path);
     ASSERT_TRUE(Save(*archive, {{"x.t", "123456789"}}));
 
-    std::string bytes = ReadWhole(path);
+    std::string bytes = ReadWhole(m_path);
     ASSERT_EQ(bytes.size(), 72u + 17 + 59 + 47);
     // How often the guard was passed is the writer's own affair.
     bytes.replace(68, 4, "????");
@@ -108,43 +103,20 @@ TEST(ArchiveFormatTest, OneItemDocumentIsBlockTableAndNewInfo)
     EXPECT_EQ(ToHex(bytes), ToHex(expected));
 }
 
-TEST(ArchiveFormatTest, DeletionIsARecordOfFiveBytesAndAnEmptyItemABlockOfEight)
+TEST_F(ArchiveFormatTest, ThumbnailBlockLiesBehindTheTable)
 {
-    TestSupport::TempFolder folder;
-    std::string const path = folder.GetPath() + "/a";
-    Counted<Archive> const archive = CreateDocument(path);
-    ASSERT_TRUE(Save(*archive, {{"x", ""}}));
-    EXPECT_EQ(StateOf(*archive).fileEnd, 72u + 8 + 59 + 45);
-    EXPECT_EQ(StateOf(*archive).totalBytes, 0u);
-    EXPECT_EQ(Get(*archive, "x"), "");
+    Counted<Archive> const archive = CreateDocument(m_path);
+    ASSERT_TRUE(InSession(*archive, [](ArchiveSession& session) {
+        session.CreateFile(Str("x"), MakeCounted<BytesItem>("1"));
+        session.SetThumbnails(MakeThumbnails("abc"));
+    }));
 
-    u64 const before = StateOf(*archive).fileEnd;
-    ASSERT_TRUE(Save(*archive, {{"x", std::nullopt}}));
-    EXPECT_EQ(StateOf(*archive).fileEnd, before + 59 + 5);
-    EXPECT_FALSE(archive->HasFile(Str("x")));
-}
-
-TEST(ArchiveFormatTest, ThumbnailBlockLiesBehindTheTable)
-{
-    TestSupport::TempFolder folder;
-    std::string const path = folder.GetPath() + "/a";
-    Counted<Archive> const archive = CreateDocument(path);
-    auto thumbnails = MakeCounted<ArchiveThumbnails>();
-    auto data = MakeCounted<RawData>(3);
-    std::memcpy(data->GetData(), "abc", 3);
-    thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, data);
-    ArchiveSessionHandle handle;
-    ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
-    handle->CreateFile(Str("x"), MakeCounted<BytesItem>("1"));
-    handle->SetThumbnails(thumbnails);
-    archive->CloseSession(handle, false);
-
-    std::string const bytes = ReadWhole(path);
+    std::string const bytes = ReadWhole(m_path);
     u64 const end = StateOf(*archive).fileEnd;
     EXPECT_EQ(ToHex(bytes.substr(end)), ToHex(Hex("FF FF FF FF  54 68 6D 62  01 00 00 00  10 00 00 00"
                                                   "1D 00 00 00 00 00 00 00  03 00 00 00  01"
                                                   "61 62 63")));
-    Counted<Archive> const again = OpenDocument(path, Archive::OpenModeReadOnly);
+    Counted<Archive> const again = OpenDocument(m_path, Archive::OpenModeReadOnly);
     ASSERT_TRUE(again && again->LoadThumbnails());
     EXPECT_EQ(again->LoadThumbnails()->GetRecs().size(), 1u);
     // A save that sets none drops them.

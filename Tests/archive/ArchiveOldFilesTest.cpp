@@ -108,20 +108,14 @@ TEST(ArchiveOldFilesTest, EveryVersionWithEveryKindOfTableReadsAndSavesBackAsTod
             EXPECT_FALSE(archive->IsBroken());
             EXPECT_EQ(archive->GetLastSaveType(), Archive::RevisionTagIncremental);
             EXPECT_EQ(archive->GetFileCodeBaseBuildIndex(Str("c1/1003")), tag == "#FAT" ? 0u : 24u);
-            std::vector<Counted<Archive::Revision const>> revisions;
-            archive->GetRevisions(revisions);
+            auto const revisions = RevisionsOf(*archive);
             ASSERT_EQ(revisions.size(), 2u);
             ASSERT_TRUE(revisions[0]->GetUserData());
             EXPECT_EQ(std::memcmp(revisions[0]->GetUserData()->GetData(), "user", 4), 0);
 
-            ArchiveSessionHandle handle;
-            ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
-            auto const item = MakeCounted<BytesItem>("new");
-            String8 generated;
-            ASSERT_TRUE(handle->GenerateIndexedPath({Str("img"), Str(".png")}, item, nullptr, generated));
-            EXPECT_EQ(generated, "img6.png");
-            handle->CreateFile(generated, item);
-            archive->CloseSession(handle, false);
+            ASSERT_TRUE(InSession(*archive, [](ArchiveSession& session) {
+                EXPECT_EQ(CreateGenerated(session, "img", ".png", "new"), "img6.png");
+            }));
             expected["img6.png"] = "new";
             archive = nullptr;
             archive = OpenDocument(path);
@@ -131,9 +125,7 @@ TEST(ArchiveOldFilesTest, EveryVersionWithEveryKindOfTableReadsAndSavesBackAsTod
 
             // Without room for a guard, a version 7 file takes one save.
             std::string const before = ReadWhole(path);
-            Archive::CreateSessionResult const again =
-                archive->CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false);
-            EXPECT_EQ(again, version == 7 ? Archive::SessionFileUnusable : Archive::SessionOk);
+            EXPECT_EQ(SessionResult(*archive), version == 7 ? Archive::SessionFileUnusable : Archive::SessionOk);
             if (version == 7) {
                 EXPECT_TRUE(ReadWhole(path) == before);
             }

@@ -15,15 +15,9 @@ constexpr Kernel::u16 c_streamlined = 8;
 /// Offers one item under a generated path, so that the document has a path count.
 inline std::string SaveGenerated(Kernel::Archive& archive, std::string const& bytes)
 {
-    Kernel::ArchiveSessionHandle handle;
-    EXPECT_TRUE(archive.CreateSession(handle, Kernel::Archive::SessionTypeFull, nullptr));
-    auto const item = Kernel::MakeCounted<BytesItem>(bytes);
-    Kernel::String8 path;
-    EXPECT_TRUE(
-        handle->GenerateIndexedPath({Kernel::String8("gen/"), Kernel::String8(".x")}, item.Get(), nullptr, path));
-    handle->CreateFile(path, item);
-    archive.CloseSession(handle, false);
-    return path.GetData();
+    std::string path;
+    EXPECT_TRUE(InSession(archive, [&](auto& session) { path = CreateGenerated(session, "gen/", ".x", bytes); }));
+    return path;
 }
 
 class ArchiveStreamlineTest : public DocumentTest

@@ -18,11 +18,10 @@ using Result = Archive::StreamlineResult;
 /// Thumbnails go with a save, so it writes one item again as it is.
 void SaveThumbnail(Archive& archive)
 {
-    ArchiveSessionHandle handle;
-    ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
-    handle->CreateFile(Str("a"), MakeCounted<BytesItem>(*Get(archive, "a")));
-    handle->SetThumbnails(MakeThumbnails("picture"));
-    archive.CloseSession(handle, false);
+    ASSERT_TRUE(InSession(archive, [&](ArchiveSession& session) {
+        session.CreateFile(Str("a"), MakeCounted<BytesItem>(*Get(archive, "a")));
+        session.SetThumbnails(MakeThumbnails("picture"));
+    }));
 }
 
 std::string Thumbnail(Archive& archive)

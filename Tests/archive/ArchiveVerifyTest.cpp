@@ -115,39 +115,31 @@ protected:
 
     static void CountUp(Archive& archive, Changes const& changes)
     {
-        ArchiveSessionHandle handle;
-        ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
-        for (auto const& [path, bytes] : changes) handle->CreateFile(Str(path), MakeCounted<BytesItem>(*bytes));
-        auto const item = MakeCounted<BytesItem>("generated");
-        String8 path;
-        ASSERT_TRUE(handle->GenerateIndexedPath({String8("p/"), String8(".s")}, item.Get(), nullptr, path));
-        handle->CreateFile(path, item);
-        archive.CloseSession(handle, false);
+        ASSERT_TRUE(InSession(archive, [&](ArchiveSession& session) {
+            for (auto const& [path, bytes] : changes) session.CreateFile(Str(path), MakeCounted<BytesItem>(*bytes));
+            CreateGenerated(session, "p/", ".s", "generated");
+        }));
     }
     /// A history in which every field that a check looks at can be changed by itself.
     void MakeHistory(Archive& archive)
     {
         CountUp(archive, {{"a", FirstItem()}, {"b", "1"}, {"z", "1"}, {"~", "1"}}); // p/1.s is 5.
-        {
-            ArchiveSessionHandle handle;
-            ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
-            handle->CreateFile(Str("b"), MakeCounted<BytesItem>("22"));
-            handle->CreateFile(Str("c"), MakeCounted<BytesItem>("1"));       // 6.
-            handle->CreateFile(Str("unsaved"), MakeCounted<BytesItem>("1")); // 7, and nobody has it in the end.
-            handle->DeleteFile(Str("unsaved"));
-            handle->DeleteFile(Str("z"));
-            archive.CloseSession(handle, false);
-        }
+        ASSERT_TRUE(InSession(archive, [](ArchiveSession& session) {
+            // 6 is c, and 7 nobody has in the end.
+            for (auto const& [path, bytes] : {std::pair("b", "22"), std::pair("c", "1"), std::pair("unsaved", "1")})
+                session.CreateFile(Str(path), MakeCounted<BytesItem>(bytes));
+            session.DeleteFile(Str("unsaved"));
+            session.DeleteFile(Str("z"));
+        }));
         ASSERT_TRUE(Save(archive, {{"c", "33"}, {"~", std::nullopt}}));
         CountUp(archive, {{"b", "444"}}); // p/2.s is 8.
         ASSERT_TRUE(Save(archive, {{"~", "5"}}));
         ASSERT_TRUE(Save(archive, {{"z", "6"}, {"b", "66"}}));
-        ArchiveSessionHandle handle;
-        ASSERT_TRUE(archive.CreateSession(handle, Archive::SessionTypeFull, nullptr));
-        handle->CreateFile(Str("b"), MakeCounted<BytesItem>("7"));
-        handle->DeleteFile(Str("p/2.s"));
-        handle->SetThumbnails(MakeThumbnails("abc"));
-        archive.CloseSession(handle, false);
+        ASSERT_TRUE(InSession(archive, [](ArchiveSession& session) {
+            session.CreateFile(Str("b"), MakeCounted<BytesItem>("7"));
+            session.DeleteFile(Str("p/2.s"));
+            session.SetThumbnails(MakeThumbnails("abc"));
+        }));
     }
     // From the newest, with the save that is checked: 0 that save; 1 b and the deletion of p/2.s; 2 b and z again;
     // 3 "~" again; 4 b, p/2.s and the count; 5 c and the deletion of "~"; 6 b, c and the deletion of z; 7 the first.
@@ -405,10 +397,7 @@ TEST_F(ArchiveVerifyTest, SoundSavesMatchWhateverTheirKind)
             ArchiveSessionHandle handle;
             ASSERT_TRUE(scratch ? archive->CreateScratchSession(handle, type, nullptr)
                                 : archive->CreateSession(handle, type, nullptr));
-            auto const item = MakeCounted<BytesItem>(std::to_string(step));
-            String8 path;
-            handle->GenerateIndexedPath({String8("g"), String8("")}, item.Get(), nullptr, path);
-            handle->CreateFile(path, item);
+            CreateGenerated(*handle, "g", "", std::to_string(step));
             if (step % 3 == 0) handle->DeleteFile(Str("g1"));
             if (step % 3 == 1) handle->CreateFile(Str("g1"), MakeCounted<BytesItem>("again"));
             ASSERT_EQ(archive->CloseSessionAndVerifyFileState(handle, m_report, false), Archive::VerifyMatch) << Log();
@@ -480,23 +469,17 @@ TEST_F(ArchiveVerifyTest, ShuntedFilesComeWithALogUnderTheTimeOfDay)
     EXPECT_TRUE(m_report.IsEmpty());
     archive->RewindWorkingRevision();
     EXPECT_TRUE(archive->VerifyExistingFiles({Str("a"), Str("b")}, m_report));
-}
 
-TEST_F(ArchiveVerifyTest, CopiesThatFailAreSaidInTheLog)
-{
-    Counted<Archive> const archive = CreateDocument(m_path);
+    // Copies that fail are said.
+    Archive::SetShuntPath(Str(m_shunt));
     Archive::CreateResult created;
     ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), created));
     TestSupport::FaultyFiles files;
-    TestSupport::Fault fault;
-    fault.call = TestSupport::FileCall::Rename;
-    fault.forEver = true;
-    fault.error = ENOSPC;
-    fault.path = ".corvane";
-    files.Plan(fault);
-    EXPECT_FALSE(archive->VerifyExistingFiles({Str("a")}, m_report));
-    EXPECT_EQ(Log(), "There are required files missing from the archive\n\na\n\n\nOriginal paths:\nMaster: " + m_path +
-                         "\nScratch: " + m_scratchPath + "\n\n[Failed to copy master]\n[Failed to copy scratch]\n\n");
+    files.Plan({.call = TestSupport::FileCall::Rename, .forEver = true, .error = ENOSPC, .path = ".corvane"});
+    EXPECT_FALSE(archive->VerifyExistingFiles({Str("never")}, m_report));
+    EXPECT_EQ(Log(),
+              "There are required files missing from the archive\n\nnever\n\n\nOriginal paths:\nMaster: " + m_path +
+                  "\nScratch: " + m_scratchPath + "\n\n[Failed to copy master]\n[Failed to copy scratch]\n\n");
 }
 
 TEST_F(ArchiveVerifyTest, AdditionalFilesAreThoseOfAnyRevision)

@@ -59,16 +59,11 @@ ArchiveBuilder::Details ArchiveBuilder::AddBlock(std::string const& bytes, u8 co
         Kernel::Testing::Bytes const packed = Kernel::Testing::PeerCompress((code & 3) == 2, plain);
         stored.assign(packed.begin(), packed.end());
     }
-    return AddStored(stored, bytes.size(), Crc(bytes), code);
-}
-
-ArchiveBuilder::Details ArchiveBuilder::AddStored(std::string const& stored, u64 size, u32 crc, u8 code)
-{
     Details details;
     details.pos = GetEnd();
-    details.size = size;
+    details.size = bytes.size();
     details.stored = stored.size();
-    details.crc = crc;
+    details.crc = Crc(bytes);
     details.code = code;
     details.storedCrc = std::max(Crc(stored), 1u);
     m_content += "#Fil" + stored + "\xFF\xFF\xFF\xFF";
@@ -121,7 +116,7 @@ void ArchiveBuilder::AddThumbnails(std::vector<Thumbnail> const& entries, std::s
 
 std::string ArchiveBuilder::Build() const
 {
-    u16 const flags = static_cast<u16>((link ? 1 : 0) | (reference ? 2 : 0) | extraFlags);
+    u16 const flags = static_cast<u16>((link ? 1 : 0) | (reference ? 2 : 0));
     std::string file = std::string("\x00\xFF\x4B\x41", 4) + Little(version, 2) + Little(flags, 2) + "ucoD";
     file += infoTag + Little(firstFAT.value_or(m_newest), 8) + Little(fileEnd.value_or(GetEnd()), 8) +
             Little(totalBytes, 8) + Little(deadBytes, 8) + Little(static_cast<u64>(saveTime), 8) +

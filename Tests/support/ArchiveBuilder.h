@@ -68,7 +68,6 @@ public:
     explicit ArchiveBuilder(Kernel::u16 fileVersion = 11) : version(fileVersion) {}
 
     Kernel::u16 version;
-    Kernel::u16 extraFlags = 0; ///< Beside those of link and reference path.
     std::optional<Link> link;
     std::optional<std::string> reference;
 
@@ -89,8 +88,6 @@ public:
     Kernel::u64 GetEnd() const { return GetFrontSize() + m_content.size(); }
     /// Appends a block that holds @p bytes packed as the code says: zlib, zstd and predictors by their definitions.
     Details AddBlock(std::string const& bytes, Kernel::u8 code = 0);
-    /// A block of which the stored bytes are given as they are.
-    Details AddStored(std::string const& stored, Kernel::u64 size, Kernel::u32 crc, Kernel::u8 code);
     /// Appends a table that names the one before it; gives its position.
     Kernel::u64 AddTable(Table const& table);
     /// One file, one table.

@@ -43,10 +43,13 @@ OpenDocument(std::string const& path, Kernel::Archive::OpenMode mode = Kernel::A
     return archive;
 }
 
-inline Kernel::Archive::OpenResult ResultOfOpening(std::string const& path)
+inline Kernel::Archive::OpenResult ResultOfOpening(std::string const& path,
+                                                   Kernel::Archive::OpenMode mode = Kernel::Archive::OpenModeReadWrite,
+                                                   Kernel::IDTag tag = c_documentTag)
 {
     Kernel::Archive::OpenResult result{};
-    Kernel::Archive::Open(Str(path), Kernel::Archive::OpenModeReadWrite, Kernel::IDTag(), result);
+    bool const opened = static_cast<bool>(Kernel::Archive::Open(Str(path), mode, tag, result));
+    EXPECT_EQ(opened, result == Kernel::Archive::OpenOk);
     return result;
 }
 
@@ -71,21 +74,44 @@ inline std::map<std::string, std::string> GetAll(Kernel::Archive& archive)
 
 using Changes = std::map<std::string, std::optional<std::string>>;
 
-/// One session that writes and deletes; false if it could not be had.
-inline bool Save(Kernel::Archive& archive, Changes const& changes, bool scratch = false,
-                 Kernel::Archive::SessionType type = Kernel::Archive::SessionTypeFull, bool compress = false)
+/// One session in which @p work is done; false if it could not be had.
+template <class Work>
+bool InSession(Kernel::Archive& archive, Work&& work, bool scratch = false,
+               Kernel::Archive::SessionType type = Kernel::Archive::SessionTypeFull)
 {
     Kernel::ArchiveSessionHandle handle;
     if (!(scratch ? archive.CreateScratchSession(handle, type, nullptr) : archive.CreateSession(handle, type, nullptr)))
         return false;
-    for (auto const& [path, bytes] : changes) {
-        if (!bytes)
-            handle->DeleteFile(Str(path));
-        else
-            handle->CreateFile(Str(path), Kernel::MakeCounted<BytesItem>(*bytes), compress ? Compressed() : nullptr);
-    }
+    work(*handle);
     archive.CloseSession(handle, false);
     return true;
+}
+
+/// One session that writes and deletes.
+inline bool Save(Kernel::Archive& archive, Changes const& changes, bool scratch = false,
+                 Kernel::Archive::SessionType type = Kernel::Archive::SessionTypeFull, bool compress = false)
+{
+    auto const work = [&](Kernel::ArchiveSession& session) {
+        for (auto const& [path, bytes] : changes) {
+            if (!bytes)
+                session.DeleteFile(Str(path));
+            else
+                session.CreateFile(Str(path), Kernel::MakeCounted<BytesItem>(*bytes),
+                                   compress ? Compressed() : nullptr);
+        }
+    };
+    return InSession(archive, work, scratch, type);
+}
+
+/// Adds an item under a path that the session makes up, and gives that path.
+inline std::string CreateGenerated(Kernel::ArchiveSession& session, char const* prefix, char const* suffix,
+                                   std::string const& bytes)
+{
+    auto const item = Kernel::MakeCounted<BytesItem>(bytes);
+    Kernel::String8 path;
+    EXPECT_TRUE(session.GenerateIndexedPath({Kernel::String8(prefix), Kernel::String8(suffix)}, item, nullptr, path));
+    session.CreateFile(path, item);
+    return path.GetData();
 }
 
 /// One record that holds these bytes.
@@ -167,6 +193,26 @@ protected:
     std::string const m_path = m_folder / "doc";
     std::string const m_scratchPath = m_folder / "scratch";
     Kernel::Counted<Kernel::Archive> m_archive;
+};
+
+/// The document has one item, "a".
+class OneItemTest : public DocumentTest
+{
+protected:
+    void MakeDocument(std::string const& bytes = "1") const
+    {
+        ASSERT_TRUE(Save(*CreateDocument(m_path), {{"a", bytes}}));
+    }
+    /// With a scratch file that has one more.
+    Kernel::Counted<Kernel::Archive> MakePair() const
+    {
+        MakeDocument();
+        Kernel::Counted<Kernel::Archive> archive = OpenDocument(m_path);
+        Kernel::Archive::CreateResult result;
+        EXPECT_TRUE(archive->AddScratchFile(Str(m_scratchPath), result));
+        EXPECT_TRUE(Save(*archive, {{"s", "scratch"}}, true));
+        return archive;
+    }
 };
 
 } // namespace KernelTest
