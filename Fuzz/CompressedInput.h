@@ -64,12 +64,15 @@ inline Unpacked ReadInLargeSteps(CompressionInStream& in)
 
 /// Reads what @p expected was read from once more, in steps of any size and with skips, and compares. With
 /// @p tellsDamage damage throws, so that what was not refused is whole. The call that meets damage may take good bytes
-/// with it, so up to there alone are the bytes the same.
+/// with it, so up to there alone are the bytes the same; and where it ends inside an element, that element is given as
+/// it stands, not decoded.
 inline void CompareInOddSteps(CompressionInStream& in, Unpacked const& expected, bool tellsDamage, u64 element,
                               Numbers numbers)
 {
     bool const isWhole = tellsDamage && !expected.isRefused;
     u64 const size = expected.bytes.size();
+    u64 const unit = isWhole ? 1 : element;
+    u64 const sure = size - size % unit;
     std::vector<u8> piece;
     u64 position = 0;
     try {
@@ -83,7 +86,7 @@ inline void CompareInOddSteps(CompressionInStream& in, Unpacked const& expected,
             }
             piece.resize(step);
             u64 const got = in.ReadBlock(piece.data(), step);
-            u64 const known = std::min(got, size - std::min(position, size));
+            u64 const known = std::min(got - got % unit, sure - std::min(position, sure));
             Require(known == 0 || std::memcmp(piece.data(), expected.bytes.data() + position, known) == 0,
                     "the bytes do not depend on the sizes of the reads");
             position += got;

@@ -140,7 +140,16 @@ TEST(ZipInStreamTest, BytesBehindTheEndAreTheEndAndFramesOneBehindTheOtherReadAs
     EXPECT_EQ(ReadAll(*Make(true, MakeCounted<ByteSource>(packed, 3), 0, false, true), 9), (Bytes{1, 2, 3}));
 }
 
-TEST(ZipInStreamTest, PresetDictionaryAndWindowsAboveTwoToThe27AreDamage)
+// Of version 0.5: magic, window, a raw block, the end.
+Bytes MakeOldFrame(u8 size)
+{
+    Bytes bytes{0x25, 0xB5, 0x2F, 0xFD, 0x00, 0x40, 0, size};
+    bytes.resize(bytes.size() + size, 'x');
+    bytes.insert(bytes.end(), {0xC0, 0, 0});
+    return bytes;
+}
+
+TEST(ZipInStreamTest, PresetDictionaryWindowsAboveTwoToThe27AndOldFormatsAreDamage)
 {
     // Magic, descriptor without single segment, window byte, one last raw block of a byte.
     auto const frame = [](int windowLog) {
@@ -156,7 +165,9 @@ TEST(ZipInStreamTest, PresetDictionaryAndWindowsAboveTwoToThe27AreDamage)
                           {true, frame(10), true},
                           {true, frame(27), true},
                           {true, frame(28), false},
-                          {true, frame(41), false}})
+                          {true, frame(41), false},
+                          {true, MakeOldFrame(1), false},
+                          {true, MakeOldFrame(20), false}})
     {
         auto const make = [&](bool throws) { return Make(c.zstd, MakeCounted<ByteSource>(c.bytes), 0, false, throws); };
         EXPECT_EQ(ReadAll(*make(false), 4).size(), c.good ? 1u : 0u);
@@ -193,6 +204,7 @@ TEST(ZStandardDecompressExactTest, GivesWhatTheStreamGives)
         }
     u8 byte;
     EXPECT_FALSE(ZStandardDecompressExact("noise and more", 14, &byte, 1));
+    EXPECT_FALSE(ZStandardDecompressExact(MakeOldFrame(1).data(), 12, &byte, 1));
     EXPECT_FALSE(ZStandardDecompressExact(nullptr, 0, &byte, 1));
     EXPECT_TRUE(ZStandardDecompressExact(nullptr, 0, nullptr, 0));
 }

@@ -7,7 +7,7 @@ struct ZSTD_DCtx_s;
 namespace Kernel {
 
 /// Decompresses Zstandard frames, RFC 8878, one behind the other. A frame that asks for a window above 2^27 bytes
-/// counts as damaged.
+/// counts as damaged, and so does one of the formats from before that standard.
 class KERNEL_API ZStandardInStream : public CompressionInStream
 {
 public:
@@ -25,6 +25,7 @@ private:
     bool Init();
 
     ZSTD_DCtx_s* m_context = nullptr;
+    u64 m_frameTaken = 0; // Bytes of the frame that were decompressed.
 };
 
 /// Decompresses a block that lies whole in memory straight to @p to, as a ZStandardInStream would give its first
