@@ -105,7 +105,7 @@ void CopyRaw(std::string const& folder, std::string const& path, bool overwrite)
             Require(::pwrite(from, buffer.data(), piece, static_cast<off_t>(at)) == static_cast<ssize_t>(piece));
             at += piece;
         }
-        Require(::fsync(from) == 0 && ::ftruncate(from, static_cast<off_t>(live)) == 0 && ::fsync(from) == 0);
+        Require(::ftruncate(from, static_cast<off_t>(live)) == 0 && ::fsync(from) == 0);
         Require(::pwrite(from, buffer.data(), 12, 0) == 12 && ::fdatasync(from) == 0);
         ::unlink(temporary.c_str());
     } else {

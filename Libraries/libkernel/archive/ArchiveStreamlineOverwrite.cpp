@@ -127,8 +127,8 @@ bool ArchiveStreamliner::TryOverwrite(String8 const& tempPath)
     } else {
         copied = to->CopyFromStream(*from, nullptr);
     }
-    if (!copied || to->TellOutStream() != size || !FlushArchiveFile(*to)) return false;
-    if (!to->Truncate(size) || !FlushArchiveFile(*to)) return false;
+    if (!copied || to->TellOutStream() != size || !to->Flush()) return false;
+    if (!to->Truncate(size) || !FlushArchiveFile(*to)) return false; // Both at once: the mark goes only behind this.
 
     Archive::ArchiveHdr decoded;
     if (to->ReadAt(c_headerPos, header, sizeof(header)) != sizeof(header) || !DecodeHeader(header, decoded))
