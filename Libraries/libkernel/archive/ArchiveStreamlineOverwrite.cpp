@@ -17,14 +17,26 @@ using Result = Archive::StreamlineResult;
 
 namespace {
 
+// Passes progress on, if somebody asks for it, and lets the device begin with what has been copied, so that the flush
+// at the end finds little left to do.
 class ArchiveStreamCopyProgress : public StreamCopyProgress
 {
 public:
-    explicit ArchiveStreamCopyProgress(ArchiveStreamlineProgress& progress) : m_progress(progress) {}
-    void ReportProgress(u64 done, u64 total) override { m_progress.OnProgress(done, total); }
+    ArchiveStreamCopyProgress(FileInOutStream const& to, ArchiveStreamlineProgress* progress)
+        : m_to(to), m_progress(progress)
+    {
+    }
+    void ReportProgress(u64 done, u64 total) override
+    {
+        if (done > m_started) m_to.StartWriteBack(c_headerSize + m_started, done - m_started);
+        m_started = done;
+        if (m_progress) m_progress->OnProgress(done, total);
+    }
 
 private:
-    ArchiveStreamlineProgress& m_progress;
+    FileInOutStream const& m_to;
+    ArchiveStreamlineProgress* const m_progress;
+    u64 m_started = 0;
 };
 
 bool WriteHeader(FileInOutStream& stream, u8 const (&header)[c_headerSize])
@@ -120,14 +132,8 @@ bool ArchiveStreamliner::TryOverwrite(String8 const& tempPath)
     u64 const size = from->GetSizeInStream();
     if (!from->SeekInStream(SeekMethod::Beginning, c_headerSize)) return false;
     if (!to->SeekInStream(SeekMethod::Beginning, c_headerSize)) return false;
-    bool copied = false;
-    if (m_request->progress) {
-        ArchiveStreamCopyProgress progress(*m_request->progress);
-        copied = to->CopyFromStream(*from, &progress);
-    } else {
-        copied = to->CopyFromStream(*from, nullptr);
-    }
-    if (!copied || to->TellOutStream() != size || !to->Flush()) return false;
+    ArchiveStreamCopyProgress progress(*to, m_request->progress.Get());
+    if (!to->CopyFromStream(*from, &progress) || to->TellOutStream() != size || !to->Flush()) return false;
     if (!to->Truncate(size) || !FlushArchiveFile(*to)) return false; // Both at once: the mark goes only behind this.
 
     Archive::ArchiveHdr decoded;
