@@ -69,6 +69,7 @@ ArchiveAppender::ArchiveAppender(ArchiveImpl& impl, Counted<Archive::ArchiveFile
 
 void ArchiveAppender::Append(void const* data, u64 size)
 {
+    if (size == 0) return; // The data may be null then.
     u8 const* bytes = static_cast<u8 const*>(data);
     if (m_held + size < c_copyBufferSize) {
         std::memcpy(m_buffer.GetData() + m_held, bytes, size);
