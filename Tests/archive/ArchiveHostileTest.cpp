@@ -170,6 +170,11 @@ TEST_F(ArchiveHostileTest, BlocksThatAreNotThereAreRefused)
         {"position that wraps", [](ArchiveBuilder::Details& d) { d.pos = ~u64{3}; }, true},
         {"position far away", [](ArchiveBuilder::Details& d) { d.pos = u64{1} << 40; }, false},
         {"position in the header", [](ArchiveBuilder::Details& d) { d.pos = 1; }, true},
+        {"tag in the info block",
+         [](ArchiveBuilder::Details& d) {
+             d = {40, 0, 0, 0};
+         },
+         true},
         {"an exabyte, stored 4", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60; }, true},
         {"an exabyte of zlib", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60, d.code = 1; }, true},
         {"an exabyte of zstd", [](ArchiveBuilder::Details& d) { d.size = u64{1} << 60, d.code = 2; }, true},
@@ -184,6 +189,7 @@ TEST_F(ArchiveHostileTest, BlocksThatAreNotThereAreRefused)
     for (auto const& c : cases) {
         SCOPED_TRACE(c.what);
         ArchiveBuilder builder;
+        builder.deadBytes = 0x6C694623; // "#Fil", at 40.
         ArchiveBuilder::Table table;
         table.records = {Added(builder, 1, "holds", "inner #Fil others"), Added(builder, 2, "bad", "1234")};
         c.change(table.records[1].details);

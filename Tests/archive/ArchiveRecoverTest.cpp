@@ -110,6 +110,10 @@ TEST_F(ArchiveRecoverTest, OlderTablesTakeOverWhereNewerOnesAreDamaged)
     WriteWhole(m_path, sound);
     Smash(m_path, tables[0] + 59 + 4, "\x07");
     EXPECT_FALSE(Recover(m_path, Archive::OpenCorrupt));
+    // What a later version wrote is no damage.
+    WriteWhole(m_path, sound);
+    Smash(m_path, tables.back(), "#FT5");
+    EXPECT_FALSE(Recover(m_path, Archive::OpenTooNew));
 }
 
 TEST_F(ArchiveRecoverTest, FilesOfEveryKindOfTableAreSearchedAndStrayTablesAreNoTables)

@@ -204,8 +204,8 @@ Archive::BlockCheck ArchiveImpl::CheckBlockTag(Archive::ArchiveFile& file, Archi
 {
     u8 tag[c_blockTagSize];
     Counted<FileInOutStream> const stream = file.GetStream();
-    // A position so high that nothing can lie there is damage of the table, not of the disk.
-    if (entry.filePos > (u64{1} << 62)) return Archive::BlockCheck::BadTag;
+    // That is damage of the table, not of the disk.
+    if (entry.filePos >= c_noBlockPos) return Archive::BlockCheck::BadTag;
     try {
         if (!stream || stream->ReadAt(entry.filePos, tag, sizeof(tag)) != sizeof(tag))
             return Archive::BlockCheck::Unreadable;

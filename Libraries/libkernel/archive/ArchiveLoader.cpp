@@ -167,6 +167,7 @@ Result ArchiveLoader::ReadFront(ArchiveSource& source, IDTag tag, ArchiveLoadDat
         if (!isGuard && !tolerant) return Archive::OpenBadInfo;
         front.writeCounter = isGuard ? LoadLittleEndian<u32>(guard + 4) : 0;
         position = c_firstContentPos;
+        front.guardIsBlock = guardTag == c_tagBlock;
     }
     if (front.HasLink()) {
         u8 link[c_linkFixedSize - 2];
@@ -193,7 +194,7 @@ Result ArchiveLoader::LoadArchiveFile(Archive::ArchiveFile& file, IDTag tag, Arc
     u32 highestUID = 0;
     size_t const before = data.revisions.size();
     Result const result =
-        LoadFATChain(source, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
+        LoadFATChain(source, front, Counted<Archive::ArchiveFile>(&file), data, front.info.firstFAT, highestUID);
     if (result != Archive::OpenOk) {
         data.files.clear(); // The revisions that held them have gone.
         return result;
@@ -252,7 +253,7 @@ void ArchiveLoader::TakeEnd(ArchiveSource& source, Front const& front, Archive::
     file.m_thumbnailsPos = has ? file.m_fileEnd : 0;
 }
 
-Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::ArchiveFile> const& file,
+Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Front const& front, Counted<Archive::ArchiveFile> const& file,
                                    ArchiveLoadData& data, u64 position, u32& highestUID, u64* failedAt)
 {
     // Each table lies whole before the next newer one, as in any append-only log. Without this rule a small file could
@@ -276,7 +277,8 @@ Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::Archi
         revision->m_fatPos = position;
 
         ArchiveTableCursor cursor(source, limit, position + c_fatHeaderSize, header.bodySize);
-        if (Result const result = LoadBody(cursor, header, *kind, *revision, data, highestUID)) {
+        if (Result const result =
+                LoadBody(cursor, header, *kind, front.GetFirstBlockPos(), *revision, data, highestUID)) {
             if (failedAt && data.contradicts) *failedAt = 0;
             return result;
         }
@@ -293,7 +295,7 @@ Result ArchiveLoader::LoadFATChain(ArchiveSource& source, Counted<Archive::Archi
 }
 
 Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& header, FATKind const& kind,
-                               Archive::Revision& revision, ArchiveLoadData& data, u32& highestUID)
+                               u64 firstBlockPos, Archive::Revision& revision, ArchiveLoadData& data, u32& highestUID)
 {
     // Room for what a usual table has. A count is only a claim, so beyond that memory follows the records.
     constexpr u64 c_mostAhead = 65536;
@@ -321,6 +323,8 @@ Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& head
         u8 const* const details = cursor.Take(kind.detailsSize);
         if (!details) return Archive::OpenCorrupt;
         DecodeDetails(details, kind, entry);
+        // The next save would write over it.
+        if (entry.filePos < firstBlockPos && !entry.IsDeletion()) entry.filePos = c_noBlockPos;
         if (recordKind != RecordAdded) continue;
 
         entry.added = true;

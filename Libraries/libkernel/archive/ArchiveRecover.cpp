@@ -159,7 +159,11 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
     if (!front.infoDamaged) {
         ArchiveLoadData fresh = data;
         u32 highestUID = 0;
-        bool const isWhole = LoadFATChain(source, counted, fresh, front.info.firstFAT, highestUID) == Archive::OpenOk;
+        Result const walked = LoadFATChain(source, front, counted, fresh, front.info.firstFAT, highestUID);
+        // Tables of a later version are no damage: with an older state in their place, the next save would write over
+        // them.
+        if (walked == Archive::OpenTooNew || walked == Archive::OpenNoMemory) return walked;
+        bool const isWhole = walked == Archive::OpenOk;
         bool const hasTable = fresh.revisions.size() > data.revisions.size();
         if (isWhole && !(hasTable && fresh.revisions.front()->m_fatPos < front.contentPos))
             return take(fresh, front.info.firstFAT, highestUID);
@@ -181,9 +185,9 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
             ArchiveLoadData fresh = data;
             u32 highestUID = 0;
             u64 failedAt = 0;
-            bool const isWhole =
-                LoadFATChain(source, counted, fresh, entry->m_position, highestUID, &failedAt) == Archive::OpenOk;
-            if (isWhole && fresh.revisions.front()->m_fatPos >= front.contentPos)
+            Result const walked = LoadFATChain(source, front, counted, fresh, entry->m_position, highestUID, &failedAt);
+            if (walked == Archive::OpenNoMemory) return walked;
+            if (walked == Archive::OpenOk && fresh.revisions.front()->m_fatPos >= front.contentPos)
                 return take(fresh, entry->m_position, highestUID);
             if (failedAt == 0 && ++contradictions == maxContradictions) return Archive::OpenCorrupt;
             FATEntry* const bad = search.Find(failedAt);

@@ -66,6 +66,7 @@ constexpr u64 c_firstContentPosV7 = c_guardPos;
 constexpr u64 c_blockTagSize = 4;
 constexpr u64 c_blockEndSize = 4;
 constexpr u32 c_blockEnd = 0xFFFFFFFF;
+constexpr u64 c_noBlockPos = u64{1} << 62; ///< In memory only, as those above it: no block can lie there.
 
 // Table (FAT).
 //   0  4  tag

@@ -76,11 +76,13 @@ public:
         u32 linkSaveCount = 0;
         String8 linkPath;
         String8 referencePath;
-        u64 contentPos = 0;       ///< Where the first block may lie.
-        bool infoDamaged = false; ///< The info block is unreadable; its fields are 0.
+        u64 contentPos = 0;        ///< Where the first block may lie.
+        bool infoDamaged = false;  ///< The info block is unreadable; its fields are 0.
+        bool guardIsBlock = false; ///< A file that was of version 7 once has its first block in the place of the guard.
 
         bool HasLink() const { return header.flags & ArchiveFormat::c_flagLink; }
         bool HasReference() const { return header.flags & ArchiveFormat::c_flagReference; }
+        u64 GetFirstBlockPos() const { return guardIsBlock ? ArchiveFormat::c_guardPos : contentPos; }
     };
     /// Reads it. @p expectedLink, if not null, is the link through which the file was reached. With @p tolerant a
     /// damaged info block or guard is no failure.
@@ -96,9 +98,9 @@ public:
 
     /// The walk of LoadArchiveFile without the front: the chain of tables from @p position on. On a failure
     /// @p failedAt is the table that could not be read, or 0 where two tables contradict each other.
-    static Archive::OpenResult LoadFATChain(ArchiveSource& source, Counted<Archive::ArchiveFile> const& file,
-                                            ArchiveLoadData& data, u64 position, u32& highestUID,
-                                            u64* failedAt = nullptr);
+    static Archive::OpenResult LoadFATChain(ArchiveSource& source, Front const& front,
+                                            Counted<Archive::ArchiveFile> const& file, ArchiveLoadData& data,
+                                            u64 position, u32& highestUID, u64* failedAt = nullptr);
     /// Sets the fields of @p file and @p data that come from the front.
     static void TakeFront(Front const& front, Archive::ArchiveFile& file, ArchiveLoadData& data);
     /// Sets the end of the content, the next free identifier and the place of the thumbnails, raised from the tables;
@@ -108,8 +110,8 @@ public:
 
 private:
     static Archive::OpenResult LoadBody(class ArchiveTableCursor& cursor, ArchiveFormat::FATHeader const& header,
-                                        ArchiveFormat::FATKind const& kind, Archive::Revision& revision,
-                                        ArchiveLoadData& data, u32& highestUID);
+                                        ArchiveFormat::FATKind const& kind, u64 firstBlockPos,
+                                        Archive::Revision& revision, ArchiveLoadData& data, u32& highestUID);
 };
 
 /// A file as a source. Borrows the stream.
