@@ -1,4 +1,3 @@
-#include "serialisation/ReaderClasses.h"
 #include "serialisation/WriterTestSupport.h"
 
 #include <cstdlib>
@@ -7,19 +6,9 @@
 namespace KernelTest {
 namespace {
 
-using Kernel::Test::ReaderDerived;
-using Kernel::Test::ReaderNode;
-
-auto const s_sizes = Defaults::Make(Defaults::Value("Size", 3), Defaults::Value("Size", 4));
+auto const s_sizes = Defaults::Make(Defaults::Value("Size", 3));
 ClassProperties const s_sized = MakeClass("tSiz", s_sizes);
 ClassPropertiesBase::Init const s_init(&s_sized);
-
-TEST(ClassProperties, TypeIsItsOwnAndItsParents)
-{
-    ClassPropertiesBase const& derived = ReaderDerived::ms_ClassProperties;
-    EXPECT_TRUE(derived.IsPolymorphicType("RdDv") && derived.IsPolymorphicType("RdNo"));
-    EXPECT_FALSE(ReaderNode::ms_ClassProperties.IsPolymorphicType("RdDv"));
-}
 
 TEST(ClassPropertiesDeathTest, SecondRegistrationStopsTheProcess)
 {
@@ -40,66 +29,6 @@ TEST(ClassPropertiesDeathTest, ShutdownLetsGoOfTheDefaults)
     };
     EXPECT_FALSE(s_sized.GetDefaults().empty());
     EXPECT_EXIT(shutDown(), testing::ExitedWithCode(0), "");
-}
-
-TEST(ClassProperties, LaterDefaultOfATagCountsForItsOwnClassAlone)
-{
-    ClassPropertiesBase const& description = s_sized;
-    ClassProperties const child = MakeClass("tChi", {Defaults::Item()}, &s_sized);
-    ASSERT_EQ(description.GetDefaults().size(), 1u);
-    int const former = 3;
-    int const value = 4;
-    struct
-    {
-        ClassPropertiesBase const& description;
-        IDTag tag;
-        PropType type;
-        int const& value;
-        u64 size;
-        bool isDefault;
-    } const cases[] = {
-        {description, "Size", PropType::Int32, value, 4, true},
-        {description, "Size", PropType::Int32, former, 4, false},
-        {description, "Size", PropType::UInt32, value, 4, false},
-        {description, "Size", PropType::Int32, value, 2, false},
-        {description, "None", PropType::Int32, value, 4, false},
-        {child, "Size", PropType::Int32, value, 4, false},
-    };
-    for (auto const& c : cases) EXPECT_EQ(c.description.TestDefaultType(c.tag, c.type, &c.value, c.size), c.isDefault);
-    EXPECT_FALSE(description.TestDefaultCustom("Size", &value, 4));
-}
-
-TEST(ClassProperties, DefaultsCompareEveryPart)
-{
-    EnumSerialiser enums;
-    enums.RegisterEnumSet({{1}, {2}});
-    FlagSerialiser flags;
-    flags.RegisterFlagIndices({{1}, {0}});
-    u16 const two[] = {1, 2};
-    auto const items = Defaults::Make(
-        Defaults::Bools("Bool", {true, false, true, false, false, false, false, false, true}),
-        Defaults::Values("Numb", std::vector<u16>{1, 2}), Defaults::Texts("Text", {"a", "b"}),
-        Defaults::Customs("Cust", std::vector<u16>{1, 2}), Defaults::EnumValues("Enum", std::vector<int>{2, 1}, enums),
-        Defaults::Flags("Flag", u8{2}, flags), Defaults::EnumValue("NoEn", 9, enums),
-        Defaults::Flags("NoFl", u8{4}, flags));
-    ClassProperties const description = MakeClass("tDef", items);
-    bool bits[] = {true, false, true, false, false, false, false, false, true};
-    EXPECT_TRUE(description.TestDefaultTypeArray("Bool", bits, 9));
-    EXPECT_FALSE(description.TestDefaultTypeArray("Bool", bits, 8));
-    bits[8] = false;
-    EXPECT_FALSE(description.TestDefaultTypeArray("Bool", bits, 9));
-    EXPECT_FALSE(description.TestDefaultTypeArray("Numb", bits, 2));
-    EXPECT_FALSE(description.TestDefaultTypeArray("Numb", PropType::UInt16, two, 2, 1));
-    EXPECT_FALSE(description.TestDefaultTypeArray("Numb", PropType::Int16, two, 2, 2));
-    String8 const texts[] = {"a", "b", "c"};
-    EXPECT_TRUE(description.TestDefaultStringArray("Text", texts, 2));
-    EXPECT_FALSE(description.TestDefaultStringArray("Text", texts, 3));
-    EXPECT_FALSE(description.TestDefaultCustomArray("Cust", two, 1, 4));
-    unsigned short const codes[] = {1, 0};
-    EXPECT_FALSE(description.TestDefaultEnumArray("Enum", codes, 2, 1));
-    EXPECT_FALSE(description.TestDefaultFlagSet("Flag", 1, 1));
-    EXPECT_TRUE(description.TestDefaultEnum("NoEn", 0, 0));
-    EXPECT_TRUE(description.TestDefaultFlagSet("NoFl", 0, 0));
 }
 
 TEST(Serialisable, EqualityNeedsOneDescription)
@@ -147,30 +76,21 @@ TEST_F(SharedClassPropertiesTest, EqualObjectsBecomeOne)
     EXPECT_FALSE(description.ConsolidateObjectSacrifice(nullptr));
 }
 
-TEST_F(SharedClassPropertiesTest, SweepLetsGoOfWhatNobodyHolds)
-{
-    auto const kept = MakeShared(description, 100);
-    MakeShared(description, 101);
-    EXPECT_EQ(CountAlive(), 2);
-    description.Sweep(false);
-    EXPECT_EQ(CountAlive(), 1);
-    EXPECT_EQ(description.FindConsolidatedObject(Make(100)).Get(), kept.Get());
-    auto const next = Make(101);
-    EXPECT_EQ(description.ConsolidateObjectSacrifice(next).Get(), next.Get());
-}
-
-TEST_F(SharedClassPropertiesTest, SweepUntilStableFollowsWhatObjectsHold)
+TEST_F(SharedClassPropertiesTest, SweepLetsGoOfWhatNobodyHoldsAndUntilStableOfWhatThatHeld)
 {
     SharedClassProperties const second = MakeSharedClass("tSnd");
-    auto const make = [&] { MakeShared(second, 2, [inner = MakeShared(description, 1)](OutSerialiser&) {}); };
-    make();
-    SharedClassProperties::SweepAll(false);
-    EXPECT_EQ(CountAlive(), 1);
-    SharedClassProperties::SweepAll(false);
-    EXPECT_EQ(CountAlive(), 0);
-    make();
-    SharedClassProperties::SweepAll(true);
-    EXPECT_EQ(CountAlive(), 0);
+    auto const kept = MakeShared(description, 100);
+    for (bool const untilStable : {false, true}) {
+        MakeShared(second, 2, [inner = MakeShared(description, 1)](OutSerialiser&) {});
+        EXPECT_EQ(CountAlive(), 3);
+        SharedClassProperties::SweepAll(untilStable);
+        EXPECT_EQ(CountAlive(), untilStable ? 1 : 2);
+        description.Sweep(false);
+        EXPECT_EQ(CountAlive(), 1);
+    }
+    EXPECT_EQ(description.FindConsolidatedObject(Make(100)).Get(), kept.Get());
+    auto const next = Make(1);
+    EXPECT_EQ(description.ConsolidateObjectSacrifice(next).Get(), next.Get());
 }
 
 TEST_F(SharedClassPropertiesTest, SetSweepsItselfAsItGrows)

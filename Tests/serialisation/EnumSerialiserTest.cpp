@@ -12,203 +12,177 @@ using namespace Kernel;
 using Entries = std::vector<EnumSerialiser::EnumEntry>;
 using Indices = std::vector<FlagSerialiser::FlagIndex>;
 
-// The plain search that every shape has to agree with.
-int FindCode(Entries const& entries, int value)
+class SerialiserModelTest : public testing::Test
 {
-    for (size_t i = 0; i < entries.size(); ++i)
-        if (!entries[i].retired && entries[i].value == value) return static_cast<int>(i);
-    return -1;
+protected:
+    u64 Below(u64 bound) { return m_random() % bound; }
+    std::mt19937_64 m_random{7};
+};
+using EnumSerialiserTest = SerialiserModelTest;
+using FlagSerialiserTest = SerialiserModelTest;
+
+// The plain searches that every shape of a table has to agree with. Sets are tried from the oldest on.
+bool FindCodes(std::vector<Entries> const& sets, std::vector<int> const& values, std::vector<u16>& codes, u16& version)
+{
+    for (version = 0; version < sets.size(); ++version) {
+        codes.clear();
+        for (int const value : values) {
+            auto const& set = sets[version];
+            auto const is = [&](auto const& entry) { return !entry.retired && entry.value == value; };
+            auto const found = std::find_if(set.begin(), set.end(), is);
+            if (found != set.end()) codes.push_back(static_cast<u16>(found - set.begin()));
+        }
+        if (codes.size() == values.size()) return true;
+    }
+    return false;
 }
 
-TEST(EnumSerialiser, EveryShapeAgreesWithAPlainSearch)
+TEST_F(EnumSerialiserTest, EveryShapeOfEveryVersionAgreesWithAPlainSearch)
 {
     constexpr int top = std::numeric_limits<int>::max();
     constexpr int bottom = std::numeric_limits<int>::min();
-    Entries const tables[] = {
-        {{0}},
-        {{5}},
-        {{5, 1}},
-        {{0}, {1}, {2}},
-        {{-2}, {-1}, {0}},
-        {{top - 1}, {top}},
-        {{bottom}, {bottom + 1}},
-        {{bottom}, {0}, {top}},
-        {{1}, {4}, {9}, {16}},
-        {{9}, {4}, {1}},
-        {{0}, {1, 1}, {2}},
-        {{3}, {3}, {4}},
-        {{3, 1}, {3}, {4}},
-        {{0}, {2}, {1}},
-    };
-    for (size_t t = 0; t < std::size(tables); ++t) {
-        SCOPED_TRACE(t);
-        Entries const& table = tables[t];
+    int const pool[] = {bottom, bottom + 1, -3, -2, -1, 0, 1, 2, 3, 4, 5, 9, 16, top - 1, top};
+    for (int round = 0; round < 2000; ++round) {
+        SCOPED_TRACE(round);
+        std::vector<Entries> sets(1 + Below(3));
         EnumSerialiser serialiser;
-        serialiser.RegisterEnumSet(table.data(), table.size());
-        for (int const value : {bottom, bottom + 1, -3, -2, -1, 0, 1, 2, 3, 4, 5, 6, 9, 15, 16, 17, top - 1, top}) {
-            unsigned short code = 77;
-            unsigned short version = 77;
-            int const expected = FindCode(table, value);
-            EXPECT_EQ(serialiser.EncodeToSerial(value, code, version), expected >= 0) << value;
-            EXPECT_EQ(code, expected >= 0 ? expected : 77) << value;
-            EXPECT_EQ(version, expected >= 0 ? 0 : 77) << value;
+        for (Entries& set : sets) {
+            u64 const start = Below(std::size(pool));
+            u64 const end = start + 1 + Below(std::size(pool) - start);
+            for (u64 i = start; i < end; ++i) set.push_back({pool[i]}); // A run by 1, or ascending with gaps.
+            if (Below(3) == 0) set[Below(set.size())].retired = 1;
+            if (Below(3) == 0) std::shuffle(set.begin(), set.end(), m_random);
+            if (Below(3) == 0) set.push_back(set[Below(set.size())]); // A value twice.
+            serialiser.RegisterEnumSet(set.data(), set.size());
         }
-        for (size_t i = 0; i < table.size(); ++i) {
-            int value = 0;
-            serialiser.DecodeFromSerial(static_cast<u16>(i), 0, value);
-            EXPECT_EQ(value, table[i].value);
+        for (int i = 0; i < 30; ++i) {
+            std::vector<int> values(i < 15 ? 1 : Below(4));
+            for (int& value : values) value = pool[i < 15 ? static_cast<u64>(i) : Below(std::size(pool))];
+            std::vector<u16> expected;
+            std::vector<u16> codes;
+            u16 expectedVersion = 0;
+            u16 version = 9;
+            bool const isKnown = FindCodes(sets, values, expected, expectedVersion);
+            ASSERT_EQ(serialiser.EncodeToSerial(values.data(), values.size(), codes, version), isKnown);
+            if (!isKnown) continue;
+            ASSERT_TRUE(codes == expected && version == expectedVersion);
+            std::vector<int> decoded;
+            serialiser.DecodeFromSerial(codes.data(), codes.size(), version, decoded);
+            ASSERT_EQ(decoded, values);
         }
         int value = 0;
-        EXPECT_THROW(serialiser.DecodeFromSerial(static_cast<u16>(table.size()), 0, value),
-                     UnknownEnumVersionException);
-        EXPECT_THROW(serialiser.DecodeFromSerial(0, 1, value), UnknownEnumVersionException);
+        for (u16 version = 0; version < sets.size(); ++version) {
+            for (size_t i = 0; i < sets[version].size(); ++i) {
+                serialiser.DecodeFromSerial(static_cast<u16>(i), version, value);
+                ASSERT_EQ(value, sets[version][i].value); // Retired ones too.
+            }
+            EXPECT_THROW(serialiser.DecodeFromSerial(static_cast<u16>(sets[version].size()), version, value),
+                         UnknownEnumVersionException);
+        }
+        EXPECT_THROW(serialiser.DecodeFromSerial(0, static_cast<u16>(sets.size()), value), UnknownEnumVersionException);
     }
 }
 
-TEST(EnumSerialiser, ValueIsStoredUnderTheOldestVersionThatHasIt)
-{
-    EnumSerialiser serialiser;
-    serialiser.RegisterEnumSet({{0}, {1}, {2}});
-    serialiser.RegisterEnumSet({{0}, {1, 1}, {7}});
-    serialiser.RegisterEnumSet({{7}, {2}});
-    struct
-    {
-        std::vector<int> values;
-        int version; // -1 if no set knows them all.
-        std::vector<unsigned short> codes;
-    } const cases[] = {
-        {{1}, 0, {1}},    {{7}, 1, {2}}, {{0, 7}, 1, {0, 2}}, {{2, 7}, 2, {1, 0}},
-        {{1, 7}, -1, {}}, {{8}, -1, {}}, {{}, 0, {}},
-    };
-    for (auto const& one : cases) {
-        SCOPED_TRACE(testing::PrintToString(one.values));
-        std::vector<unsigned short> codes;
-        unsigned short version = 9;
-        bool const isKnown = serialiser.EncodeToSerial(one.values.data(), one.values.size(), codes, version);
-        ASSERT_EQ(isKnown, one.version >= 0);
-        if (!isKnown) continue;
-        EXPECT_EQ(version, one.version);
-        EXPECT_EQ(codes, one.codes);
-        std::vector<int> values;
-        serialiser.DecodeFromSerial(codes.data(), codes.size(), version, values);
-        EXPECT_EQ(values, one.values);
-    }
-    int two[2] = {-1, -1};
-    unsigned short const codes[] = {2, 1, 3};
-    serialiser.DecodeFromSerial(codes, 3, 0, two, 2);
-    EXPECT_EQ(two[0], 2);
-    EXPECT_EQ(two[1], 1);
-}
-
-TEST(EnumSerialiser, TablesThatCodesCannotNameAreIgnored)
+TEST_F(EnumSerialiserTest, TablesThatCodesCannotNameAreIgnored)
 {
     Entries entries(65536);
     for (int i = 0; i < 65536; ++i) entries[static_cast<size_t>(i)].value = i;
     EnumSerialiser serialiser;
-    unsigned short code = 0;
-    unsigned short version = 0;
+    u16 code = 77;
+    u16 version = 77;
     serialiser.RegisterEnumSet(entries.data(), 65536);
     serialiser.RegisterEnumSet(nullptr, 1);
     serialiser.RegisterEnumSet(entries.data(), 0);
     EXPECT_FALSE(serialiser.EncodeToSerial(0, code, version));
+    EXPECT_TRUE(code == 77 && version == 77);
     serialiser.RegisterEnumSet(entries.data(), 65535);
     EXPECT_TRUE(serialiser.EncodeToSerial(65534, code, version));
     EXPECT_EQ(code, 65534);
     EXPECT_FALSE(serialiser.EncodeToSerial(65535, code, version));
 }
 
-// Bit by bit, for tables of the shape that the fast forms do not cover.
-bool EncodeSlowly(Indices const& entries, u64 flags, u64& encoded)
+// Bit by bit. A run of bits takes whatever it is given, which then need not decode.
+bool EncodeSlowly(std::vector<Indices> const& sets, u64 flags, u64& encoded, u16& version, bool& isCovered)
 {
-    encoded = 0;
-    for (int bit = 0; bit < 64; ++bit) {
-        if (!(flags >> bit & 1)) continue;
-        bool isKnown = false;
-        for (size_t i = 0; i < entries.size(); ++i) {
-            if (entries[i].retired || entries[i].bit != bit) continue;
+    for (version = 0; version < sets.size(); ++version) {
+        Indices const& set = sets[version];
+        u64 covered = encoded = 0;
+        bool isRun = true;
+        for (size_t i = 0; i < set.size(); ++i) {
+            isRun = isRun && !set[i].retired && set[i].bit == set[0].bit + static_cast<int>(i);
+            if (set[i].retired || !(flags >> set[i].bit & 1)) continue;
+            covered |= u64{1} << set[i].bit;
             encoded |= u64{1} << i;
-            isKnown = true;
         }
-        if (!isKnown) return false;
+        isCovered = covered == flags;
+        if (isRun) encoded = flags >> set[0].bit;
+        if (isRun || isCovered) return true;
     }
-    return true;
+    return false;
 }
 
-TEST(FlagSerialiser, MixedTablesMoveEachBit)
+TEST_F(FlagSerialiserTest, EveryShapeOfEveryVersionMovesEachBit)
 {
-    std::mt19937_64 random(7);
-    for (int round = 0; round < 200; ++round) {
-        Indices entries;
-        for (int bit = 0; bit < 64; ++bit)
-            if (random() % 3) entries.push_back({bit, random() % 8 == 0});
-        std::shuffle(entries.begin(), entries.end(), random);
+    for (int round = 0; round < 500; ++round) {
+        SCOPED_TRACE(round);
+        std::vector<Indices> sets(1 + Below(3));
         FlagSerialiser serialiser;
-        serialiser.RegisterFlagIndices(entries.data(), entries.size());
+        for (Indices& set : sets) {
+            int const start = Below(2) ? static_cast<int>(Below(64)) : 0;
+            int const end = start + 1 + static_cast<int>(Below(static_cast<u64>(64 - start)));
+            bool const isRun = Below(2);
+            for (int bit = start; bit < end; ++bit)
+                if (isRun || bit == start || Below(3)) set.push_back({bit, !isRun && Below(8) == 0});
+            if (!isRun) std::shuffle(set.begin(), set.end(), m_random);
+            serialiser.RegisterFlagIndices(set.data(), set.size());
+        }
+        u64 value = 0;
+        unsigned char activeBytes = 0;
         for (int i = 0; i < 20; ++i) {
-            u64 const flags = random() & random() & random() & random();
+            u64 const flags = m_random() & m_random() & (i < 10 ? u64{0xFF} << Below(64) : m_random());
             u64 expected = 0;
             u64 encoded = 0;
-            unsigned short version = 9;
-            bool const isKnown = EncodeSlowly(entries, flags, expected);
+            u16 expectedVersion = 0;
+            u16 version = 9;
+            bool isCovered = false;
+            bool const isKnown = EncodeSlowly(sets, flags, expected, expectedVersion, isCovered);
             ASSERT_EQ(serialiser.EncodeToSerial(flags, encoded, version), isKnown);
             if (!isKnown) continue;
-            ASSERT_EQ(encoded, expected);
-            u64 decoded = 0;
-            unsigned char activeBytes = 0;
-            serialiser.DecodeFromSerial(encoded, version, decoded, activeBytes);
-            ASSERT_EQ(decoded, flags);
+            ASSERT_TRUE(encoded == expected && version == expectedVersion);
+            if (!isCovered) continue;
+            serialiser.DecodeFromSerial(encoded, version, value, activeBytes);
+            ASSERT_EQ(value, flags);
         }
+        for (u16 version = 0; version < sets.size(); ++version) {
+            Indices const& set = sets[version];
+            int last = -8;
+            for (auto const& index : set)
+                if (!index.retired) last = std::max(last, index.bit);
+            for (size_t i = 0; i < set.size(); ++i) {
+                serialiser.DecodeFromSerial(u64{1} << i, version, value, activeBytes);
+                ASSERT_EQ(value, u64{1} << set[i].bit); // Retired ones too.
+                ASSERT_TRUE(last < 0 || activeBytes == last / 8 + 1);
+            }
+            if (set.size() == 64) continue;
+            EXPECT_THROW(serialiser.DecodeFromSerial(u64{1} << set.size(), version, value, activeBytes),
+                         UnknownFlagVersionException);
+        }
+        EXPECT_THROW(serialiser.DecodeFromSerial(0, static_cast<u16>(sets.size()), value, activeBytes),
+                     UnknownFlagVersionException);
     }
 }
 
-TEST(FlagSerialiser, LaterSetsTakeWhatEarlierOnesCannot)
+TEST_F(FlagSerialiserTest, TablesThatAWordCannotHoldAreIgnored)
 {
-    FlagSerialiser serialiser;
     Indices const tooMany(65, FlagSerialiser::FlagIndex{1});
-    serialiser.RegisterFlagIndices(tooMany.data(), 65); // Ignored, as the next two.
+    FlagSerialiser serialiser;
+    serialiser.RegisterFlagIndices(tooMany.data(), 65);
     serialiser.RegisterFlagIndices(nullptr, 1);
     serialiser.RegisterFlagIndices(tooMany.data(), 0);
-    serialiser.RegisterFlagIndices({{1}, {0}, {20, 1}});
-    serialiser.RegisterFlagIndices({{20}, {0}});
-    Indices all;
-    for (int i = 0; i < 64; ++i) all.push_back({i});
-    serialiser.RegisterFlagIndices(all.data(), 64);
-    u64 encoded = 0;
-    unsigned short version = 9;
-    EXPECT_TRUE(serialiser.EncodeToSerial(1u << 20 | 1, encoded, version));
-    EXPECT_EQ(encoded, 3u);
-    EXPECT_EQ(version, 1);
-
-    FlagSerialiser run;
-    run.RegisterFlagIndices({{3}, {4}});
-    struct
-    {
-        FlagSerialiser const& serialiser;
-        u64 encoded;
-        unsigned short version;
-        u64 flags;
-        int activeBytes; // 0: unknown.
-    } const cases[] = {
-        {serialiser, 4, 0, 1u << 20, 1}, // Retired, but it decodes.
-        {serialiser, 1, 1, 1u << 20, 3},
-        {serialiser, ~u64{0}, 2, ~u64{0}, 8},
-        {serialiser, 8, 0, 0, 0},
-        {serialiser, 0, 3, 0, 0},
-        {run, 3, 0, 0x18, 1},
-        {run, 4, 0, 0, 0},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.encoded);
-        u64 flags = 0;
-        unsigned char activeBytes = 0;
-        try {
-            c.serialiser.DecodeFromSerial(c.encoded, c.version, flags, activeBytes);
-        } catch (UnknownFlagVersionException const&) {
-            activeBytes = 0;
-        }
-        EXPECT_EQ(flags, c.flags);
-        EXPECT_EQ(activeBytes, c.activeBytes);
-    }
+    u64 encoded = 5;
+    u16 version = 5;
+    EXPECT_FALSE(serialiser.EncodeToSerial(0, encoded, version));
+    EXPECT_TRUE(encoded == 5 && version == 5);
 }
 
 } // namespace

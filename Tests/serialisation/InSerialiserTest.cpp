@@ -7,19 +7,13 @@
 #include "libkernel/serialisation/InSerialiserPropertyDataStream.h"
 #include "serialisation/ReaderClasses.h"
 #include "support/LoadEverything.h"
+#include "support/Rows.h"
 
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
 namespace Kernel::Test {
 namespace {
-
-struct Number
-{
-    char const* what;
-    u8 type;
-    bool (*loads)(InSerialiser const&, IDTag);
-};
 
 template <class T>
 bool Loads(InSerialiser const& in, IDTag tag)
@@ -28,32 +22,27 @@ bool Loads(InSerialiser const& in, IDTag tag)
     return in.LoadType(tag, value);
 }
 
-constexpr Number c_numbers[] = {{"u8", 1, &Loads<u8>},          {"u16", 2, &Loads<u16>},    {"u32", 3, &Loads<u32>},
-                                {"u64", 4, &Loads<u64>},        {"i8", 5, &Loads<i8>},      {"i16", 6, &Loads<i16>},
-                                {"i32", 7, &Loads<i32>},        {"i64", 8, &Loads<i64>},    {"float", 9, &Loads<float>},
-                                {"double", 10, &Loads<double>}, {"bool", 41, &Loads<bool>}, {"tag", 47, &Loads<IDTag>},
-                                {"uid", 52, &Loads<ClassUID>}};
+constexpr std::pair<u8, bool (*)(InSerialiser const&, IDTag)> c_numbers[] = {
+    {1, &Loads<u8>},    {2, &Loads<u16>},    {3, &Loads<u32>},      {4, &Loads<u64>},   {5, &Loads<i8>},
+    {6, &Loads<i16>},   {7, &Loads<i32>},    {8, &Loads<i64>},      {9, &Loads<float>}, {10, &Loads<double>},
+    {41, &Loads<bool>}, {47, &Loads<IDTag>}, {52, &Loads<ClassUID>}};
 
 TEST(InSerialiserTest, NumberLoadsAsItsOwnTypeAlone)
 {
-    for (Number const& stored : c_numbers) {
-        PropertyBytes b;
-        b.Header().Item(stored.type, "Valu").Zeros(c_propSizes[stored.type]).End();
+    for (auto const& [stored, ignored] : c_numbers) {
+        PropertyBytes const b = PropertyBytes().Header().Item(stored, "Valu").Zeros(c_propSizes[stored]).End();
         Counted<InSerialiserFile> const file = Parse(b.bytes);
-        ASSERT_TRUE(file) << stored.what;
-        for (Number const& asked : c_numbers) {
-            EXPECT_EQ(asked.loads(*file, IDTag("Valu")), asked.type == stored.type)
-                << stored.what << " as " << asked.what;
-            EXPECT_FALSE(asked.loads(*file, IDTag("Othr")));
+        ASSERT_TRUE(file) << int(stored);
+        for (auto const& [asked, loads] : c_numbers) {
+            EXPECT_EQ(loads(*file, IDTag("Valu")), asked == stored) << int(stored) << " as " << int(asked);
+            EXPECT_FALSE(loads(*file, IDTag("Othr")));
         }
     }
 }
 
 TEST(InSerialiserTest, RefusedLoadLeavesTheOutputUntouched)
 {
-    PropertyBytes b;
-    b.Header().U32Item("Numb", 5).TextItem("Text", "t").Item(0x83, "Arry").U32(1).U32(9).End();
-    Counted<InSerialiserFile> const file = Parse(b.bytes);
+    auto const file = ParseItems("03 [Numb] 05000000 | 2B [Text] 01000000 't' | 83 [Arry] 01000000 09000000");
     ASSERT_TRUE(file);
     u64 wide = 77;
     String8 text = "before";
@@ -128,28 +117,33 @@ TEST(InSerialiserTest, EveryItemFormLoadsByEveryDelivery)
     }
 }
 
-TEST(InSerialiserTest, CapacityRuleHoldsForEveryKindOfArray)
+// As many as there is room for, and with the number stored more room than needed.
+template <class T, size_t N>
+void ExpectCapacityRule(IDTag tag, T (&values)[N], u64 expected)
 {
     Counted<InSerialiserFile> const in = Parse(EveryItemForm().bytes);
-    ASSERT_TRUE(in);
+    T const last = values[N - 1];
     u64 stored = 0;
-    bool bits[12];
-    EXPECT_FALSE(in->LoadTypes("Bits", bits, 12));
-    EXPECT_TRUE(in->LoadTypes("Bits", bits, 11));
-    EXPECT_TRUE(in->LoadTypes("Bits", bits, 2, &stored));
-    EXPECT_EQ(stored, 11u);
+    EXPECT_FALSE(in->LoadTypes(tag, values, N));
+    EXPECT_TRUE(in->LoadTypes(tag, values, expected));
+    values[N - 1] = last;
+    EXPECT_TRUE(in->LoadTypes(tag, values, N, &stored));
+    EXPECT_EQ(stored, expected);
+    EXPECT_EQ(values[N - 1], last);
+    EXPECT_TRUE(in->LoadTypes(tag, values, 1, &stored));
+    EXPECT_EQ(stored, expected);
+}
+
+TEST(InSerialiserTest, CapacityRuleHoldsForEveryKindOfArray)
+{
+    bool bits[12] = {};
     String8 texts[3] = {"x", "x", "x"};
-    EXPECT_FALSE(in->LoadTypes("Txts", texts, 3));
-    EXPECT_TRUE(in->LoadTypes("Txts", texts, 3, &stored));
-    EXPECT_EQ(stored, 2u);
-    EXPECT_EQ(texts[0], "ab");
-    EXPECT_EQ(texts[2], "x");
     u32 numbers[4] = {9, 9, 9, 9};
-    EXPECT_FALSE(in->LoadTypes(IDTag(0x20003), numbers, 1));
-    EXPECT_TRUE(in->LoadTypes(IDTag(0x20003), numbers, 1, &stored));
-    EXPECT_EQ(stored, 2u);
-    EXPECT_EQ(numbers[0], 0u);
-    EXPECT_EQ(numbers[1], 9u);
+    ExpectCapacityRule("Bits", bits, 11);
+    ExpectCapacityRule("Txts", texts, 2);
+    ExpectCapacityRule(IDTag(0x20003), numbers, 2);
+    EXPECT_EQ(texts[0], "ab");
+    EXPECT_EQ(numbers[1], 0u);
 }
 
 TEST(InSerialiserTest, EnumsAndFlagsGoThroughTheirSerialisers)
@@ -186,9 +180,7 @@ TEST(InSerialiserTest, EnumsAndFlagsGoThroughTheirSerialisers)
 
 TEST(InSerialiserTest, SwappedRawDataComesBackOnTheNextLoad)
 {
-    PropertyBytes b;
-    b.Header().Item(0x2D, "Data").U32(2).Raw({5, 6}).Item(0x2D, "None").U32(0).End();
-    Counted<InSerialiserFile> const in = Parse(b.bytes);
+    auto const in = ParseItems("2D [Data] 02000000 0506 | 2D [None] 00000000");
     ASSERT_TRUE(in);
     RawDataBlock mine(7);
     void const* const before = mine.GetData();
@@ -228,10 +220,8 @@ TEST(InSerialiserTest, LaterItemReplacesEarlierOfItsTag)
 TEST(InSerialiserTest, TearDownReleasesWhatItHolds)
 {
     int const before = ReaderNode::s_alive;
-    PropertyBytes b;
-    b.Header().Item(0x31, "Objt").Object(0).RootClass("RdNo").End();
-    b.Item(0xB1, "Arry").U32(2).Object(1).KnownClass("RdNo").End().U8(0).End();
-    Counted<InSerialiserFile> const in = Parse(b.bytes);
+    auto const in = ParseItems("31 [Objt] 01 00000000 00 [RdNo] 0100 00 02 00"
+                               "B1 [Arry] 02000000 01 01000000 01 [RdNo] 00 00");
     ASSERT_TRUE(in);
     EXPECT_EQ(ReaderNode::s_alive, before + 2);
     in->TearDown("Arry");
@@ -240,7 +230,7 @@ TEST(InSerialiserTest, TearDownReleasesWhatItHolds)
     EXPECT_EQ(ReaderNode::s_alive, before);
 }
 
-TEST(InSerialiserTest, NullAnswersForPlainAndShared)
+TEST(InSerialiserTest, NullIsOfAnyClassAndAnotherClassIsRefusedBeforeItIsCast)
 {
     Counted<InSerialiserFile> const in = Parse(EveryItemForm().bytes);
     ASSERT_TRUE(in);
@@ -248,19 +238,12 @@ TEST(InSerialiserTest, NullAnswersForPlainAndShared)
     Consolidated<ReaderShared> shared;
     std::vector<Counted<ReaderNode>> nodes;
     std::vector<Consolidated<ReaderShared>> allShared;
-    EXPECT_TRUE(in->LoadObject("NulO", node));
-    EXPECT_FALSE(node);
+    EXPECT_TRUE(in->LoadObject("NulO", node) && !node);
     EXPECT_TRUE(in->LoadSharedObject("NulO", shared));
     EXPECT_TRUE(in->LoadObjects("NulA", nodes) && nodes.size() == 4 && !nodes[3]);
     EXPECT_TRUE(in->LoadSharedObjects("NulA", allShared) && allShared.size() == 4);
-}
 
-TEST(InSerialiserTest, ObjectOfAnotherClassIsRefusedBeforeItIsCast)
-{
-    Counted<InSerialiserFile> const in = Parse(EveryItemForm().bytes);
-    ASSERT_TRUE(in);
     Counted<ReaderLegacy> legacy;
-    Consolidated<ReaderShared> shared;
     std::vector<Counted<ReaderLegacy>> legacies;
     Counted<Serialisable> plain;
     EXPECT_FALSE(in->LoadObject("Root", legacy));
@@ -274,27 +257,19 @@ TEST(InSerialiserTest, ObjectOfAnotherClassIsRefusedBeforeItIsCast)
 
 TEST(InSerialiserTest, JsonTextLoadsUnlessItIsBadOrTooDeep)
 {
-    struct
+    std::string const deepest = std::string(1000, '[') + std::string(1000, ']');
+    for (auto const& [text, loads] : Rows<std::string, bool>{{R"({"a": [1, 2.5, "x"]})", true},
+                                                             {"/* \" [ */ [1] // [", true},
+                                                             {"[1", false},
+                                                             {deepest, true},
+                                                             {"[" + deepest + "]", false},
+                                                             {"/*\"*/" + std::string(1001, '['), false}})
     {
-        char const* what;
-        std::string text;
-        bool loads;
-    } const cases[] = {
-        {"object", R"({"a": [1, 2.5, "x"]})", true},
-        {"comment", "/* \" [ */ [1] // [", true},
-        {"cut", "[1", false},
-        {"deepest", std::string(1000, '[') + std::string(1000, ']'), true},
-        {"too deep", std::string(1001, '[') + std::string(1001, ']'), false},
-        {"too deep behind a quote in a comment", "/*\"*/" + std::string(1001, '['), false},
-    };
-    for (auto const& c : cases) {
-        PropertyBytes b;
-        b.Header().TextItem("Json", c.text).End();
-        Counted<InSerialiserFile> const in = Parse(b.bytes);
+        Counted<InSerialiserFile> const in = Parse(PropertyBytes().Header().TextItem("Json", text).End().bytes);
         ASSERT_TRUE(in);
         nlohmann::json value = 5;
-        EXPECT_EQ(in->LoadType("Json", value), c.loads) << c.what;
-        EXPECT_EQ(value == 5, !c.loads) << c.what;
+        EXPECT_EQ(in->LoadType("Json", value), loads) << text.substr(0, 30);
+        EXPECT_EQ(value == 5, !loads) << text.substr(0, 30);
     }
 }
 
@@ -318,9 +293,7 @@ TEST(InSerialiserTest, LongTextsAreSharedAndCorrect)
 
 TEST(InSerialiserPropertyDataStreamTest, MismatchDoesNotAdvance)
 {
-    PropertyBytes b;
-    b.Header().Item(0x30, "Strm").U16(1).U8(3).U32(5).U8(0x83).U32(1).U32(6).End().End();
-    Counted<InSerialiserFile> const in = Parse(b.bytes);
+    auto const in = ParseItems("30 [Strm] 0100 | 03 05000000 | 83 01000000 06000000 | 00");
     InSerialiserPropertyDataStream s;
     ASSERT_TRUE(in && in->LoadDataStream("Strm", s));
     u64 wide = 1;

@@ -3,6 +3,7 @@
 #include "libkernel/serialisation/OutSerialiserPropertyDataStream.h"
 #include "serialisation/WriterTestSupport.h"
 #include "support/MemoryFileStore.h"
+#include "support/Rows.h"
 
 namespace KernelTest {
 namespace {
@@ -23,92 +24,53 @@ TEST(OutSerialiserFailures, EachMisuseHasItsCode)
     FlagSerialiser flags;
     flags.RegisterFlagIndices({{2}, {0}});
     static u8 const huge[65536] = {};
-    struct
-    {
-        char const* what;
-        SaveFunction save;
-        int code;
-    } const cases[] = {
-        {"tag twice",
-         [](OutSerialiser& o) {
-             o.SaveType("Tag1", 1);
-             o.SaveType("Tag1", String8("other"));
-         },
-         3},
-        {"tag after a class",
-         [](OutSerialiser& o) {
-             o.SaveClass("Tag1", Point());
-             o.SaveObject("Tag1", nullptr);
-         },
-         3},
-        {"struct of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65536); }, 2},
-        {"struct of 65,535 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65535); }, -1},
-        {"structs of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 65536, 1); }, 2},
-        {"2^32 structs", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 1, u64{1} << 32); }, 2},
-        {"2^32 numbers", [](OutSerialiser& o) { o.SaveTypes("Tag1", huge, u64{1} << 32); }, 2},
-        {"2^32 bytes", [](OutSerialiser& o) { o.SaveRawData("Tag1", huge, u64{1} << 32); }, 2},
-        {"raw struct of 0 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 0); }, 2},
-        {"raw struct of 64 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 64); }, -1},
-        {"raw struct of 65 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 65); }, 2},
-        {"unknown enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 2); }, 4},
-        {"retired enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 5); }, 4},
-        {"one unknown of two enums",
-         [&](OutSerialiser& o) {
-             o.SaveEnums("Tag1", enums, std::vector<int>{1, 2});
-         },
-         4},
-        {"unknown flag", [&](OutSerialiser& o) { o.SaveFlagSet("Tag1", flags, u8{2}); }, 4},
-        {"alignment of 9", [](OutSerialiser& o) { o.SaveAlignedRawData("Tag1", huge, 1, 9); }, 5},
-        {"type of variable size", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::String, huge, 4); }, 5},
-        {"size that is not the type's", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::UInt16, huge, 4); }, 5},
-        {"data stream below an open one",
-         [](OutSerialiser& o) {
-             OutSerialiserPropertyDataStream first(o, "Tag1", 1);
-             OutSerialiserPropertyDataStream second(o, "Tag2", 1);
-         },
-         5},
-        {"value beside an open data stream",
-         [](OutSerialiser& o) {
-             OutSerialiserPropertyDataStream stream(o, "Tag1", 1);
-             stream.Close();
-             o.SaveType("Tag2", 1);
-         },
-         3},
-        {"value after the data stream's end",
-         [](OutSerialiser& o) {
-             OutSerialiserPropertyDataStream stream(o, "Tag1", 1);
-             stream.Close();
-             stream.SaveValue(1);
-         },
-         5},
-        {"object in a data stream",
-         [](OutSerialiser& o) { OutSerialiserPropertyDataStream(o, "Tag1", 1).SaveValueI(PropType::Object, huge, 1); },
-         5},
-        {"list closed below a child",
-         [](OutSerialiser& o) {
-             o.StartClassTestI("Tag1");
-             o.StartClassBeginI("Tag1", "Poin", 1);
-             o.Close();
-         },
-         3},
-        {"value beside a child",
-         [](OutSerialiser& o) {
-             o.StartClassTestI("Tag1");
-             o.StartClassBeginI("Tag1", "Poin", 1);
-             o.SaveType("Tag2", 1);
-         },
-         3},
-        {"value after the end",
-         [](OutSerialiser& o) {
-             o.Close();
-             o.SaveType("Tag1", 1);
-         },
-         5},
+    static auto const beginChild = [](OutSerialiser& o) {
+        o.StartClassTestI("Tag1"), o.StartClassBeginI("Tag1", "Poin", 1);
     };
-    for (auto const& one : cases) {
-        SCOPED_TRACE(one.what);
-        EXPECT_EQ(ListCode(one.save), one.code);
-    }
+    using Stream = OutSerialiserPropertyDataStream;
+    for (auto const& [what, save, code] : Rows<char const*, SaveFunction, int>{
+             {"tag twice", [](OutSerialiser& o) { o.SaveType("Tag1", 1), o.SaveType("Tag1", String8("other")); }, 3},
+             {"tag after a class",
+              [](OutSerialiser& o) { o.SaveClass("Tag1", Point()), o.SaveObject("Tag1", nullptr); }, 3},
+             {"struct of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65536); }, 2},
+             {"struct of 65,535 bytes", [](OutSerialiser& o) { o.SavePropertyStructI("Tag1", huge, 65535); }, -1},
+             {"structs of 65,536 bytes", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 65536, 1); },
+              2},
+             {"2^32 structs", [](OutSerialiser& o) { o.SavePropertyStructArrayI("Tag1", huge, 1, u64{1} << 32); }, 2},
+             {"2^32 numbers", [](OutSerialiser& o) { o.SaveTypes("Tag1", huge, u64{1} << 32); }, 2},
+             {"2^32 bytes", [](OutSerialiser& o) { o.SaveRawData("Tag1", huge, u64{1} << 32); }, 2},
+             {"raw struct of 0 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 0); }, 2},
+             {"raw struct of 64 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 64); }, -1},
+             {"raw struct of 65 bytes", [](OutSerialiser& o) { o.SaveRawStructI("Tag1", huge, 65); }, 2},
+             {"unknown enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 2); }, 4},
+             {"retired enum", [&](OutSerialiser& o) { o.SaveEnum("Tag1", enums, 5); }, 4},
+             {"unknown enums", [&](OutSerialiser& o) { o.SaveEnums("Tag1", enums, std::vector<int>(2, 2)); }, 4},
+             {"unknown flag", [&](OutSerialiser& o) { o.SaveFlagSet("Tag1", flags, u8{2}); }, 4},
+             {"alignment of 9", [](OutSerialiser& o) { o.SaveAlignedRawData("Tag1", huge, 1, 9); }, 5},
+             {"type of variable size", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::String, huge, 4); }, 5},
+             {"size that is not the type's", [](OutSerialiser& o) { o.SaveTypeI("Tag1", PropType::UInt16, huge, 4); },
+              5},
+             {"data stream below an open one",
+              [](OutSerialiser& o) { Stream const first(o, "Tag1", 1), second(o, "Tag2", 1); }, 5},
+             {"value beside an open data stream",
+              [](OutSerialiser& o) {
+                  Stream stream(o, "Tag1", 1);
+                  stream.Close(), o.SaveType("Tag2", 1);
+              },
+              3},
+             {"value after the data stream's end",
+              [](OutSerialiser& o) {
+                  Stream stream(o, "Tag1", 1);
+                  stream.Close(), stream.SaveValue(1);
+              },
+              5},
+             {"object in a data stream",
+              [](OutSerialiser& o) { Stream(o, "Tag1", 1).SaveValueI(PropType::Object, huge, 1); }, 5},
+             {"list closed below a child", [](OutSerialiser& o) { beginChild(o), o.Close(); }, 3},
+             {"value beside a child", [](OutSerialiser& o) { beginChild(o), o.SaveType("Tag2", 1); }, 3},
+             {"value after the end", [](OutSerialiser& o) { o.Close(), o.SaveType("Tag1", 1); }, 5},
+         })
+        EXPECT_EQ(ListCode(save), code) << what;
 }
 
 TEST(OutSerialiserFailures, LongListRemembersEveryTag)

@@ -1,5 +1,7 @@
 #include "serialisation/WriterTestSupport.h"
 
+#include <deque>
+
 namespace KernelTest {
 namespace {
 
@@ -9,7 +11,7 @@ SharedClassProperties const& SharedClass()
     return description;
 }
 
-TEST(OutSerialiserObjects, FirstAppearanceDescribesTheClassAndItsParents)
+TEST(OutSerialiserObjects, FirstAppearanceDescribesTheClassAndItsParentsAndLaterOnesRefer)
 {
     auto const rootDefaults = Defaults::Make(Defaults::Value("Size", u16{7}));
     ClassProperties const root = MakeClass("Root", rootDefaults);
@@ -18,6 +20,7 @@ TEST(OutSerialiserObjects, FirstAppearanceDescribesTheClassAndItsParents)
     ClassProperties const leaf = MakeClass("Leaf", leafDefaults, &middle);
     auto const object = MakeCounted<Thing>(&leaf, [](OutSerialiser& out) { out.SaveType("Kind", u8{1}); });
     auto const sibling = MakeCounted<Thing>(&middle);
+    sibling->m_save = [&](OutSerialiser& out) { out.SaveObject("Self", sibling.Get(), false); };
     std::string const list = SaveList([&](OutSerialiser& out) {
         out.SaveObject("Obj1", object);
         out.SaveObject("Obj2", sibling, false);
@@ -26,7 +29,7 @@ TEST(OutSerialiserObjects, FirstAppearanceDescribesTheClassAndItsParents)
     EXPECT_EQ(Show(list),
               Show(Bytes("31 [Obj1] 01 00 00 00 00 | 00 [Leaf] 02 00 | 29 [Bold] 01 | 00"
                          "| 00 [Midd] 02 00 00 | 00 [Root] 02 00 | 02 [Size] 07 00 | 00 | 02 | 01 [Kind] 01 | 00"
-                         "| 31 [Obj2] 01 01 00 00 00 | 01 [Midd] | 00"
+                         "| 31 [Obj2] 01 01 00 00 00 | 01 [Midd] | 31 [Self] 02 01 00 00 00 | 00"
                          "| 31 [Obj3] 02 00 00 00 00 | 00")));
 }
 
@@ -47,46 +50,27 @@ TEST(OutSerialiserObjects, ArraysHoldRecordsAndShareTheIndices)
                          "| 31 [Agai] 02 01 00 00 00 | B1 [None] 00 00 00 00 | 00")));
 }
 
-TEST(OutSerialiserObjects, PlainObjectMayHoldItself)
-{
-    ClassProperties const description = MakeClass("Thng");
-    auto const object = MakeCounted<Thing>(&description);
-    object->m_save = [&](OutSerialiser& out) { out.SaveObject("Self", object.Get(), false); };
-    std::string const list = SaveList([&](OutSerialiser& out) { out.SaveObject("Item", object); });
-    EXPECT_EQ(Show(list), Show(Bytes("31 [Item] 01 00 00 00 00 | 00 [Thng] 02 00 00 02 | 31 [Self] 02 00 00 00 00 | 00"
-                                     "| 00")));
-}
-
-EnumSerialiser MakeEnums()
+// Every kind of default, its item in a description, a save of an equal value, and of one that differs in a part.
+TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
 {
     EnumSerialiser enums;
     enums.RegisterEnumSet({{4}, {9}});
-    return enums;
-}
-
-FlagSerialiser MakeFlags()
-{
     FlagSerialiser flags;
     flags.RegisterFlagIndices({{8}, {0}});
-    return flags;
-}
-
-// Every kind of default, its item in a description, and a save of an equal value.
-TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
-{
-    EnumSerialiser const enums = MakeEnums();
-    FlagSerialiser const flags = MakeFlags();
     auto const shared = MakeShared(SharedClass(), 5);
     u32 const custom = 0x01020304;
+    std::vector<bool> bits = {true, false, true, false, false, false, false, false, true};
+    // The last two values are unknown to their serialisers.
     auto const defaults = Defaults::Make(
-        Defaults::Value("A000", 3), Defaults::Values("A001", std::vector<u16>{1, 2}), Defaults::Text("A002", "ab"),
-        Defaults::Custom("A004", custom), Defaults::Customs("A005", std::vector<u32>{custom}),
-        Defaults::EnumValue("A006", 9, enums), Defaults::EnumValues("A007", std::vector<int>{9, 4}, enums),
-        Defaults::Flags("A008", u16{0x100}, flags), Defaults::Object("A009", shared),
-        Defaults::Objects("A010", {shared, {}}), Defaults::Bools("A011", {true, false, true}),
-        Defaults::Value("A012", ClassUID("Font")));
+        Defaults::Value("A000", 9), Defaults::Value("A000", 3), Defaults::Values("A001", std::vector<u16>{1, 2}),
+        Defaults::Text("A002", "ab"), Defaults::Custom("A004", custom),
+        Defaults::Customs("A005", std::vector<u32>{custom}), Defaults::EnumValue("A006", 9, enums),
+        Defaults::EnumValues("A007", std::vector<int>{9, 4}, enums), Defaults::Flags("A008", u16{0x100}, flags),
+        Defaults::Object("A009", shared), Defaults::Objects("A010", {shared, {}}), Defaults::Bools("A011", bits),
+        Defaults::Value("A012", ClassUID("Font")), Defaults::EnumValue("A013", 1, enums),
+        Defaults::Flags("A014", u8{4}, flags));
     ClassProperties const description = MakeClass("Thng", defaults);
-    auto const equal = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
+    auto const equal = MakeCounted<Thing>(&description, [&, bits](OutSerialiser& out) {
         out.SaveType("A000", 3);
         out.SaveTypes("A001", std::vector<u16>{1, 2});
         out.SaveType("A002", String16(u"ab"));
@@ -97,34 +81,54 @@ TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
         out.SaveFlagSet("A008", flags, u16{0x100});
         out.SaveSharedObject("A009", shared);
         out.SaveSharedObjects("A010", std::vector<Consolidated<SharedSerialisable>>{shared, {}});
-        out.SaveTypes("A011", std::deque<bool>{true, false, true});
+        out.SaveTypes("A011", bits);
         out.SaveType("A012", ClassUID("Font"));
+        out.SaveEnum("A013", enums, 4);
+        out.SaveFlagSet("A014", flags, u8{0});
         EXPECT_TRUE(out.HasProperty("A000"));
     });
+    bits[8] = false;
     auto const other = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
+        out.SaveTypes("A001", std::vector<u16>{1});
+        out.SaveType("A002", "aB");
+        out.SavePropertyStruct("A004", custom + 1);
+        out.SavePropertyStructs("A005", std::vector<u16>{0x0304, 0x0102});
+        out.SaveEnum("A006", enums, 4);
+        out.SaveEnums("A007", enums, std::vector<int>{9, 9});
+        out.SaveFlagSet("A008", flags, u16{0x101});
+        out.SaveSharedObject("A009", nullptr);
+        out.SaveSharedObjects("A010", std::vector<Consolidated<SharedSerialisable>>{shared, shared});
+        out.SaveTypes("A011", bits);
+        out.SaveType("A012", IDTag("Font")); // Another type of the same size.
+    });
+    auto const kinds = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
         out.SaveRawStruct("A000", 3); // Raw values and data are never left out.
         out.SaveRawData("A004", &custom, 4);
-        out.SaveType("A001", 3);             // Another kind.
-        out.SaveType("A012", IDTag("Font")); // Another type of the same size.
-        out.SaveTypes("A011", std::vector<bool>{true, false});
-        out.SaveSharedObject("A009", nullptr);
+        out.SaveType("A001", 3);
+        out.SaveTypes("A011", std::deque<bool>{true, false});
+        out.SavePropertyStruct("A012", ClassUID("Font"));
     });
     std::string const list = SaveList([&](OutSerialiser& out) {
         out.SaveObject("Equa", equal);
         out.SaveObject("Othe", other);
+        out.SaveObject("Kind", kinds);
     });
     EXPECT_EQ(
         Show(list),
-        Show(Bytes(
-            "31 [Equa] 01 00 00 00 00 | 00 [Thng] 02 00 | 07 [A000] 03 00 00 00"
-            "| 82 [A001] 02 00 00 00 01 00 02 00 | 2B [A002] 02 00 00 00 'ab' | 2C [A004] 04 00 04 03 02 01"
-            "| AC [A005] 01 00 00 00 04 00 04 03 02 01 | 2A [A006] 01 00 00 00"
-            "| AA [A007] 02 00 00 00 00 00 01 00 00 00 | 75 [A008] 00 00 01 01"
-            "| 31 [A009] 01 01 00 00 00 00 [Shar] 01 00 00 02 01 [Valu] 05 00"
-            "| B1 [A010] 02 00 00 00 02 01 00 00 00 00 | A9 [A011] 03 00 00 00 05 | 34 [A012] 'tnoF' | 00 | 02 | 00"
-            "| 31 [Othe] 01 02 00 00 00 | 01 [Thng] | 38 [A000] 03 00 00 00 | 2D [A004] 04 00 00 00 04 03 02 01"
-            "| 07 [A001] 03 00 00 00"
-            "| 2F [A012] 'tnoF' | A9 [A011] 02 00 00 00 01 | 31 [A009] 00 | 00 | 00")));
+        Show(Bytes("31 [Equa] 01 00 00 00 00 | 00 [Thng] 02 00 | 07 [A000] 03 00 00 00"
+                   "| 82 [A001] 02 00 00 00 01 00 02 00 | 2B [A002] 02 00 00 00 'ab' | 2C [A004] 04 00 04 03 02 01"
+                   "| AC [A005] 01 00 00 00 04 00 04 03 02 01 | 2A [A006] 01 00 00 00"
+                   "| AA [A007] 02 00 00 00 00 00 01 00 00 00 | 75 [A008] 00 00 01 01"
+                   "| 31 [A009] 01 01 00 00 00 00 [Shar] 01 00 00 02 01 [Valu] 05 00"
+                   "| B1 [A010] 02 00 00 00 02 01 00 00 00 00 | A9 [A011] 09 00 00 00 05 01 | 34 [A012] 'tnoF'"
+                   "| 2A [A013] 00 00 00 00 | 75 [A014] 00 00 00 | 00 | 02 | 00"
+                   "| 31 [Othe] 01 02 00 00 00 | 01 [Thng] | 82 [A001] 01 00 00 00 01 00 | 2B [A002] 02 00 00 00 'aB'"
+                   "| 2C [A004] 04 00 05 03 02 01 | AC [A005] 02 00 00 00 02 00 04 03 02 01 | 2A [A006] 00 00 00 00"
+                   "| AA [A007] 02 00 00 00 00 00 01 00 01 00 | 75 [A008] 00 00 01 03 | 31 [A009] 00"
+                   "| B1 [A010] 02 00 00 00 02 01 00 00 00 02 01 00 00 00 | A9 [A011] 09 00 00 00 05 00 | 2F [A012] "
+                   "'tnoF' | 00"
+                   "| 31 [Kind] 01 03 00 00 00 | 01 [Thng] | 38 [A000] 03 00 00 00 | 2D [A004] 04 00 00 00 04 03 02 01"
+                   "| 07 [A001] 03 00 00 00 | A9 [A011] 02 00 00 00 01 | 2C [A012] 04 00 'tnoF' | 00 | 00")));
 }
 
 TEST(OutSerialiserObjects, NearestDefaultOfTheChainLeavesAValueOut)

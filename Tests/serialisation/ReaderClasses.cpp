@@ -143,6 +143,11 @@ Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks, Deliv
     return checks ? InSerialiserFile::ParseWithChecks(*in) : InSerialiserFile::ParseSkipUnknownClasses(*in);
 }
 
+Counted<InSerialiserFile> ParseItems(std::string_view notation)
+{
+    return Parse(PropertyBytes().Header().Put(notation).End().bytes);
+}
+
 PropertyBytes EveryValueForm(bool everySize)
 {
     PropertyBytes b;
@@ -154,31 +159,17 @@ PropertyBytes EveryValueForm(bool everySize)
         for (u32 i = 0; i < size; ++i) b.U8(static_cast<u8>(i + 1));
         b.U8(static_cast<u8>(type | 0x80)).U32(0x20000 + static_cast<u32>(type)).U32(2).Zeros(2 * size);
     }
-    b.Item(0x29, "Bool").U8(1);
-    b.Item(0xA9, "Bits").U32(11).U8(0x05).U8(0x04);
-    b.Item(0x2A, "Enum").U16(2).U16(0);
-    b.Item(0xAA, "Enms").U32(3).U16(0).U16(2).U16(0).U16(1);
-    b.TextItem("Text", "na\xC3\xAFve");
-    b.Item(0xAB, "Txts").U32(4 + 2 + 4 + 0).U32(2).U32(2).Text("ab").U32(0);
-    b.Item(0x2E, "Shpd").U32(2).Text("xy");
-    b.Item(0xAE, "Shps").U32(5).U32(1).U32(1).Text("z");
-    b.Item(0x2C, "Cust").U16(3).Raw({1, 2, 3});
-    b.Item(0xAC, "Csts").U32(2).U16(3).Raw({1, 2, 3, 4, 5, 6});
-    b.Item(0x2D, "Data").U32(5).Raw({9, 8, 7, 6, 5});
-    b.Item(0x77, "Algn").U32(3).U16(2).Raw({0, 0, 1, 2, 3});
-    b.Item(0x76, "Frag").U32(4).U32(65536).Raw({4, 3, 2, 1});
-    b.Item(0x75, "Flag").U16(0).U8(2).Raw({0x18, 0x01});
-    b.Item(0x30, "Strm").U16(7);
-    b.U8(3).U32(42).U8(0x8A).U32(1).F64(2.5).U8(0x29).U8(1).U8(0xA9).U32(9).U8(0xFF).U8(1);
-    b.U8(0x2A).U16(1).U16(0).U8(0xAA).U32(1).U16(0).U16(2).U8(0x2B).U32(2).Text("hi");
-    b.U8(0xAB).U32(5).U32(1).U32(1).Text("q").U8(0x2C).U16(2).Raw({1, 2}).U8(0xAC).U32(1).U16(2).Raw({3, 4});
-    b.U8(0x2D).U32(3).Raw({7, 7, 7}).U8(0x35).U8(1).U8(0xB5).U32(2).Raw({1, 2}).End();
-    b.Item(0x32, "Clas").U8(1).Code("InRg").U16(1).U32Item("Frst", 5).End();
-    b.Item(0x32, "ClsN").U8(0);
-    b.Item(0xB2, "Clss").U32(3).Code("InRg").U16(1).U8(1).U32Item("Frst", 6).End().U8(0).U8(1).End();
-    b.Item(0x33, "DlyN").U32(0).U32(0);
-    b.Item(0x33, "DlyZ").U32(0).U32(4).Text("path");
-    return b;
+    return b.Put("29 [Bool] 01 | A9 [Bits] 0B000000 0504 | 2A [Enum] 0200 0000 | AA [Enms] 03000000 0000 0200 0000 0100"
+                 "2B [Text] 06000000 'na' C3AF 've' | AB [Txts] 0A000000 02000000 02000000 'ab' 00000000"
+                 "2E [Shpd] 02000000 'xy' | AE [Shps] 05000000 01000000 01000000 'z'"
+                 "2C [Cust] 0300 010203 | AC [Csts] 02000000 0300 010203040506 | 2D [Data] 05000000 0908070605"
+                 "77 [Algn] 03000000 0200 0000 010203 | 76 [Frag] 04000000 00000100 04030201 | 75 [Flag] 0000 02 1801"
+                 "30 [Strm] 0700 | 03 2A000000 | 8A 01000000 0000000000000440 | 29 01 | A9 09000000 FF01 | 2A 0100 0000"
+                 "AA 01000000 0000 0200 | 2B 02000000 'hi' | AB 05000000 01000000 01000000 'q' | 2C 0200 0102"
+                 "AC 01000000 0200 0304 | 2D 03000000 070707 | 35 01 | B5 02000000 0102 | 00"
+                 "32 [Clas] 01 [InRg] 0100 | 03 [Frst] 05000000 00 | 32 [ClsN] 00"
+                 "B2 [Clss] 03000000 [InRg] 0100 | 01 03 [Frst] 06000000 00 | 00 | 01 00"
+                 "33 [DlyN] 00000000 00000000 | 33 [DlyZ] 00000000 04000000 'path'");
 }
 
 PropertyBytes EveryItemForm(bool everySize)
@@ -186,29 +177,17 @@ PropertyBytes EveryItemForm(bool everySize)
     PropertyBytes b;
     b.Header().Append(EveryValueForm(everySize));
     // A class with every kind of default, its parent, objects in objects, arrays and references.
-    b.Item(0x31, "Root").Object(0).U8(0).Code("RdDv").U16(1);
-    b.U32Item("DfT1", 11).Item(0x83, "DfT2").U32(2).U32(1).U32(2).TextItem("Name", "default name");
-    b.Item(0x2C, "DfC1").U16(2).Raw({1, 2}).Item(0xAC, "DfC2").U32(1).U16(2).Raw({3, 4});
-    b.Item(0x2A, "DfE1").U16(0).U16(0).Item(0xAA, "DfE2").U32(1).U16(0).U16(0).Item(0x75, "DfFl").U16(0).U8(1).U8(3);
-    b.Item(0x31, "Shrd").Object(1).RootClass("RdSh").U32Item("Numb", 5).End();
-    b.Item(0xB1, "DfSA").U32(2).U8(0).BackReference(1).End();
-    b.RootClass("RdNo", 2);
-    b.U32Item("Numb", 100);
-    b.Item(0x31, "Chld").Object(2).KnownClass("RdNo").TextItem("Name", "child").End();
-    b.Item(0x31, "Refr").BackReference(2);
-    b.Item(0xB1, "Kids").U32(3).U8(0).Object(3).KnownClass("RdNo").End().BackReference(2).End();
-    b.Item(0x31, "NulO").U8(0);
-    b.Item(0xB1, "NulA").U32(4).Raw({0, 0, 0, 0});
-    b.Item(0x31, "Shar")
-        .Object(0xFFFFFFFF)
-        .KnownClass("RdSh")
-        .U32Item("Numb", 6)
-        .Item(0x31, "Next")
-        .BackReference(1)
-        .End();
-    b.Item(0xB1, "Shrs").U32(2).BackReference(0xFFFFFFFF).BackReference(1);
-    b.Item(0x31, "Lgcy").Object(7).RootClass("RdLg").U32Item("Numb", 77).End();
-    return b.End();
+    return b.Put(
+        "31 [Root] 01 00000000 | 00 [RdDv] 0100 | 03 [DfT1] 0B000000 | 83 [DfT2] 02000000 01000000 02000000"
+        "2B [Name] 0C000000 'default name' | 2C [DfC1] 0200 0102 | AC [DfC2] 01000000 0200 0304 | 2A [DfE1] 0000 0000"
+        "AA [DfE2] 01000000 0000 0000 | 75 [DfFl] 0000 01 03"
+        "31 [Shrd] 01 01000000 00 [RdSh] 0100 00 02 | 03 [Numb] 05000000 00 | B1 [DfSA] 02000000 00 02 01000000 | 00"
+        "00 [RdNo] 0200 00 02 | 03 [Numb] 64000000 | 31 [Chld] 01 02000000 01 [RdNo] 2B [Name] 05000000 'child' 00"
+        "31 [Refr] 02 02000000 | B1 [Kids] 03000000 00 01 03000000 01 [RdNo] 00 02 02000000 | 00"
+        "31 [NulO] 00 | B1 [NulA] 04000000 00000000"
+        "31 [Shar] 01 FFFFFFFF 01 [RdSh] 03 [Numb] 06000000 31 [Next] 02 01000000 00"
+        "B1 [Shrs] 02000000 02 FFFFFFFF 02 01000000"
+        "31 [Lgcy] 01 07000000 00 [RdLg] 0100 00 02 03 [Numb] 4D000000 00 | 00");
 }
 
 } // namespace Kernel::Test

@@ -103,6 +103,8 @@ Counted<InStream> Deliver(std::vector<u8> const& bytes, Delivery delivery);
 /// Bytes that have been taken from a stream of Deliver.
 u64 GetTaken(InStream const& in);
 Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks = true, Delivery delivery = Delivery::Memory);
+/// A file with these items, in the notation of Bytes(), behind a header and with an end.
+Counted<InSerialiserFile> ParseItems(std::string_view notation);
 /// Items of every form but objects, in every size of the forms that have many, or only in some.
 PropertyBytes EveryValueForm(bool everySize = true);
 /// A whole stream with one of every form of item, and objects of the classes above.

@@ -1,17 +1,22 @@
 #include "libkernel/serialisation/SerialiseTo.h"
 
-#include "libkernel/serialisation/InSerialiser.h"
+#include "libkernel/core/Limits.h"
 #include "libkernel/serialisation/SerialiseFrom.h"
 #include "libkernel/streams/FileInStream.h"
+#include "libkernel/streams/MemoryStreams.h"
+#include "serialisation/ReaderClasses.h"
 #include "serialisation/WriterTestSupport.h"
-#include "support/TempFolder.h"
+#include "support/FileFixture.h"
+#include "support/Rows.h"
 
-#include <filesystem>
 #include <stdexcept>
 #include <zlib.h>
 
 namespace KernelTest {
 namespace {
+
+using SaveItem = std::function<void(OutSerialiser&, IDTag)>;
+using LoadItem = std::function<bool(InSerialiser&, IDTag)>;
 
 void SaveOne(OutSerialiser& out, IDTag tag)
 {
@@ -35,14 +40,11 @@ TEST(SerialiseToStream, WritesTheWholeFileAndLetsGoOfTheStream)
 
 TEST(SerialiseToStream, AnythingThrownIsAFailure)
 {
-    std::function<void(OutSerialiser&, IDTag)> const failing[] = {
+    SaveItem const failing[] = {
         [](OutSerialiser&, IDTag) { throw 5; },
         [](OutSerialiser&, IDTag) { throw std::runtime_error("x"); },
         [](OutSerialiser&, IDTag) { throw OutStream::WriteException(); },
-        [](OutSerialiser& out, IDTag tag) {
-            SaveOne(out, tag);
-            SaveOne(out, tag);
-        },
+        [](OutSerialiser& out, IDTag tag) { SaveOne(out, tag), SaveOne(out, tag); },
         nullptr,
     };
     for (auto const& save : failing) EXPECT_FALSE(SerialiseToStream(MakeCounted<BytesOutStream>(), "Sett", 9, save));
@@ -50,28 +52,52 @@ TEST(SerialiseToStream, AnythingThrownIsAFailure)
         EXPECT_FALSE(SerialiseToStream(MakeCounted<BytesOutStream>(limit), "Sett", 9, SaveOne)) << limit;
 }
 
-class SerialiseToFileTest : public testing::Test
+TEST(SerialiseFromStream, KindAndVersionAreCheckedAndWhateverIsThrownGivesFalse)
+{
+    std::string newer = OneFile();
+    newer[4] = 3;
+    int calls = 0;
+    LoadItem const yes = [&](InSerialiser&, IDTag tag) { return ++calls && tag == IDTag("Item"); };
+    for (auto const& [bytes, kind, version, load, loads] : Rows<std::string, IDTag, u16, LoadItem, bool>{
+             {OneFile(), "Sett", 9, yes, true},
+             {OneFile(), "Sett", 19, yes, true},
+             {OneFile(), "Sett", 8, yes, false},
+             {OneFile(), "Othr", 9, yes, false},
+             {newer, "Sett", 9, yes, false},
+             {OneFile(), "Sett", 9, [](InSerialiser&, IDTag) -> bool { throw 5; }, false},
+             {OneFile(), "Sett", 9, [](InSerialiser&, IDTag) { return false; }, false}})
+    {
+        Counted<InStream> const in(new MemoryInStream(bytes.data(), bytes.size(), false));
+        EXPECT_EQ(SerialiseFromStream(in, kind, version, load), loads);
+    }
+    EXPECT_FALSE(SerialiseFromStream(nullptr, "Sett", 9, yes));
+    EXPECT_FALSE(SerialiseFromFile("/nowhere/at/all", "Sett", 9, yes, false));
+    EXPECT_FALSE(SerialiseFromFile(nullptr, "Sett", 9, yes, false));
+    EXPECT_EQ(calls, 2);
+}
+
+class SerialiseToFileTest : public TestSupport::FileFixture
 {
 protected:
-    std::string Path() const { return m_folder / "settings.bin"; }
-    // Nothing but the file itself lies there, if it does.
-    int CountFiles() const
+    bool Save(SaveItem const& save, int level = 0) const
     {
-        int count = 0;
-        for (auto const& entry : std::filesystem::directory_iterator(m_folder.GetPath()))
-            count += entry.exists() ? 1 : 0;
-        return count;
+        return SerialiseToFile(m_path.c_str(), "Sett", 9, save, level);
     }
-    TestSupport::TempFolder m_folder;
+    // Nothing but the file itself lies there.
+    bool IsAlone() const
+    {
+        auto const in = std::filesystem::directory_iterator(m_folder.GetPath());
+        return std::distance(begin(in), end(in)) == 1 && std::filesystem::exists(m_path);
+    }
 };
 
 TEST_F(SerialiseToFileTest, ReplacesTheFileWholePlainOrCompressed)
 {
-    TestSupport::WriteWholeFile(Path(), std::string(1000, 'x'));
+    TestSupport::WriteWholeFile(m_path, std::string(1000, 'x'));
     for (int const level : {0, 6}) {
-        ASSERT_TRUE(SerialiseToFile(Path().c_str(), "Sett", 9, SaveOne, level));
-        EXPECT_EQ(CountFiles(), 1);
-        std::string bytes = TestSupport::ReadWholeFile(Path());
+        ASSERT_TRUE(Save(SaveOne, level));
+        EXPECT_TRUE(IsAlone());
+        std::string bytes = TestSupport::ReadWholeFile(m_path);
         if (level) {
             std::string const packed = bytes;
             uLongf size = 1000;
@@ -89,30 +115,46 @@ TEST_F(SerialiseToFileTest, ReplacesTheFileWholePlainOrCompressed)
             seen = in.GetFilePath();
             return in.LoadType(tag, value) && value == 7;
         };
-        EXPECT_TRUE(SerialiseFromFile(Path().c_str(), "Sett", 9, load, level != 0));
-        EXPECT_FALSE(SerialiseFromFile(Path().c_str(), "Sett", 9, load, level == 0));
+        EXPECT_TRUE(SerialiseFromFile(m_path.c_str(), "Sett", 9, load, level != 0));
+        EXPECT_FALSE(SerialiseFromFile(m_path.c_str(), "Sett", 9, load, level == 0));
         if (level) continue;
-        EXPECT_TRUE(SerialiseFromStream(FileInStream::Open(Path().c_str()), "Sett", 9, load));
-        EXPECT_EQ(seen.GetView(), Path());
+        EXPECT_TRUE(SerialiseFromStream(FileInStream::Open(m_path.c_str()), "Sett", 9, load));
+        EXPECT_EQ(seen.GetView(), m_path);
     }
 }
 
 TEST_F(SerialiseToFileTest, FailureLeavesTheOldFileAndNoTemporary)
 {
-    TestSupport::WriteWholeFile(Path(), "old");
-    for (int const level : {0, 6})
-        EXPECT_FALSE(SerialiseToFile(
-            Path().c_str(), "Sett", 9,
-            [](OutSerialiser& out, IDTag tag) {
-                SaveOne(out, tag);
-                throw 5;
-            },
-            level));
-    EXPECT_EQ(TestSupport::ReadWholeFile(Path()), "old");
-    EXPECT_EQ(CountFiles(), 1);
-    EXPECT_FALSE(SerialiseToFile(nullptr, "Sett", 9, SaveOne, 0));
-    EXPECT_FALSE(SerialiseToFile("", "Sett", 9, SaveOne, 0));
-    EXPECT_FALSE(SerialiseToFile((Path() + "/below/file").c_str(), "Sett", 9, SaveOne, 0));
+    TestSupport::WriteWholeFile(m_path, "old");
+    for (int const level : {0, 6}) EXPECT_FALSE(Save([](OutSerialiser& o, IDTag t) { SaveOne(o, t), throw 5; }, level));
+    EXPECT_EQ(TestSupport::ReadWholeFile(m_path), "old");
+    EXPECT_TRUE(IsAlone());
+    std::string const below = m_path + "/below/file";
+    for (char const* path : {static_cast<char const*>(nullptr), "", below.c_str()})
+        EXPECT_FALSE(SerialiseToFile(path, "Sett", 9, SaveOne, 0));
+}
+
+TEST_F(SerialiseToFileTest, DeepestGraphThatCanBeSavedCanBeRead)
+{
+    using Kernel::Test::ReaderNode;
+    LoadItem const load = [](InSerialiser& in, IDTag tag) {
+        Counted<ReaderNode> loaded;
+        return in.LoadObject(tag, loaded);
+    };
+    u32 deepest = 0;
+    for (u32 depth = c_maxNesting - 3; depth <= c_maxNesting + 2; ++depth) {
+        Counted<ReaderNode> top;
+        for (u32 i = 0; i < depth; ++i) {
+            Counted<ReaderNode> node(new ReaderNode);
+            node->child = std::move(top);
+            top = std::move(node);
+        }
+        if (!Save([&](OutSerialiser& out, IDTag tag) { out.SaveObject(tag, top); })) continue;
+        deepest = depth;
+        EXPECT_TRUE(SerialiseFromFile(m_path.c_str(), "Sett", 9, load, false)) << depth;
+    }
+    EXPECT_GE(deepest, c_maxNesting - 1);
+    EXPECT_LT(deepest, c_maxNesting + 2);
 }
 
 } // namespace

@@ -5,6 +5,7 @@
 #include "libkernel/serialisation/CompareContext.h"
 #include "libkernel/serialisation/OutSerialiserFile.h"
 #include "libkernel/streams/OutStream.h"
+#include "support/PropertyBytes.h"
 
 #include <atomic>
 #include <functional>
@@ -16,6 +17,8 @@
 namespace KernelTest {
 
 using namespace Kernel;
+using Kernel::Test::Bytes;
+using Kernel::Test::Show;
 
 /// Keeps what it is given, up to a limit of bytes; then its writes come up short.
 class BytesOutStream : public OutStream
@@ -37,42 +40,6 @@ public:
     u64 m_limit;
     int m_writes = 0;
 };
-
-/// Bytes from a text: pairs of hexadecimal digits; 'text' as it stands; [Abcd] a tag, which is stored reversed. Spaces
-/// and bars separate.
-inline std::string Bytes(std::string_view text)
-{
-    auto const digit = [](char c) { return c <= '9' ? c - '0' : (c | 0x20) - 'a' + 10; };
-    std::string result;
-    for (size_t i = 0; i < text.size(); ++i) {
-        char const c = text[i];
-        if (c == ' ' || c == '|' || c == '\n') continue;
-        if (c == '[') {
-            for (size_t k = 4; k > 0; --k) result += text[i + k];
-            i += 5;
-        } else if (c == '\'') {
-            for (++i; text[i] != '\''; ++i) result += text[i];
-        } else {
-            result += static_cast<char>(digit(c) << 4 | digit(text[i + 1]));
-            ++i;
-        }
-    }
-    return result;
-}
-
-/// Bytes in the same notation, so that a failure can be read.
-inline std::string Show(std::string_view bytes)
-{
-    static char const digits[] = "0123456789ABCDEF";
-    std::string result;
-    for (char const c : bytes) {
-        u8 const byte = static_cast<u8>(c);
-        result += digits[byte >> 4];
-        result += digits[byte & 15];
-        result += ' ';
-    }
-    return result;
-}
 
 using SaveFunction = std::function<void(OutSerialiser&)>;
 

@@ -3,12 +3,47 @@
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/Types.h"
 
-#include <cstring>
-#include <initializer_list>
+#include <string>
 #include <string_view>
 #include <vector>
 
 namespace Kernel::Test {
+
+/// Bytes from a text: pairs of hexadecimal digits; 'text' as it stands; [Abcd] a tag, which is stored reversed. Spaces
+/// and bars separate.
+inline std::string Bytes(std::string_view text)
+{
+    auto const digit = [](char c) { return c <= '9' ? c - '0' : (c | 0x20) - 'a' + 10; };
+    std::string result;
+    for (size_t i = 0; i < text.size(); ++i) {
+        char const c = text[i];
+        if (c == ' ' || c == '|' || c == '\n') continue;
+        if (c == '[') {
+            for (size_t k = 4; k > 0; --k) result += text[i + k];
+            i += 5;
+        } else if (c == '\'') {
+            for (++i; text[i] != '\''; ++i) result += text[i];
+        } else {
+            result += static_cast<char>(digit(c) << 4 | digit(text[i + 1]));
+            ++i;
+        }
+    }
+    return result;
+}
+
+/// Bytes in the same notation, so that a failure can be read.
+inline std::string Show(std::string_view bytes)
+{
+    static char const digits[] = "0123456789ABCDEF";
+    std::string result;
+    for (char const c : bytes) {
+        u8 const byte = static_cast<u8>(c);
+        result += digits[byte >> 4];
+        result += digits[byte & 15];
+        result += ' ';
+    }
+    return result;
+}
 
 /// Builds property streams byte by byte, apart from the library's own writer.
 class PropertyBytes
@@ -21,24 +56,14 @@ public:
     }
     PropertyBytes& U16(u16 value) { return U8(static_cast<u8>(value)).U8(static_cast<u8>(value >> 8)); }
     PropertyBytes& U32(u32 value) { return U16(static_cast<u16>(value)).U16(static_cast<u16>(value >> 16)); }
-    PropertyBytes& U64(u64 value) { return U32(static_cast<u32>(value)).U32(static_cast<u32>(value >> 32)); }
-    PropertyBytes& F64(double value)
-    {
-        u64 bits;
-        std::memcpy(&bits, &value, sizeof(bits));
-        return U64(bits);
-    }
     PropertyBytes& Code(char const (&code)[5]) { return U32(IDTag(code).value); }
     PropertyBytes& Text(std::string_view text)
     {
         bytes.insert(bytes.end(), text.begin(), text.end());
         return *this;
     }
-    PropertyBytes& Raw(std::initializer_list<int> values)
-    {
-        for (int value : values) U8(static_cast<u8>(value));
-        return *this;
-    }
+    /// In the notation of Bytes().
+    PropertyBytes& Put(std::string_view notation) { return Text(Bytes(notation)); }
     PropertyBytes& Zeros(size_t count)
     {
         bytes.insert(bytes.end(), count, 0);

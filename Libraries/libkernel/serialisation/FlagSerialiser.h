@@ -33,7 +33,8 @@ public:
         RegisterFlagIndices(entries, N);
     }
 
-    /// False, with the outputs untouched, if no set has a place for every bit of @p flags.
+    /// False, with the outputs untouched, if no set has a place for every bit of @p flags. A set of bits that ascend by
+    /// 1, none retired, is not asked: it takes any flags, shifted down.
     bool EncodeToSerial(u64 flags, u64& encoded, unsigned short& version) const;
     /// Gives the flags, and in @p activeBytes the bytes of the program's word that the set reaches. Throws
     /// UnknownFlagVersionException for a version beyond those registered, and for a bit beyond a set of fewer than 64.
