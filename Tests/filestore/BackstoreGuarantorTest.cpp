@@ -2,6 +2,7 @@
 
 #include "libkernel/filestore/BackstoreException.h"
 #include "support/MemoryFileStore.h"
+#include "support/Rows.h"
 
 #include <gtest/gtest.h>
 
@@ -72,22 +73,17 @@ TEST_F(BackstoreGuarantorTest, WhatCannotBeHadFailsTheRun)
 
 TEST_F(BackstoreGuarantorTest, WhatAStayingStoreHoldsIsNotCopied)
 {
-    struct
+    for (auto const& [what, load, dirty, forget] :
+         Rows<char const*, bool, bool, bool>{{"never loaded", false, false, false},
+                                             {"clean", true, false, false},
+                                             {"dirty, so in memory", true, true, false},
+                                             {"unknown, but in memory", true, false, true}})
     {
-        char const* what;
-        bool load, dirty, forget;
-    } const cases[] = {
-        {"never loaded", false, false, false},
-        {"clean", true, false, false},
-        {"dirty, so in memory", true, true, false},
-        {"unknown, but in memory", true, false, true},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.what);
+        SCOPED_TRACE(what);
         Counted<DelayLoadHolder> const x = Stored("x", "X");
-        if (c.load) TextOf(x);
-        if (c.dirty) x->GetItemBaseIfLoaded()->MarkAsDirty();
-        if (c.forget) a->RemoveDirtyStates({"x"});
+        if (load) TextOf(x);
+        if (dirty) x->GetItemBaseIfLoaded()->MarkAsDirty();
+        if (forget) a->RemoveDirtyStates({"x"});
         EXPECT_TRUE(BackstoreGuarantor::Process(Root({x}), a));
         EXPECT_EQ(0, a->copies);
     }

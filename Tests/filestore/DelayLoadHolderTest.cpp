@@ -3,6 +3,7 @@
 #include "libkernel/core/NumberText.h"
 #include "libkernel/filestore/BackstoreException.h"
 #include "support/MemoryFileStore.h"
+#include "support/Rows.h"
 
 #include <gtest/gtest.h>
 
@@ -34,6 +35,7 @@ protected:
         return holder->GetDirtyStateForFileStore(store, state) ? state : static_cast<State>(99);
     }
 
+    static constexpr State c_clean = FileStoreStateObject::DirtyStateClean;
     static constexpr State c_unknown = static_cast<State>(99);
     Counted<MemoryFileStore> a = MemoryFileStore::Create();
     Counted<MemoryFileStore> b = MemoryFileStore::Create();
@@ -54,7 +56,7 @@ TEST_F(DelayLoadHolderTest, ItemIsLoadedOnceAndReleasedWhenClean)
     holder->GetItemBaseIfLoaded()->MarkAsDirty();
     EXPECT_FALSE(holder->ReleaseItem());
     EXPECT_EQ("X", TextOf(holder));
-    a->ClearObjectDirtyState(*holder->GetItemBaseIfLoaded(), FileStoreStateObject::DirtyStateClean);
+    a->ClearObjectDirtyState(*holder->GetItemBaseIfLoaded(), c_clean);
     Counted<FileStoreItem> const kept = holder->GetItemBaseIfLoaded().GetCounted();
     EXPECT_TRUE(holder->ReleaseItem());
     EXPECT_FALSE(kept->GetDelayLoadHolder());
@@ -64,28 +66,23 @@ TEST_F(DelayLoadHolderTest, ItemIsLoadedOnceAndReleasedWhenClean)
 
 TEST_F(DelayLoadHolderTest, NextStoreServesWhereOneFails)
 {
-    struct
+    using Damage = std::function<void(MemoryFileStore&, char const* path)>;
+    for (Damage const &damage : std::initializer_list<Damage>{
+             [](auto&store, char const*path) { store.UpdateDelayLoadOwners(store.Delete(path)); },
+             [](auto&store, char const*path) { store.UpdateDelayLoadOwners(store.Put(path, "refuse")); },
+             [](auto&store, char const*) { store.onLoad = [] { throw 1; }; }})
     {
-        char const* what;
-        std::function<void(MemoryFileStore&, char const* path)> damage;
-    } const cases[] = {
-        {"deleted", [](auto& store, char const* path) { store.UpdateDelayLoadOwners(store.Delete(path)); }},
-        {"refused", [](auto& store, char const* path) { store.UpdateDelayLoadOwners(store.Put(path, "refuse")); }},
-        {"exception", [](auto& store, char const*) { store.onLoad = [] { throw 1; }; }},
-    };
-    for (auto const& c : cases) {
         // Which store is asked first is a matter of addresses, so each of them is the damaged one once.
         for (bool const damageA : {true, false}) {
-            SCOPED_TRACE(c.what);
             a = MemoryFileStore::Create();
             b = MemoryFileStore::Create();
             Counted<DelayLoadHolder> const holder = HoldInBoth();
             MemoryFileStore& bad = damageA ? *a : *b;
-            c.damage(bad, damageA ? "x" : "bx");
+            damage(bad, damageA ? "x" : "bx");
             EXPECT_EQ("X", TextOf(holder));
-            EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, damageA ? *b : *a));
+            EXPECT_EQ(c_clean, StateFor(holder, damageA ? *b : *a));
             // A store that has failed needs the item again; one that was not asked is taken at its word.
-            EXPECT_EQ(bad.loads ? c_unknown : FileStoreStateObject::DirtyStateClean, StateFor(holder, bad));
+            EXPECT_EQ(bad.loads ? c_unknown : c_clean, StateFor(holder, bad));
         }
     }
     EXPECT_EQ(0, MemoryItem::s_living);
@@ -116,7 +113,7 @@ TEST_F(DelayLoadHolderTest, FailedLoadIsNotTriedAgainUntilRelease)
     EXPECT_EQ("whole", TextOf(holder));
 }
 
-TEST_F(DelayLoadHolderTest, OnlyCopyIsKept)
+TEST_F(DelayLoadHolderTest, OnlyCopyIsKeptUnlessItsStoreDiedUnseen)
 {
     Counted<MemoryItem> const item(new MemoryItem("X"));
     Counted<DelayLoadHolder> const holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item);
@@ -130,6 +127,15 @@ TEST_F(DelayLoadHolderTest, OnlyCopyIsKept)
     EXPECT_FALSE(holder->ExistsOnlyInMemory());
     EXPECT_TRUE(holder->ReleaseItem());
     EXPECT_FALSE(item->GetDelayLoadHolder());
+
+    a->Put("x", "X");
+    Counted<DelayLoadHolder> const orphan = a->Hold("x");
+    TextOf(orphan);
+    a->diesSuddenly = true;
+    a.Reset();
+    EXPECT_FALSE(orphan->HasLivingOwner());
+    EXPECT_TRUE(orphan->ReleaseItem());
+    EXPECT_EQ("(none)", TextOf(orphan));
 }
 
 TEST_F(DelayLoadHolderTest, ItemHasOneHolderAndKeepsThePathOfTheOneItReplaces)
@@ -157,48 +163,31 @@ TEST_F(DelayLoadHolderTest, ItemHasOneHolderAndKeepsThePathOfTheOneItReplaces)
     EXPECT_TRUE(DelayLoadHolder::Create(&MemoryItem::c_plain, item, nullptr, *a));
 }
 
-TEST_F(DelayLoadHolderTest, ItemWhoseStoreDiedUnseenIsReleasedForGood)
-{
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
-    TextOf(holder);
-    a->diesSuddenly = true;
-    a.Reset();
-    EXPECT_FALSE(holder->HasLivingOwner());
-    EXPECT_TRUE(holder->ReleaseItem());
-    EXPECT_EQ("(none)", TextOf(holder));
-}
-
 TEST_F(DelayLoadHolderTest, TemporaryItemGoesUnlessItWasThereOrWasTouched)
 {
     // A file that goes while the item is looked at takes the entry with it, so the item is the last copy.
-    struct
+    for (auto const& [what, load, dirty, remove, stays] :
+         Rows<char const*, bool, bool, bool, bool>{{"incremental, but as it came", false, false, false, false},
+                                                   {"there before", true, false, false, true},
+                                                   {"made dirty", false, true, false, true},
+                                                   {"last copy", false, false, true, true}})
     {
-        char const* what;
-        bool load, dirty, remove, stays;
-    } const cases[] = {
-        {"incremental, but as it came", false, false, false, false},
-        {"there before", true, false, false, true},
-        {"made dirty", false, true, false, true},
-        {"last copy", false, false, true, true},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.what);
+        SCOPED_TRACE(what);
         a->Put("x", "X", true);
         Counted<DelayLoadHolder> const holder = a->Hold("x");
-        if (c.load) TextOf(holder);
+        if (load) TextOf(holder);
         {
             DelayLoadHolder::TempLoadItem const temp(holder);
             ASSERT_TRUE(temp.GetItem());
-            EXPECT_EQ(c.load, temp.WasLoadedBefore());
+            EXPECT_EQ(load, temp.WasLoadedBefore());
             DelayLoadHolder::TempLoadItem const inner(holder);
             EXPECT_TRUE(inner.WasLoadedBefore());
             EXPECT_EQ(temp.GetItem().Get(), inner.GetItem().Get());
             EXPECT_EQ(FileStoreStateObject::DirtyStateIncremental, StateFor(holder, *a));
-            if (c.dirty) temp.GetItem()->MarkAsDirty();
-            if (c.remove) a->RemoveDirtyStates({"x"});
+            if (dirty) temp.GetItem()->MarkAsDirty();
+            if (remove) a->RemoveDirtyStates({"x"});
         }
-        EXPECT_EQ(c.stays, static_cast<bool>(holder->GetItemBaseIfLoaded()));
+        EXPECT_EQ(stays, static_cast<bool>(holder->GetItemBaseIfLoaded()));
         a = MemoryFileStore::Create();
     }
     EXPECT_FALSE(DelayLoadHolder::TempLoadItem(nullptr).GetItem());
@@ -214,8 +203,8 @@ TEST_F(DelayLoadHolderTest, FirstBackDataStaysUntilTheItemChanges)
     EXPECT_EQ(first, holder->GetBackData());
     EXPECT_EQ("X", TextOf(holder));
     EXPECT_EQ(0, a->loads + b->loads);
-    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *a));
-    EXPECT_EQ(FileStoreStateObject::DirtyStateClean, StateFor(holder, *b));
+    EXPECT_EQ(c_clean, StateFor(holder, *a));
+    EXPECT_EQ(c_clean, StateFor(holder, *b));
 
     holder->GetItemBaseIfLoaded()->MarkAsDirty();
     EXPECT_FALSE(holder->GetBackData());

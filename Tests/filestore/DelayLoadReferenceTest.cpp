@@ -6,6 +6,7 @@
 #include "libkernel/serialisation/OutSerialiserFile.h"
 #include "libkernel/streams/MemoryStreams.h"
 #include "support/MemoryFileStore.h"
+#include "support/Rows.h"
 
 #include <gtest/gtest.h>
 
@@ -99,26 +100,22 @@ protected:
 
 TEST_F(DelayLoadReferenceTest, ReferenceIsLeftProvenOrLoaded)
 {
-    struct
-    {
-        Behaviour behaviour;
-        int loads;
-        bool isLoaded;
-    } const cases[] = {{Behaviour::Leave, 1, false}, {Behaviour::Prove, 2, false}, {Behaviour::Load, 2, true}};
     PutBinder("inner", "opt/missing");
     PutBinder("outer", "inner");
     PutBinder("self", "self");
-    for (auto const& c : cases) {
-        SCOPED_TRACE(static_cast<int>(c.behaviour));
-        BinderItem::s_behaviour = c.behaviour;
+    for (auto const& [behaviour, loads, isLoaded] : Rows<Behaviour, int, bool>{
+             {Behaviour::Leave, 1, false}, {Behaviour::Prove, 2, false}, {Behaviour::Load, 2, true}})
+    {
+        SCOPED_TRACE(static_cast<int>(behaviour));
+        BinderItem::s_behaviour = behaviour;
         Counted<DelayLoadHolder> const outer = Hold("outer");
         JailCounted<FileStoreItem> item;
         store->loads = 0;
         ASSERT_TRUE(outer->GetItemBase(item));
         Counted<DelayLoadHolder> const inner = Item(outer)->binder->part;
         EXPECT_EQ(inner, Hold("inner"));
-        EXPECT_EQ(c.isLoaded, inner->IsLoaded());
-        EXPECT_EQ(c.loads, store->loads);
+        EXPECT_EQ(isLoaded, inner->IsLoaded());
+        EXPECT_EQ(loads, store->loads);
         EXPECT_TRUE(inner->GetItemBase(item));
         EXPECT_TRUE(Item(inner)->binder->part->IsDead()) << "the recoverable item that is not there";
         // In use, it stays with its holder, proven or not.

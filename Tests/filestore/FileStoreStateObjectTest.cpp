@@ -1,6 +1,7 @@
 #include "support/MemoryFileStore.h"
 
 #include <gtest/gtest.h>
+#include <random>
 #include <thread>
 
 namespace {
@@ -26,92 +27,69 @@ protected:
     Counted<MemoryItem> item{new MemoryItem};
 };
 
-TEST_F(FileStoreStateObjectTest, EventsMoveTheStateAsTheTableSays)
+// What each store must think of one item, in any order of events, and what the item says of itself.
+TEST_F(FileStoreStateObjectTest, EveryHistoryLeavesTheStatesOfAPlainMap)
 {
-    auto const dirty = [this] { item->MarkAsDirty(); };
-    auto const fullSave = [this] { a->ClearObjectDirtyState(*item, c_clean); };
-    auto const incrementalSave = [this] { a->ClearObjectDirtyState(*item, c_incremental); };
-    auto const loadFull = [this] { a->SetObjectDirtyStatePostLoad(*item, c_clean); };
-    auto const loadIncremental = [this] { a->SetObjectDirtyStatePostLoad(*item, c_incremental); };
-    auto const markClean = [this] { item->MarkAsClean(*a); };
-    auto const forget = [this] { item->BreakLinkToFileStore(*a); };
-    std::optional<State> const none;
-    struct
-    {
-        char const* what;
-        std::optional<State> from;
-        std::function<void()> event;
-        std::optional<State> to;
-    } const cases[] = {
-        {"load of tag 0", none, loadFull, c_clean},
-        {"load of tag 1", none, loadIncremental, c_incremental},
-        {"load over a state", c_full, loadFull, c_clean},
-        {"dirty when clean", c_clean, dirty, c_full},
-        {"dirty when incremental", c_incremental, dirty, c_full},
-        {"dirty when unknown", none, dirty, none},
-        {"full save of full", c_full, fullSave, c_clean},
-        {"full save of incremental", c_incremental, fullSave, c_clean},
-        {"full save of clean", c_clean, fullSave, c_clean},
-        {"full save of unknown", none, fullSave, c_clean},
-        {"incremental save of full", c_full, incrementalSave, c_incremental},
-        {"incremental save of incremental", c_incremental, incrementalSave, c_incremental},
-        {"incremental save of clean", c_clean, incrementalSave, c_clean},
-        {"incremental save of unknown", none, incrementalSave, c_incremental},
-        {"own knowledge of unknown", none, markClean, c_clean},
-        {"own knowledge of full", c_full, markClean, c_clean},
-        {"forgotten", c_full, forget, none},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(c.what);
-        item->BreakLinkToFileStore(*a);
-        if (c.from) a->SetObjectDirtyStatePostLoad(*item, *c.from);
-        c.event();
-        EXPECT_EQ(c.to, StateFor(*a));
+    std::mt19937 random(3);
+    std::map<int, State> model; // A store that is not in it does not know the item.
+    std::vector<Counted<MemoryFileStore>> stores;
+    for (int i = 0; i < 7; ++i) stores.push_back(MemoryFileStore::Create());
+    for (int round = 0; round < 3000; ++round) {
+        int const i = static_cast<int>(random() % stores.size());
+        MemoryFileStore& store = *stores[static_cast<size_t>(i)];
+        State const state = static_cast<State>(random() % 3);
+        auto const event = random() % 8;
+        SCOPED_TRACE(testing::Message() << round << ": event " << event << " store " << i << " state " << state);
+        auto const snapshot = item->GetStateSnapshot();
+        auto const before = model;
+        switch (event) {
+        case 0:
+            item->MarkAsDirty(); // This also lets go of dead stores.
+            for (auto& known : model) known.second = c_full;
+            break;
+        case 1:
+            item->MarkAsClean(store);
+            model[i] = c_clean;
+            break;
+        case 2:
+            item->BreakLinkToFileStore(store);
+            model.erase(i);
+            break;
+        case 3:
+            stores[static_cast<size_t>(i)] = MemoryFileStore::Create(); // The old one dies.
+            model.erase(i);
+            break;
+        case 4: // A full save.
+            store.ClearObjectDirtyState(*item, c_clean);
+            model[i] = c_clean;
+            break;
+        case 5: // An incremental save leaves what was clean so.
+            store.ClearObjectDirtyState(*item, c_incremental);
+            if (!model.count(i) || model[i] != c_clean) model[i] = c_incremental;
+            break;
+        default: store.SetObjectDirtyStatePostLoad(*item, state); model[i] = state;
+        }
+        EXPECT_TRUE(event == 0 || event == 3 || item->EqualsSnapshot(snapshot) == (model == before));
+        int clean = 0;
+        int full = 0;
+        for (auto const& known : model) clean += known.second == c_clean, full += known.second == c_full;
+        int const known = static_cast<int>(model.size());
+        for (int k = 0; k < 7; ++k) {
+            MemoryFileStore const& one = *stores[static_cast<size_t>(k)];
+            auto const at = model.find(k);
+            bool const isKnown = at != model.end();
+            ASSERT_EQ(isKnown ? std::optional(at->second) : std::nullopt, StateFor(one));
+            ASSERT_EQ(isKnown, item->IsLinkedToFileStore(one));
+            ASSERT_EQ(!isKnown || at->second != c_clean, item->IsDirty(one));
+            ASSERT_EQ(!isKnown || at->second != c_clean, item->RequiresSave(one, false));
+            ASSERT_EQ(!isKnown || at->second == c_full, item->RequiresSave(one, true));
+            ASSERT_EQ(full - (isKnown && at->second == c_full) > 0,
+                      item->IsAnyFullDirtyExcluding(one.GetFileStoreLink()));
+        }
+        ASSERT_EQ(clean == known, item->IsFullyClean());
+        ASSERT_EQ(full > 0, item->IsAnyFullDirty());
+        ASSERT_EQ(known > 1, item->IsShared());
     }
-}
-
-TEST_F(FileStoreStateObjectTest, SaveIsRequiredByStateAndKind)
-{
-    struct
-    {
-        std::optional<State> state; // None: unknown to the store, so clean for itself.
-        bool dirty, save, fullOnlySave, fullyClean, anyFull;
-    } const cases[] = {
-        {std::nullopt, true, true, true, true, false},
-        {c_clean, false, false, false, true, false},
-        {c_full, true, true, true, false, true},
-        {c_incremental, true, true, false, false, false},
-    };
-    for (auto const& c : cases) {
-        SCOPED_TRACE(testing::PrintToString(c.state));
-        if (c.state) a->SetObjectDirtyStatePostLoad(*item, *c.state);
-        EXPECT_EQ(c.state.has_value(), item->IsLinkedToFileStore(*a));
-        EXPECT_EQ(c.dirty, item->IsDirty(*a));
-        EXPECT_EQ(c.save, item->RequiresSave(*a, false));
-        EXPECT_EQ(c.fullOnlySave, item->RequiresSave(*a, true));
-        EXPECT_EQ(c.fullyClean, item->IsFullyClean());
-        EXPECT_EQ(c.anyFull, item->IsAnyFullDirty());
-    }
-}
-
-TEST_F(FileStoreStateObjectTest, SavingToOneOfTwoStoresLeavesTheOtherDirty)
-{
-    a->SetObjectDirtyStatePostLoad(*item, c_clean);
-    b->SetObjectDirtyStatePostLoad(*item, c_clean);
-    EXPECT_TRUE(item->IsShared());
-    item->MarkAsDirty();
-    a->ClearObjectDirtyState(*item, c_clean);
-    EXPECT_FALSE(item->IsFullyClean());
-    EXPECT_TRUE(item->IsAnyFullDirty());
-    EXPECT_FALSE(item->IsAnyFullDirtyExcluding(b->GetFileStoreLink()));
-    EXPECT_TRUE(item->IsAnyFullDirtyExcluding(a->GetFileStoreLink()));
-    EXPECT_FALSE(item->IsDirty(*a));
-    EXPECT_TRUE(item->IsDirty(*b));
-
-    b.Reset();
-    EXPECT_TRUE(item->IsFullyClean());
-    EXPECT_FALSE(item->IsAnyFullDirty());
-    EXPECT_FALSE(item->IsShared());
 }
 
 TEST_F(FileStoreStateObjectTest, StoreThatBrokeItsAssociationsIsSkippedThenForgotten)
@@ -130,21 +108,6 @@ TEST_F(FileStoreStateObjectTest, StoreThatBrokeItsAssociationsIsSkippedThenForgo
     item->MarkAsDirty();
     EXPECT_FALSE(item->IsLinkedToFileStore(*b));
     EXPECT_EQ(c_full, StateFor(*a));
-}
-
-TEST_F(FileStoreStateObjectTest, ManyStoresKeepTheirStatesApart)
-{
-    std::vector<Counted<MemoryFileStore>> stores;
-    for (int i = 0; i < 9; ++i) stores.push_back(MemoryFileStore::Create());
-    for (int i = 0; i < 9; ++i) stores[i * 4 % 9]->SetObjectDirtyStatePostLoad(*item, static_cast<State>(i % 3));
-    auto const snapshot = item->GetStateSnapshot();
-    for (int i = 0; i < 9; ++i) EXPECT_EQ(static_cast<State>(i % 3), StateFor(*stores[i * 4 % 9])) << i;
-    item->BreakLinkToFileStore(*stores[4]);
-    EXPECT_FALSE(item->EqualsSnapshot(snapshot));
-    EXPECT_EQ(std::nullopt, StateFor(*stores[4]));
-    EXPECT_EQ(c_incremental, StateFor(*stores[8]));
-    stores[4]->SetObjectDirtyStatePostLoad(*item, c_full);
-    EXPECT_TRUE(item->EqualsSnapshot(snapshot));
 }
 
 TEST_F(FileStoreStateObjectTest, HooksRunBeforeAndAfterTheChangeOutsideTheLock)

@@ -5,6 +5,7 @@
 #include "support/FakeClock.h"
 #include "support/FaultyFiles.h"
 #include "support/FileFixture.h"
+#include "support/Rows.h"
 
 #include <vector>
 
@@ -89,38 +90,40 @@ TEST_F(FileSystemMovesTest, MoveReplacesTheTargetAndFlushesContentsAndName)
 
 TEST_F(FileSystemMovesTest, RenameIsTriedAgainOnlyWhereTheFailureMayPass)
 {
-    struct Case
+    // Retried by a move and a delete, and by a rename.
+    for (auto const& row : Rows<int, bool, bool>{
+             {EMFILE, true, true},
+             {ENFILE, true, true},
+             {EACCES, true, true},
+             {EPERM, true, true},
+             {EBUSY, false, true},
+             {ETXTBSY, false, true},
+             {ENOSPC, false, false},
+             {EIO, false, false},
+             {EROFS, false, false},
+         })
     {
-        int error;
-        bool isRetriedByMove; // And by a delete.
-        bool isRetriedByRename;
-    };
-    static constexpr Case c_cases[] = {
-        {EMFILE, true, true},   {ENFILE, true, true}, {EACCES, true, true},
-        {EPERM, true, true},    {EBUSY, false, true}, {ETXTBSY, false, true},
-        {ENOSPC, false, false}, {EIO, false, false},  {EROFS, false, false},
-    };
-    for (Case const& c : c_cases) {
-        SCOPED_TRACE(c.error);
+        auto const [error, isRetriedByMove, isRetriedByRename] = row;
+        SCOPED_TRACE(error);
         FaultyFiles faults;
         auto const run = [&](FileCall call, bool isRetried, auto const& operation) {
             FakeClock clock;
             faults.Clear();
             faults.ResetCounts();
-            faults.Plan({.call = call, .forEver = true, .error = c.error});
+            faults.Plan({.call = call, .forEver = true, .error = std::get<0>(row)});
             operation();
             EXPECT_EQ(clock.GetSleeps(), isRetried ? Pauses({1000, 1000}) : Pauses());
             return faults.GetCount(call);
         };
-        int const tries = c.isRetriedByMove ? 3 : 1;
+        int const tries = isRetriedByMove ? 3 : 1;
         // One more rename than the tries: that of the copy beside the target.
-        EXPECT_EQ(run(FileCall::Rename, c.isRetriedByMove,
+        EXPECT_EQ(run(FileCall::Rename, isRetriedByMove,
                       [&] { EXPECT_NE(FileSystem::SafeMoveFileAdv(At("old"), At("target"), 2), MoveResult::Moved); }),
                   tries + 1);
-        EXPECT_EQ(run(FileCall::Rename, c.isRetriedByRename,
+        EXPECT_EQ(run(FileCall::Rename, isRetriedByRename,
                       [&] { EXPECT_FALSE(FileSystem::RenameFile(At("old"), At("target"), 2)); }),
-                  c.isRetriedByRename ? 3 : 1);
-        EXPECT_EQ(run(FileCall::Unlink, c.isRetriedByMove, [&] { EXPECT_FALSE(FileSystem::Delete(At("old"), 2)); }),
+                  isRetriedByRename ? 3 : 1);
+        EXPECT_EQ(run(FileCall::Unlink, isRetriedByMove, [&] { EXPECT_FALSE(FileSystem::Delete(At("old"), 2)); }),
                   tries);
         EXPECT_EQ(List(), (Names{"old", "target"}));
         EXPECT_EQ(Read("target"), "target content");
@@ -195,28 +198,23 @@ TEST_F(FileSystemMovesTest, SourceThatStaysAfterTheCopyIsAWarning)
 
 TEST_F(FileSystemMovesTest, EveryFaultOfACopyingMoveLeavesSourceOrTargetWhole)
 {
-    struct Case
+    for (auto const& row : Rows<Fault, MoveResult>{
+             {{.call = FileCall::Read, .error = EIO}, MoveResult::Failed},
+             {{.call = FileCall::Write, .error = ENOSPC, .part = Fault::Part::Half}, MoveResult::DiskFull},
+             {{.call = FileCall::Write, .error = EDQUOT, .part = Fault::Part::AllButOne}, MoveResult::DiskFull},
+             {{.call = FileCall::Write, .part = Fault::Part::Half}, MoveResult::Failed},
+             {{.call = FileCall::Flush, .error = EIO}, MoveResult::Failed},
+             {{.call = FileCall::Flush, .error = ENOSPC}, MoveResult::DiskFull},
+             {{.call = FileCall::FlushFolder, .error = EIO}, MoveResult::Failed},
+             {{.call = FileCall::Open, .error = EMFILE}, MoveResult::Failed},
+             {{.call = FileCall::Open, .error = EACCES}, MoveResult::AccessDenied},
+             {{.call = FileCall::Close, .error = EIO}, MoveResult::Failed},
+             {{.call = FileCall::SetAttributes, .error = EPERM}, MoveResult::Moved},
+             {{.call = FileCall::Rename, .error = EROFS}, MoveResult::Failed},
+         })
     {
-        FileCall call;
-        int error;
-        Fault::Part part;
-        MoveResult result;
-    };
-    static constexpr Case c_cases[] = {
-        {FileCall::Read, EIO, Fault::Part::Nothing, MoveResult::Failed},
-        {FileCall::Write, ENOSPC, Fault::Part::Half, MoveResult::DiskFull},
-        {FileCall::Write, EDQUOT, Fault::Part::AllButOne, MoveResult::DiskFull},
-        {FileCall::Write, 0, Fault::Part::Half, MoveResult::Failed},
-        {FileCall::Flush, EIO, Fault::Part::Nothing, MoveResult::Failed},
-        {FileCall::Flush, ENOSPC, Fault::Part::Nothing, MoveResult::DiskFull},
-        {FileCall::FlushFolder, EIO, Fault::Part::Nothing, MoveResult::Failed},
-        {FileCall::Open, EMFILE, Fault::Part::Nothing, MoveResult::Failed},
-        {FileCall::Open, EACCES, Fault::Part::Nothing, MoveResult::AccessDenied},
-        {FileCall::Close, EIO, Fault::Part::Nothing, MoveResult::Failed},
-        {FileCall::SetAttributes, EPERM, Fault::Part::Nothing, MoveResult::Moved},
-        {FileCall::Rename, EROFS, Fault::Part::Nothing, MoveResult::Failed},
-    };
-    for (Case const& c : c_cases) {
+        Fault const& fault = std::get<0>(row);
+        MoveResult const expected = std::get<1>(row);
         TwoVolumes const volumes;
         MoveResult result = MoveResult::Moved;
         auto const operation = [&](FaultyFiles& faults) {
@@ -226,16 +224,15 @@ TEST_F(FileSystemMovesTest, EveryFaultOfACopyingMoveLeavesSourceOrTargetWhole)
             EXPECT_EQ(faults.GetOpenHandles(), 0);
         };
         auto const check = [&](int n) {
-            SCOPED_TRACE(testing::Message() << "call " << int(c.call) << " error " << c.error << " n " << n);
+            SCOPED_TRACE(testing::Message() << "call " << int(fault.call) << " error " << fault.error << " n " << n);
             // A fault in opening the source for its flush, or in closing it, is passed over.
-            EXPECT_TRUE(result == c.result || result == MoveResult::Moved) << int(result);
+            EXPECT_TRUE(result == expected || result == MoveResult::Moved) << int(result);
             std::string const target = Read("target");
             EXPECT_TRUE(target == "target content" || target == "new content");
             EXPECT_TRUE(target == "new content" || Read("old") == "new content");
             EXPECT_TRUE(target == "new content" || result != MoveResult::Moved);
             EXPECT_EQ(List(), result == MoveResult::Moved ? Names{"target"} : Names({"old", "target"}));
         };
-        Fault fault{.call = c.call, .error = c.error, .part = c.part};
         int const fired = TestSupport::ForEachFault(fault, operation, check, 100);
         EXPECT_TRUE(fired > 0 && fired < 100);
     }
@@ -290,38 +287,27 @@ TEST_F(FileSystemMovesTest, MoveThatMayNotLastFailsButTellsThatItWasMade)
 
 TEST_F(FileSystemMovesTest, MoveBetweenNamesOfOneFileLeavesTheNewNameAlone)
 {
-    struct Case
-    {
-        char const* what;
-        std::string from, to;
-        bool fromGoes;
-    };
     std::filesystem::create_directory(m_folder / "sub");
-    Case const cases[] = {
-        {"two names", "old", "second", true},
-        {"in two folders", "old", "sub/second", true},
-        {"itself", "old", "old", false},
-        {"itself, spelt otherwise", "old", "sub/.././old", false},
-    };
-    auto const rename = [&](Case const& c) { return FileSystem::RenameFile(At(c.from), At(c.to), 0); };
-    auto const move = [&](Case const& c) { return FileSystem::SafeMoveFile(At(c.from), At(c.to)); };
-    auto const run = [&](Case const& c, auto const& operation) {
-        WriteWholeFile(m_folder / c.from, "content");
+    auto const rename = [&](auto const& to) { return FileSystem::RenameFile(At("old"), At(to), 0); };
+    auto const move = [&](auto const& to) { return FileSystem::SafeMoveFile(At("old"), At(to)); };
+    auto const run = [&](std::string const& to, auto const& operation) {
+        Make("old", "content");
         std::filesystem::remove(m_folder / "third");
-        std::filesystem::create_hard_link(m_folder / c.from, m_folder / "third");
-        if (c.fromGoes) std::filesystem::create_hard_link(m_folder / c.from, m_folder / c.to);
-        EXPECT_TRUE(operation(c)) << c.what;
-        EXPECT_EQ(std::filesystem::exists(m_folder / c.from), !c.fromGoes) << c.what;
-        EXPECT_EQ(Read(c.to), "content") << c.what;
-        std::filesystem::remove(m_folder / c.to);
+        std::filesystem::create_hard_link(m_folder / "old", m_folder / "third");
+        bool const oldGoes = to.ends_with("second"); // Otherwise it is the same name.
+        if (oldGoes) std::filesystem::create_hard_link(m_folder / "old", m_folder / to);
+        EXPECT_TRUE(operation(to)) << to;
+        EXPECT_EQ(std::filesystem::exists(m_folder / "old"), !oldGoes) << to;
+        EXPECT_EQ(Read(to), "content") << to;
+        std::filesystem::remove(m_folder / to);
     };
-    for (Case const& c : cases) {
-        run(c, rename);
-        run(c, move);
+    for (char const* const to : {"second", "sub/second", "old", "sub/.././old"}) {
+        run(to, rename);
+        run(to, move);
         // Where nothing can be renamed a copy would take its place, and the file's only name would go.
         TwoVolumes const volumes;
         FaultyFiles faults;
-        run(c, move);
+        run(to, move);
         EXPECT_EQ(faults.GetCount(FileCall::Write), 0);
     }
 }

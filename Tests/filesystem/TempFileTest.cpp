@@ -6,6 +6,7 @@
 #include "libkernel/streams/FileOutStream.h"
 #include "support/FaultyFiles.h"
 #include "support/FileFixture.h"
+#include "support/Rows.h"
 
 #include <chrono>
 #include <future>
@@ -38,11 +39,7 @@ protected:
         std::vector<String8> rescued;
         TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
     }
-    ~TempFileTest() override
-    {
-        std::vector<String8> rescued;
-        TempFile::SetTempPath("", "", rescued);
-    }
+    ~TempFileTest() override { TempFile::SetTempPath(""); }
 
     /// The counter of a generated path.
     static u64 CounterOf(String8 const& path)
@@ -207,46 +204,33 @@ TEST_F(TempFileTest, StartEmptiesTheFoldersButKeepsMidStreamlineFiles)
         EXPECT_TRUE(std::filesystem::exists(kept)) << kept;
 
     // One that cannot be asked for its mark stays.
-    struct Case
-    {
-        FileCall call;
-        int error;
-        bool stays;
-    };
     FaultyFiles faults;
-    for (Case const& c :
-         {Case{FileCall::Open, EMFILE, true}, {FileCall::Read, EIO, true}, {FileCall::Open, ENOENT, false}}) {
+    for (auto const& [call, error, stays] : Rows<FileCall, int, bool>{
+             {FileCall::Open, EMFILE, true}, {FileCall::Read, EIO, true}, {FileCall::Open, ENOENT, false}})
+    {
         WriteWholeFile(m_second / "rescue", Header(11, 4));
         faults.Clear();
-        faults.Plan({.call = c.call, .error = c.error, .path = "rescue"});
+        faults.Plan({.call = call, .error = error, .path = "rescue"});
         rescued.clear();
         TempFile::SetTempPath(S(m_first.GetPath()), S(m_second.GetPath()), rescued);
         EXPECT_TRUE(rescued.empty());
-        EXPECT_EQ(FileSystem::Exists(S(m_second / "rescue")), c.stays) << c.error;
+        EXPECT_EQ(FileSystem::Exists(S(m_second / "rescue")), stays) << error;
     }
 }
 
 TEST_F(TempFileTest, MidStreamlineMarkIsReadFromAWholeHeaderOnly)
 {
-    struct Case
+    for (auto const& [content, isMarked] : Rows<std::string, bool>{{Header(11, 4), true},
+                                                                   {Header(7, 4 | 1), true},
+                                                                   {Header(11, 1 | 2 | 8), false},
+                                                                   {Header(6, 4), false},
+                                                                   {Header(12, 4), false},
+                                                                   {"x" + Header(11, 4).substr(1), false},
+                                                                   {Header(11, 4).substr(0, 11), false},
+                                                                   {"", false}})
     {
-        char const* what;
-        std::string content;
-        bool isMarked;
-    };
-    Case const cases[] = {
-        {"marked", Header(11, 4), true},
-        {"oldest version", Header(7, 4 | 1), true},
-        {"other flags", Header(11, 1 | 2 | 8), false},
-        {"version too low", Header(6, 4), false},
-        {"version too high", Header(12, 4), false},
-        {"wrong magic", "x" + Header(11, 4).substr(1), false},
-        {"cut short", Header(11, 4).substr(0, 11), false},
-        {"empty", "", false},
-    };
-    for (Case const& c : cases) {
-        WriteWholeFile(m_first / "file", c.content);
-        EXPECT_EQ(TempFile::IsMidStreamlineFile(S(m_first / "file")), c.isMarked) << c.what;
+        WriteWholeFile(m_first / "file", content);
+        EXPECT_EQ(TempFile::IsMidStreamlineFile(S(m_first / "file")), isMarked) << testing::PrintToString(content);
     }
     EXPECT_FALSE(TempFile::IsMidStreamlineFile(S(m_first / "missing")));
     EXPECT_FALSE(TempFile::IsMidStreamlineFile(S(m_first.GetPath())));

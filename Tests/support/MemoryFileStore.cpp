@@ -92,16 +92,6 @@ MemoryFileStore::~MemoryFileStore()
     if (!diesSuddenly) PreDestruction();
 }
 
-MemoryFileStore::Revision MemoryFileStore::Put(char const* path, String8 const& bytes, bool incremental)
-{
-    return Commit(path, bytes, incremental);
-}
-
-MemoryFileStore::Revision MemoryFileStore::Delete(char const* path)
-{
-    return Commit(path, std::nullopt, false);
-}
-
 MemoryFileStore::Revision MemoryFileStore::Commit(char const* path, std::optional<String8> bytes, bool incremental)
 {
     Counted<MemoryRevision> const revision(new MemoryRevision);
@@ -127,16 +117,6 @@ std::optional<String8> MemoryFileStore::Find(String8 const& path, Revision revis
 }
 
 bool MemoryFileStore::LoadFile(String8 const& path, Revision revision, FileStoreItem& item, bool)
-{
-    return LoadI(path, revision, item);
-}
-
-bool MemoryFileStore::LoadFile(String8 const& path, FileStoreItem& item)
-{
-    return LoadI(path, nullptr, item);
-}
-
-bool MemoryFileStore::LoadI(String8 const& path, Revision revision, FileStoreItem& item)
 {
     ++loads;
     RunHook(onLoad);

@@ -34,22 +34,15 @@ public:
     void Save(OutStream& stream, FileStoreOut& out) const override;
     bool Load(InStream& stream, FileStore& store) override;
     FileStoreItemType const* GetObjectFileStoreItemType() const override { return m_type; }
-    void AboutToMakeDirty() override
-    {
-        if (onAboutToMakeDirty) onAboutToMakeDirty();
-    }
-    void PostMarkAsDirty() override
-    {
-        FileStoreItem::PostMarkAsDirty();
-        if (onPostMarkAsDirty) onPostMarkAsDirty();
-    }
+    void AboutToMakeDirty() override { onAboutToMakeDirty(); }
+    void PostMarkAsDirty() override { FileStoreItem::PostMarkAsDirty(), onPostMarkAsDirty(); }
     using FileStoreStateObject::MarkAsClean;
 
     String8 text;
     std::vector<Counted<DelayLoadHolder>> parts;
     std::vector<bool> eager;
-    std::function<void()> onAboutToMakeDirty;
-    std::function<void()> onPostMarkAsDirty;
+    std::function<void()> onAboutToMakeDirty = [] {};
+    std::function<void()> onPostMarkAsDirty = [] {};
 
 protected:
     ~MemoryItem() override;
@@ -85,8 +78,11 @@ public:
     static Counted<MemoryFileStore> Create() { return Counted<MemoryFileStore>(new MemoryFileStore); }
 
     /// Commits a revision with this one change.
-    Revision Put(char const* path, String8 const& bytes, bool incremental = false);
-    Revision Delete(char const* path);
+    Revision Put(char const* path, String8 const& bytes, bool incremental = false)
+    {
+        return Commit(path, bytes, incremental);
+    }
+    Revision Delete(char const* path) { return Commit(path, std::nullopt, false); }
     /// A holder of the type that goes with the path.
     Counted<DelayLoadHolder> Hold(char const* path, FileStoreLoadContext* context = nullptr)
     {
@@ -94,7 +90,7 @@ public:
     }
 
     bool LoadFile(String8 const& path, Revision revision, FileStoreItem& item, bool reportToCallback) override;
-    bool LoadFile(String8 const& path, FileStoreItem& item) override;
+    bool LoadFile(String8 const& path, FileStoreItem& item) override { return LoadFile(path, nullptr, item, false); }
     bool IsBroken() const override { return broken; }
     Counted<FileStoreBackData const> CreateBackData(Revision revision, String8 const& path) override;
 
@@ -128,7 +124,6 @@ private:
     Revision Commit(char const* path, std::optional<String8> bytes, bool incremental);
     /// The bytes at or before a revision; null stands for the newest.
     std::optional<String8> Find(String8 const& path, Revision revision, Counted<MemoryRevision>* at = nullptr) const;
-    bool LoadI(String8 const& path, Revision revision, FileStoreItem& item);
 
     CriticalSection m_lock;
     std::vector<Counted<MemoryRevision>> m_revisions; // Guarded by m_lock.
