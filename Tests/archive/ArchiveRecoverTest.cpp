@@ -189,16 +189,24 @@ TEST_F(ArchiveRecoverTest, LongChainsOnABrokenTableAreGivenUpAtOnce)
 {
     // Each of these chains ends in the same damage: walked one by one they would take hours.
     constexpr int length = 30'000;
-    for (bool const contradicts : {false, true}) {
+    enum class Damage
+    {
+        Body,
+        Header, // Then the search does not see it.
+        Contradiction
+    };
+    for (Damage const damage : {Damage::Body, Damage::Header, Damage::Contradiction}) {
+        bool const contradicts = damage == Damage::Contradiction;
         ArchiveBuilder file;
-        u64 const oldest =
-            file.AddTable({.records = {{1, static_cast<u8>(contradicts ? 0 : 9), "a", file.AddBlock("1")}}});
+        ArchiveBuilder::Table first{.records = {{1, static_cast<u8>(contradicts ? 0 : 9), "a", file.AddBlock("1")}}};
+        if (damage == Damage::Header) first.tag = "#FT1";
+        u64 const oldest = file.AddTable(first);
         std::string const end(4, '\xFF');
         for (int n = 0; n < length; ++n) {
             file.AddRaw(end);
             ArchiveBuilder::Table table;
             if (contradicts) table.records = {{1, 0, "b"}};
-            if (n % 3 == 0 && !contradicts) table.next = oldest;
+            if (n % 3 == 0 && damage == Damage::Body) table.next = oldest;
             file.AddTable(table);
         }
         file.firstFAT = 80;

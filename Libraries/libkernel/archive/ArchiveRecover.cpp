@@ -190,10 +190,12 @@ Result ArchiveLoader::RecoverArchiveFile(Archive::ArchiveFile& file, IDTag tag, 
             if (walked == Archive::OpenOk && fresh.revisions.front()->m_fatPos >= front.contentPos)
                 return take(fresh, entry->m_position, highestUID);
             if (failedAt == 0 && ++contradictions == maxContradictions) return Archive::OpenCorrupt;
+            if (failedAt == 0) continue;
+            // What the search has not seen ends the way to it.
             FATEntry* const bad = search.Find(failedAt);
-            if (failedAt == 0 || !bad) continue;
-            for (FATEntry* one = entry; one && one != bad; one = one->m_parent) one->m_isBad = true;
-            bad->m_isBad = true;
+            for (FATEntry* one = entry; one && one != bad && one->m_position != 0; one = one->m_parent)
+                one->m_isBad = true;
+            if (bad) bad->m_isBad = true;
         }
     }
     return Archive::OpenCorrupt;
