@@ -438,7 +438,8 @@ public:
     Counted<FileStoreBackData const> CreateBackData(NonCounted<FileStoreRevision const> revision,
                                                     String8 const& path) override;
     /// Null if there is no such file; ArchiveCorruptionException if its block is bad. The stream checks the CRC when
-    /// its last byte has been delivered, and keeps the archive alive.
+    /// its last byte has been delivered, throws MemoryException where it has none to unpack with, and keeps the archive
+    /// alive.
     Counted<InStream> OpenFileInStream(String8 const& path);
     Counted<InStream> OpenFileInStream(String8 const& path, NonCounted<FileStoreRevision const> revision);
     /// The whole file, unpacked and checked; null or false if it is not there, damaged or too large for memory.
@@ -460,7 +461,7 @@ public:
     bool FileWasDeleted(String8 const& path) const;
     /// All revisions, oldest first, whatever the working revision is.
     void GetRevisions(std::vector<Counted<Revision const>>& revisions) const;
-    /// Reads one stored block and checks its framing and both CRCs.
+    /// Reads one stored block and checks its framing and both CRCs. Throws MemoryException or std::bad_alloc.
     BlockCheck CheckStoredBlock(Revision const& revision, FileRevision const& entry);
     u64 GetTotalBytes() const;
     u64 GetDeadByteCount() const;

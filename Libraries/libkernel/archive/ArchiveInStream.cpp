@@ -54,6 +54,12 @@ Counted<InStream> MakeArchiveUnpacker(Counted<InStream> const& stored, u8 code)
     }
 }
 
+void ThrowIfOutOfMemory(Counted<InStream> const& unpacker)
+{
+    auto const* const decompressor = dynamic_cast<CompressionInStream const*>(unpacker.Get());
+    if (decompressor && decompressor->LacksMemory()) throw MemoryException();
+}
+
 ArchiveInStream::ArchiveInStream(Counted<Archive> archive, ArchiveImpl& impl, Counted<Archive::AccessBlock> access,
                                  Counted<Archive::ArchiveFile> file, Counted<Archive::Revision const> revision,
                                  Archive::FileRevision const& entry)
@@ -88,6 +94,7 @@ u64 ArchiveInStream::ReadUnpacked(void* to, u64 count)
     m_unpacked += got;
     if (got == count) return got;
     if (m_reader->HasFailed()) m_impl.ThrowFileException(*m_file, ArchiveFileException::Reason::ReadFailed);
+    ThrowIfOutOfMemory(m_unpacker);
     m_impl.ReportCorruption(false); // The bytes are there and end too early.
     return got;
 }

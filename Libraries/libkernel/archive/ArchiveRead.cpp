@@ -517,14 +517,16 @@ Archive::BlockCheck ArchiveImpl::CheckUnpacked(Archive::ArchiveFile& file, Archi
     auto const reader = MakeCounted<ArchiveFileStreamReader>(Counted<Archive::ArchiveFile>(&file),
                                                              entry.filePos + c_blockTagSize, entry.fileCompressedSize);
     Counted<InStream> const unpacker = MakeArchiveUnpacker(reader, entry.compressionCode);
-    if (!unpacker) return BlockCheck::Unreadable;
+    if (!unpacker) throw MemoryException();
     ArchiveCopyBuffer const buffer;
     u32 crc = 0;
     CRC32::BeginCRC32(crc);
     for (u64 at = 0; at < entry.fileSize;) {
         u64 const piece = std::min(entry.fileSize - at, c_copyBufferSize);
-        if (unpacker->ReadBlock(buffer.GetData(), piece) != piece)
+        if (unpacker->ReadBlock(buffer.GetData(), piece) != piece) {
+            ThrowIfOutOfMemory(unpacker);
             return reader->HasFailed() ? BlockCheck::Unreadable : BlockCheck::BadData;
+        }
         CRC32::CalcCRC32(buffer.GetData(), piece, crc);
         at += piece;
     }

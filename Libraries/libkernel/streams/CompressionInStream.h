@@ -35,6 +35,9 @@ public:
     bool SkipBlock(u64 count) override;
     /// Always true.
     bool EOS() const override;
+    /// True if the decompressor has run out of memory, so that the short read or the exception says nothing about the
+    /// data. The stream is of no further use then.
+    bool LacksMemory() const { return m_lacksMemory; }
     /// Always 0, the position too.
     u64 GetSizeInStream() const override;
     u64 TellInStream() const override;
@@ -56,8 +59,10 @@ protected:
     }
 
     /// Decompresses from the input to @p to, @p count bytes at most, and says in @p delivered how many came. There may
-    /// be no input; what the decompressor still holds is then to be given. False for damaged data.
+    /// be no input; what the decompressor still holds is then to be given. False for damaged data, and where there is
+    /// no memory, after a SetLacksMemory().
     virtual bool DecompressFromBuffer(void* to, u64 count, u64& delivered) = 0;
+    void SetLacksMemory() { m_lacksMemory = true; }
 
 private:
     u64 Decompress(u8* to, u64 count, bool& failed);
@@ -70,7 +75,8 @@ private:
     bool m_striped;
     bool const m_throwOnError;
     bool m_damaged = false; // The decompressor has refused the data.
-    u8* m_block = nullptr;  // Input block; then, with striping, chunks and scratch.
+    bool m_lacksMemory = false;
+    u8* m_block = nullptr; // Input block; then, with striping, chunks and scratch.
     u8* m_inputRead = nullptr;
     u64 m_inputLeft = 0;
     u8* m_chunkRead = nullptr; // Decompressed, still striped and encoded.

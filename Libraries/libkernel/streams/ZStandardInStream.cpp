@@ -27,18 +27,18 @@ bool HasMagic(u8 const* at)
 }
 
 // One step. False for damaged data. @p frameTaken counts the bytes of the frame that were taken so far.
-bool DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, u64& frameTaken)
+ZSTD_ErrorCode DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, u64& frameTaken)
 {
     size_t const before = input.pos, size = input.size;
     if (frameTaken == 0 && size - before >= c_longestHeader) {
-        if (!HasMagic(static_cast<u8 const*>(input.src) + before)) return false;
+        if (!HasMagic(static_cast<u8 const*>(input.src) + before)) return ZSTD_error_prefix_unknown;
     } else if (frameTaken < c_longestHeader)
         input.size = before + std::min(size - before, std::min(c_longestHeader - frameTaken, c_headerPiece));
     size_t const result = ZSTD_decompressStream(context, &output, &input);
     input.size = size;
     // 0 is the end of a frame.
     frameTaken = result == 0 ? 0 : frameTaken + (input.pos - before);
-    return !ZSTD_isError(result);
+    return ZSTD_getErrorCode(result);
 }
 
 } // namespace
@@ -73,7 +73,9 @@ bool ZStandardInStream::DecompressFromBuffer(void* to, u64 count, u64& delivered
 {
     ZSTD_inBuffer input{GetInput(), GetInputLeft(), 0};
     ZSTD_outBuffer output{to, count, 0};
-    bool const good = DecompressStep(m_context, output, input, m_frameTaken);
+    ZSTD_ErrorCode const error = DecompressStep(m_context, output, input, m_frameTaken);
+    if (error == ZSTD_error_memory_allocation) SetLacksMemory();
+    bool const good = error == ZSTD_error_no_error;
     UseInput(input.pos);
     delivered = good ? output.pos : 0;
     return good;
@@ -95,7 +97,7 @@ bool DecompressBeginning(ZSTD_DCtx* context, void const* from, u64 fromSize, voi
     u64 frameTaken = 0;
     while (output.pos < size) {
         size_t const inputBefore = input.pos, outputBefore = output.pos;
-        if (!DecompressStep(context, output, input, frameTaken)) return false;
+        if (DecompressStep(context, output, input, frameTaken) != ZSTD_error_no_error) return false;
         if (input.pos == inputBefore && output.pos == outputBefore) return false;
     }
     return true;

@@ -49,6 +49,7 @@ bool ZipInStream::DecompressFromBuffer(void* to, u64 count, u64& delivered)
     z.next_out = static_cast<u8*>(to);
     z.avail_out = room;
     int const result = inflate(&z, Z_NO_FLUSH);
+    if (result == Z_MEM_ERROR) SetLacksMemory();
     UseInput(input - z.avail_in);
     bool const good = result == Z_OK || result == Z_STREAM_END;
     delivered = good ? room - z.avail_out : 0;

@@ -37,8 +37,13 @@ private:
 /// decompressor makes of them. Null when there is no memory.
 Counted<InStream> MakeArchiveUnpacker(Counted<InStream> const& stored, u8 compressionCode);
 
+/// To be asked after a short read, before the block is taken for damaged: throws MemoryException if an unpacker from
+/// above had no memory to go on.
+void ThrowIfOutOfMemory(Counted<InStream> const& unpacker);
+
 /// One file of an archive, unpacked. Checks the CRC when the last byte has been delivered; a difference throws
-/// ArchiveCorruptionException, a file that cannot be read ArchiveFileException. Keeps the archive and its handle.
+/// ArchiveCorruptionException, a file that cannot be read ArchiveFileException, and an unpacker without memory
+/// MemoryException. Keeps the archive and its handle.
 class ArchiveInStream : public InStream
 {
 public:
