@@ -70,12 +70,17 @@ std::atomic<int> s_freeCount{0}; // On the stack, roughly: a batch may be on its
 constexpr int c_mostFree = 4096;
 constexpr int c_batch = 32;
 
+void ShareOwnJobs(void* own);
+Platform::ThreadEnd s_threadEnd(ShareOwnJobs);
+
 struct OwnFreeJobs
 {
     Job* first = nullptr;
     Job* last = nullptr; // Of those freed here; what came from the stack isn't counted.
     int count = 0;
+    bool isArmed = false; // They are shared when the thread ends. A thread that has not been promised that keeps none.
 
+    bool Arm() { return isArmed || (isArmed = s_threadEnd.Arm(this)); }
     void Share()
     {
         if (!first) return;
@@ -87,14 +92,19 @@ struct OwnFreeJobs
         first = last = nullptr;
         count = 0;
     }
-    ~OwnFreeJobs() { Share(); }
 };
 thread_local OwnFreeJobs t_free;
+
+void ShareOwnJobs(void* own)
+{
+    static_cast<OwnFreeJobs*>(own)->Share();
+    static_cast<OwnFreeJobs*>(own)->isArmed = false;
+}
 
 Job* NewJob()
 {
     OwnFreeJobs& own = t_free;
-    if (!own.first && s_free.load(std::memory_order_relaxed)) {
+    if (!own.first && s_free.load(std::memory_order_relaxed) && own.Arm()) {
         own.first = own.last = s_free.exchange(nullptr, std::memory_order_acquire);
         own.count = 0;
         s_freeCount.store(0, std::memory_order_relaxed);
@@ -110,11 +120,11 @@ void FreeJob(Job* job)
 {
     job->function = nullptr;
     job->scopes.clear();
-    if (s_freeCount.load(std::memory_order_relaxed) >= c_mostFree) {
+    OwnFreeJobs& own = t_free;
+    if (s_freeCount.load(std::memory_order_relaxed) >= c_mostFree || !own.Arm()) {
         delete job;
         return;
     }
-    OwnFreeJobs& own = t_free;
     job->next = own.first;
     own.first = job;
     if (!own.last) own.last = job;

@@ -8,6 +8,7 @@
 #include <atomic>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <vector>
 
 // One lock guards three rings of pending jobs and the census of the workers. It is held for some tens of nanoseconds at
@@ -80,8 +81,21 @@ public:
         return job;
     }
 
+    // Takes out the newest job of that context; false if it has been taken already.
+    bool Withdraw(void const* context)
+    {
+        u64 i = m_count;
+        while (i > 0 && At(i - 1).context != context) --i;
+        if (i == 0) return false;
+        for (; i < m_count; ++i) At(i - 1) = At(i);
+        --m_count;
+        return true;
+    }
+
 private:
     static constexpr u64 c_kept = 65536;
+
+    Pending& At(u64 i) { return m_jobs[(m_head + i) & (m_capacity - 1)]; }
 
     void Grow()
     {
@@ -104,12 +118,17 @@ class Pool
 public:
     explicit Pool(Pool* before) : m_processors(Platform::CountUsableCpus()), m_before(before)
     {
+        // The threads that use these have nobody to tell that there is no memory.
         m_threadIds.reserve(static_cast<u64>(std::max(c_mostThreads, m_processors)));
+        m_measuredIds.reserve(m_threadIds.capacity());
     }
 
     int GetProcessors() const { return m_processors; }
-    // Adds all copies, or throws std::bad_alloc and adds none.
-    void Add(Queue queue, Pending const& job, int copies);
+    // Adds all copies, or throws std::bad_alloc and adds none. False if a worker was to be started for them and could
+    // not be.
+    bool Add(Queue queue, Pending const& job, int copies);
+    // Takes a job back if nobody is there who could do it.
+    bool Withdraw(Queue queue, void const* context);
 
 private:
     // What has to be done outside the lock after a change under it.
@@ -131,9 +150,9 @@ private:
     bool Look();
     Pending TakeCS();
     void CallForHelpCS(Calls& calls);
-    void Do(Calls const& calls);
-    void StartWorker();
-    i64 MeasureCS(std::vector<u64>& threads);
+    bool Do(Calls const& calls);
+    bool StartWorker();
+    i64 MeasureCS();
     void Lock() { m_lock.lock(); }
     void Unlock() { m_lock.unlock(); }
 
@@ -142,20 +161,21 @@ private:
     alignas(64) BriefLock m_lock;          // Guards everything but the atomics.
     Ring m_rings[c_queueCount];
     u64 m_pending = 0;
-    std::vector<u64> m_threadIds; // Of all workers.
-    int m_threads = 0;            // Workers there are or that are being started.
-    int m_looking = 0;            // Workers that look for work without sleeping, those being started among them.
-    int m_sleeping = 0;           // Workers that sleep and that nobody has woken.
-    int m_woken = 0;              // Wakes that no worker has answered yet.
-    int m_surplus = 0;            // Workers to be sent home after their present job.
-    bool m_managed = false;       // The manager has work to do.
+    std::vector<u64> m_threadIds;   // Of all workers.
+    std::vector<u64> m_measuredIds; // The manager's own copy.
+    int m_threads = 0;              // Workers there are or that are being started.
+    int m_looking = 0;              // Workers that look for work without sleeping, those being started among them.
+    int m_sleeping = 0;             // Workers that sleep and that nobody has woken.
+    int m_woken = 0;                // Wakes that no worker has answered yet.
+    int m_surplus = 0;              // Workers to be sent home after their present job.
+    bool m_managed = false;         // The manager has work to do.
     bool m_managerThere = false;
     alignas(64) std::atomic<u64> m_hint{0}; // m_pending, for a look without the lock.
     std::atomic<u32> m_bell{0};             // Rung for a sleeping worker.
     std::atomic<u32> m_managerBell{0};
 };
 
-void Pool::Add(Queue queue, Pending const& job, int copies)
+bool Pool::Add(Queue queue, Pending const& job, int copies)
 {
     Calls calls;
     {
@@ -166,7 +186,15 @@ void Pool::Add(Queue queue, Pending const& job, int copies)
         m_hint.store(m_pending, std::memory_order_relaxed);
         CallForHelpCS(calls);
     }
-    Do(calls);
+    return Do(calls);
+}
+
+bool Pool::Withdraw(Queue queue, void const* context)
+{
+    std::lock_guard const lock(m_lock);
+    if (m_threads > 0 || !m_rings[queue].Withdraw(context)) return false;
+    m_hint.store(--m_pending, std::memory_order_relaxed);
+    return true;
 }
 
 Pending Pool::TakeCS()
@@ -199,25 +227,28 @@ void Pool::CallForHelpCS(Calls& calls)
     }
 }
 
-void Pool::Do(Calls const& calls)
+// False if a worker was to be started and could not be.
+bool Pool::Do(Calls const& calls)
 {
     if (calls.wake) Platform::WakeWord(m_bell, 1);
-    if (calls.startWorker) StartWorker();
+    bool const isStarted = !calls.startWorker || StartWorker();
     if (calls.wakeManager) Platform::WakeWord(m_managerBell, 1);
     if (calls.startManager && !Platform::StartDetachedThread(RunManagerThread, this)) {
         Lock(); // The next job tries again.
         m_managerThere = m_managed = false;
         Unlock();
     }
+    return isStarted;
 }
 
-void Pool::StartWorker()
+bool Pool::StartWorker()
 {
-    if (Platform::StartDetachedThread(RunWorkerThread, this)) return;
+    if (Platform::StartDetachedThread(RunWorkerThread, this)) return true;
     Lock();
     --m_threads;
     --m_looking;
     Unlock();
+    return false;
 }
 
 void Pool::RunWorker() noexcept
@@ -297,8 +328,6 @@ bool Pool::SleepUntilWoken()
 
 void Pool::RunManager() noexcept
 {
-    std::vector<u64> threads;
-    threads.reserve(c_mostThreads);
     i64 pause = c_firstLookNs;
     Lock();
     for (;;) {
@@ -317,7 +346,7 @@ void Pool::RunManager() noexcept
             continue; // Give the workers their first moments before looking.
         }
         if (m_pending == 0 || m_looking + m_woken > 0) continue;
-        i64 const missing = MeasureCS(threads);
+        i64 const missing = MeasureCS();
         m_surplus = missing < 0 ? static_cast<int>(-missing) : 0;
         i64 const wanted = std::min<i64>({missing, static_cast<i64>(m_pending), c_mostThreads - m_threads});
         pause = wanted > 0 ? c_firstLookNs : std::min(pause * 2, c_longestLookNs);
@@ -333,11 +362,11 @@ void Pool::RunManager() noexcept
 }
 
 // How many workers fewer run than there are processors; below 0 if more do. Lets go of the lock meanwhile.
-i64 Pool::MeasureCS(std::vector<u64>& threads)
+i64 Pool::MeasureCS()
 {
-    threads = m_threadIds;
+    m_measuredIds = m_threadIds;
     Unlock();
-    i64 const running = std::count_if(threads.begin(), threads.end(), Platform::IsThreadRunnable);
+    i64 const running = std::count_if(m_measuredIds.begin(), m_measuredIds.end(), Platform::IsThreadRunnable);
     Lock();
     return m_processors - running;
 }
@@ -455,7 +484,10 @@ Queue GetQueue(int priority)
 
 void Async(Queue queue, void* context, JobFunction work)
 {
-    GetPool().Add(queue, {work, context}, 1);
+    Pool& pool = GetPool();
+    if (pool.Add(queue, {work, context}, 1)) return;
+    // It would lie there until some later job brings a worker.
+    if (pool.Withdraw(queue, context)) throw std::bad_alloc();
 }
 
 void Apply(u64 count, Queue queue, void* context, RangeFunction work)

@@ -19,9 +19,9 @@ using RangeFunction = void (*)(void* context, u64 begin, u64 end);
 using Queue = int;
 Queue GetQueue(int priority);
 
-/// Queues a job and returns; throws std::bad_alloc if there is no room. At most 256 jobs run at once, blocked ones
-/// included. Jobs of one queue start in the order given, a higher queue's before a lower one's. A job
-/// that throws ends the process.
+/// Queues a job and returns; throws std::bad_alloc if there is no room, or no thread to run it. At most 256 jobs run at
+/// once, blocked ones included. Jobs of one queue start in the order given, a higher queue's before a lower one's. A
+/// job that throws ends the process.
 void Async(Queue queue, void* context, JobFunction work);
 
 /// Runs all indices below @p count on this thread and on workers, and returns when the last is done. Indices are

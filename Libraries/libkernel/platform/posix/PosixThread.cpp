@@ -11,6 +11,7 @@
 #include <set>
 #include <signal.h>
 #include <string>
+#include <string_view>
 #include <sys/sysinfo.h>
 #include <unistd.h>
 
@@ -93,14 +94,23 @@ bool StartDetachedThread(void (*run)(void*), void* context)
     return started;
 }
 
+static_assert(sizeof(pthread_key_t) == sizeof(unsigned));
+
+ThreadEnd::ThreadEnd(void (*run)(void*)) : m_hasKey(::pthread_key_create(&m_key, run) == 0) {}
+
+bool ThreadEnd::Arm(void* context)
+{
+    return m_hasKey && ::pthread_setspecific(m_key, context) == 0;
+}
+
 bool IsThreadRunnable(u64 id)
 {
     char path[64];
     std::snprintf(path, sizeof path, "/proc/self/task/%llu/stat", static_cast<unsigned long long>(id));
     char text[512];
-    std::string const stat(text, ReadSmallFile(path, text, sizeof text));
+    std::string_view const stat(text, ReadSmallFile(path, text, sizeof text));
     size_t const behindName = stat.rfind(')'); // The name may hold anything, parentheses too.
-    return behindName != std::string::npos && behindName + 2 < stat.size() && stat[behindName + 2] == 'R';
+    return behindName != stat.npos && behindName + 2 < stat.size() && stat[behindName + 2] == 'R';
 }
 
 int CountUsableCpus()
