@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <new>
-#include <vector>
 
 namespace Kernel {
 
@@ -20,11 +19,12 @@ struct BufferPool
 
     ~BufferPool()
     {
-        for (u8* buffer : buffers) std::free(buffer);
+        while (count != 0) std::free(buffers[--count]);
     }
 
     CriticalSectionSpin lock;
-    std::vector<u8*> buffers; // Guarded by lock.
+    u8* buffers[c_kept] = {}; // Guarded by lock, as is the count.
+    size_t count = 0;
 };
 
 BufferPool& GetPool()
@@ -40,10 +40,7 @@ ArchiveCopyBuffer::ArchiveCopyBuffer() : m_data(nullptr)
     BufferPool& pool = GetPool();
     {
         CriticalSectionSpinScope const lock(pool.lock);
-        if (!pool.buffers.empty()) {
-            m_data = pool.buffers.back();
-            pool.buffers.pop_back();
-        }
+        if (pool.count != 0) m_data = pool.buffers[--pool.count];
     }
     if (!m_data) m_data = static_cast<u8*>(std::malloc(c_copyBufferSize));
     if (!m_data) throw std::bad_alloc();
@@ -54,8 +51,8 @@ ArchiveCopyBuffer::~ArchiveCopyBuffer()
     BufferPool& pool = GetPool();
     {
         CriticalSectionSpinScope const lock(pool.lock);
-        if (pool.buffers.size() < BufferPool::c_kept) {
-            pool.buffers.push_back(m_data);
+        if (pool.count < BufferPool::c_kept) {
+            pool.buffers[pool.count++] = m_data;
             return;
         }
     }

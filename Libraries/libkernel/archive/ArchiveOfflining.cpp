@@ -7,6 +7,8 @@
 #include "libkernel/streams/CRC32.h"
 
 #include <algorithm>
+#include <exception>
+#include <new>
 
 // Copies every file out of the archive's disk files on a background job, so that these may go away. Works a file at a
 // time and keeps off the disk while anybody reads.
@@ -57,11 +59,19 @@ void Archive::StartOffline(Counted<OffliningUpdater> const& updater)
         block = BeginAccessBlockAndOpenFileHandle(CreateExclusiveAccessBlockAdorner());
         if (!block) return;
     }
+    std::exception_ptr failure;
     {
         CriticalSectionScope const lock(m->m_stateLock);
-        m->CreateOfflineQueueCS();
+        try {
+            m->CreateOfflineQueueCS();
+        } catch (std::bad_alloc const&) {
+            failure = std::current_exception();
+            m->m_offlineQueue.clear();
+            m->m_offlineTotal = 0;
+        }
     }
     m->CloseFilesIfUnused();
+    if (failure) std::rethrow_exception(failure);
 }
 
 void ArchiveImpl::CloseFilesIfUnused()
@@ -95,10 +105,27 @@ void ArchiveImpl::StartOfflineThreadCS()
     m_readInProgress = m_readerCount != 0;
     if (!m_offlineWake) m_offlineWake = MakeCounted<Semaphore>();
     SetOffliningState(Archive::OffliningRunning);
-    // The job keeps the archive until it is done.
-    Counted<Archive> const archive(&m_self);
-    Dispatch::DispatchAndForget([archive] { archive->m->OffliningProc(); }, Dispatch::DispatchPriority::Default,
-                                Dispatch::ThreadPurpose::Worker);
+    try {
+        // The job keeps the archive until it is done.
+        Counted<Archive> const archive(&m_self);
+        Dispatch::DispatchAndForget([archive] { archive->m->OffliningProc(); }, Dispatch::DispatchPriority::Default,
+                                    Dispatch::ThreadPurpose::Worker);
+    } catch (std::bad_alloc const&) {
+        // A state of running that nobody ends would be waited for without end.
+        SetOffliningState(Archive::OffliningNotStarted);
+        throw;
+    }
+}
+
+void ArchiveImpl::GoOnOffliningCS(bool afresh) noexcept
+try {
+    if (afresh)
+        CreateOfflineQueueCS();
+    else
+        StartOfflineThreadCS();
+} catch (std::bad_alloc const&) {
+    m_offlineQueue.clear();
+    SetOffliningState(Archive::OffliningFailed);
 }
 
 void ArchiveImpl::EndOfflining(Archive::OffliningState state, int failure)
@@ -173,7 +200,7 @@ bool ArchiveImpl::HasMaster() const
 }
 
 bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive::Revision> const& revision)
-{
+try {
     Counted<FileStoreBackData const> copy;
     ArchiveBackDataBucketStore& store = ArchiveBackDataBucketStore::GetInstance();
     try {
@@ -184,8 +211,11 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
         if (!access.IsOpen()) return false;
         // Without a CRC of the stored bytes the only way to test them is to unpack them.
         bool const mustUnpack = entry.crcCompressed == 0 && entry.crcUncompressed != 0;
-        if (mustUnpack && CheckUnpacked(*revision->m_file, entry) != Archive::BlockCheck::Ok)
-            throw ArchiveCRCException(&m_self);
+        if (mustUnpack) {
+            Archive::BlockCheck const check = CheckUnpacked(*revision->m_file, entry);
+            if (check == Archive::BlockCheck::Unreadable) return false;
+            if (check != Archive::BlockCheck::Ok) throw ArchiveCRCException(&m_self);
+        }
         copy = store.Copy(*this, *revision->m_file, entry, &m_offlineAbort);
     } catch (ArchiveCRCException const&) {
         try {
@@ -214,6 +244,9 @@ bool ArchiveImpl::OfflineOne(Archive::FileRevision const& entry, Counted<Archive
     m_self.AddBackData(entry.info->GetPath(), revision.Get(), copy);
     if (updater) updater->Progress(total, done);
     return true;
+} catch (std::bad_alloc const&) {
+    // The job has nobody above it to tell.
+    return false;
 }
 
 void ArchiveImpl::ResumeOfflining()

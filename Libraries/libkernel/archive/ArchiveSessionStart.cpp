@@ -298,7 +298,7 @@ void ArchiveImpl::DropSession(ArchiveSession* session)
             m_readInProgress = false;
             resume = true;
         }
-        if (state.restartOfflining) StartOfflineThreadCS();
+        if (state.restartOfflining) GoOnOffliningCS(false);
     }
     if (resume) ResumeOfflining();
     for (Counted<Archive> const& source : state.sources) source->m->DecrementAccessCount();

@@ -175,13 +175,13 @@ Result ArchiveStreamliner::StreamlineFrame(Request const& request, bool& suspend
         --m_impl.m_runningStreamlines;
         bool const startedMeanwhile = m_impl.GetOffliningState() != Archive::OffliningNotStarted;
         if (result == Archive::StreamlineDone) {
-            if (before != Archive::OffliningNotStarted || startedMeanwhile) m_impl.CreateOfflineQueueCS();
+            if (before != Archive::OffliningNotStarted || startedMeanwhile) m_impl.GoOnOffliningCS(true);
         } else if (!startedMeanwhile && masterOpen && before != Archive::OffliningNotStarted) {
             m_impl.SetOffliningState(before);
             m_impl.m_offlineQueue.swap(queue);
             m_impl.m_offlineTotal = total;
             m_impl.m_offlineDone = done;
-            m_impl.StartOfflineThreadCS();
+            m_impl.GoOnOffliningCS(false);
         }
     }
     m_master = nullptr;

@@ -303,6 +303,8 @@ struct ArchiveImpl
     // ArchiveOfflining.cpp
     void CreateOfflineQueueCS();
     void StartOfflineThreadCS();
+    /// Begins again after what had stopped it, with a new queue if @p afresh. Without memory offlining has failed.
+    void GoOnOffliningCS(bool afresh) noexcept;
     void OffliningProc();
     void ResumeOfflining();
     /// Lets paused offlining go on unless a reader or a session is at work.
