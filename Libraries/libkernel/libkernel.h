@@ -47,6 +47,7 @@
 #include "libkernel/core/IDTag.h"
 #include "libkernel/core/Limits.h"
 #include "libkernel/core/LogSink.h"
+#include "libkernel/core/MemoryHeadroom.h"
 #include "libkernel/core/NestingGuard.h"
 #include "libkernel/core/NumberText.h"
 #include "libkernel/core/RawData.h"

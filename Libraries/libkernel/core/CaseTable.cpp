@@ -3,10 +3,10 @@
 #include <algorithm>
 #include <atomic>
 #include <cstring>
+#include <new>
 #include <unicode/casemap.h>
 #include <unicode/uchar.h>
 #include <unicode/uloc.h>
-#include <unicode/uset.h>
 #include <unicode/ustring.h>
 
 // ICU maps whole texts, and some of its rules look at neighbours; a text of one code point has none. Asking it so for
@@ -55,19 +55,10 @@ int FindRules(char const* locale)
     return 0;
 }
 
-std::vector<u32> CodePointsWithCase()
+// A table is kept for ever, so it must not be made of what was left out for want of memory.
+void ThrowIfOutOfMemory(UErrorCode error)
 {
-    std::vector<u32> all;
-    UErrorCode error = U_ZERO_ERROR;
-    USet const* const set = u_getBinaryPropertySet(UCHAR_CASE_SENSITIVE, &error);
-    if (U_FAILURE(error)) return all;
-    for (i32 i = 0; i < uset_getRangeCount(set); ++i) {
-        UChar32 first = 0;
-        UChar32 last = 0;
-        uset_getItem(set, i, &first, &last, nullptr, 0, &error);
-        for (UChar32 c = first; c <= last; ++c) all.push_back(static_cast<u32>(c));
-    }
-    return all;
+    if (error == U_MEMORY_ALLOCATION_ERROR) throw std::bad_alloc();
 }
 
 } // namespace
@@ -87,8 +78,9 @@ CaseTable const& CaseTable::Get(Operation operation, char const* locale)
 
 CaseTable::CaseTable(Operation operation, char const* language) : m_entries(c_block)
 {
-    for (u32 const codePoint : CodePointsWithCase()) {
-        if (codePoint >= c_end) break;
+    for (u32 codePoint = 0; codePoint < c_end; ++codePoint) {
+        // Asked one by one: the set of them all is made once for the process, and stays empty if that fails.
+        if (!u_hasBinaryProperty(static_cast<UChar32>(codePoint), UCHAR_CASE_SENSITIVE)) continue;
         UChar from[2];
         i32 fromLength = 0;
         U16_APPEND_UNSAFE(from, fromLength, codePoint);
@@ -96,6 +88,7 @@ CaseTable::CaseTable(Operation operation, char const* language) : m_entries(c_bl
         UErrorCode error = U_ZERO_ERROR;
         i32 const length =
             c_mappings[static_cast<int>(operation)](language, to, std::size(to), from, fromLength, error);
+        ThrowIfOutOfMemory(error);
         if (U_FAILURE(error) || length < 1 || u_strCompare(to, length, from, fromLength, false) == 0) continue;
 
         u32 mapped[c_longest];

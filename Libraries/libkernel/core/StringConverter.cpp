@@ -3,6 +3,7 @@
 #include "libkernel/core/CharTraits.h"
 #include "libkernel/core/CheckedMath.h"
 #include "libkernel/core/ConvertEnc.h"
+#include "libkernel/core/MemoryHeadroom.h"
 #include "libkernel/core/TextTools.h"
 #include "libkernel/core/internal/FileBytes.h"
 
@@ -94,10 +95,11 @@ String8 ToUtf8(String16 const& text)
 String8 Detect(char const* bytes, u64 size)
 {
     if (size == 0 || size > static_cast<u64>(c_longestText)) return {};
+    RequireMemory(c_icuHeadroom);
     UErrorCode status = U_ZERO_ERROR;
     std::unique_ptr<UCharsetDetector, decltype([](UCharsetDetector* d) { ucsdet_close(d); })> const detector(
         ucsdet_open(&status));
-    if (U_FAILURE(status)) return {};
+    if (U_FAILURE(status) || !detector) return {}; // Without memory it is null, and there is no error.
     ucsdet_setText(detector.get(), bytes, static_cast<int>(size), &status);
     UCharsetMatch const* const match = ucsdet_detect(detector.get(), &status);
     if (U_FAILURE(status) || !match) return {};

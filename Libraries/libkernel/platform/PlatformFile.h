@@ -148,7 +148,7 @@ struct FileCalls
     int (*readLink)(char const* path, std::string& target);
     /// Makes a symbolic link with @p target as its text. EEXIST if anything stands at @p path.
     int (*makeLink)(char const* target, char const* path);
-    /// The entries of a folder, in the file system's order, without "." and "..".
+    /// The entries of a folder, in the file system's order, without "." and "..". Throws std::bad_alloc.
     int (*listFolder)(char const* path, std::vector<FolderEntry>& entries);
     /// Brings the names in a folder to the device: what was made, renamed or removed there lasts. Where that can't be
     /// done, because the file system can't or because the process may not read the folder, the answer is 0 as well.

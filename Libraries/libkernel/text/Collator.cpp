@@ -1,6 +1,7 @@
 #include "libkernel/text/Collator.h"
 
 #include "libkernel/core/CharTraits.h"
+#include "libkernel/core/MemoryHeadroom.h"
 #include "libkernel/text/Locale.h"
 
 #include <unicode/ucol.h>
@@ -11,6 +12,7 @@ namespace {
 
 UCollator* Open(char const* locale)
 {
+    RequireMemory(c_icuHeadroom);
     UErrorCode status = U_ZERO_ERROR;
     UCollator* const collator = ucol_open(locale, &status);
     if (U_SUCCESS(status)) return collator;

@@ -4,6 +4,7 @@
 #include "libkernel/text/TextCase.h"
 
 #include <libstemmer.h>
+#include <new>
 
 namespace Kernel {
 
@@ -30,10 +31,10 @@ String8 Stemmer::Stem(String8 const& word) const
 {
     if (!m_stemmer) return word;
     String8 const lower = ToLowerCase(word);
-    // Null says that there was no memory.
     sb_symbol const* const stem =
         sb_stemmer_stem(m_stemmer, reinterpret_cast<sb_symbol const*>(lower.GetData()), lower.GetLength());
-    return stem ? String8(reinterpret_cast<char const*>(stem), sb_stemmer_length(m_stemmer)) : lower;
+    if (!stem) throw std::bad_alloc(); // Nothing else makes it null.
+    return String8(reinterpret_cast<char const*>(stem), sb_stemmer_length(m_stemmer));
 }
 
 } // namespace Kernel

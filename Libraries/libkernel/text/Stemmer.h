@@ -16,7 +16,8 @@ class Locale;
 class KERNEL_API Stemmer : public Countable
 {
 public:
-    /// A null locale, or one in another language, gives a stemmer that leaves words as they are.
+    /// A null locale, or one in another language, gives a stemmer that leaves words as they are; so does a want of
+    /// memory in libstemmer.
     explicit Stemmer(Counted<Locale const> const& locale);
     Stemmer(Stemmer const&) = delete;
     Stemmer& operator=(Stemmer const&) = delete;
@@ -25,7 +26,7 @@ public:
     /// is not valid UTF-8 gives some stem.
     String8 Stem(String8 const& word) const;
 
-    /// False for a language that libstemmer lacks.
+    /// False if words are left as they are.
     bool IsValid() const { return m_stemmer != nullptr; }
 
 private:

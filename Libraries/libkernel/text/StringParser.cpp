@@ -1,5 +1,6 @@
 #include "libkernel/text/StringParser.h"
 
+#include "libkernel/core/MemoryHeadroom.h"
 #include "libkernel/text/internal/IcuLocale.h"
 
 #include <memory>
@@ -11,6 +12,7 @@ namespace {
 
 bool Parse(String8 const& text, Counted<Locale const> const& locale, icu::Formattable& number)
 {
+    RequireMemory(c_icuHeadroom);
     UErrorCode status = U_ZERO_ERROR;
     std::unique_ptr<icu::NumberFormat> const format(icu::NumberFormat::createInstance(ToIcuLocale(locale), status));
     if (U_FAILURE(status) || !format) return false;
@@ -22,7 +24,7 @@ bool Parse(String8 const& text, Counted<Locale const> const& locale, icu::Format
 
 bool StringParser::ParseAsDouble(String8 const& text, Counted<Locale const> const& locale, double& value)
 {
-    icu::Formattable number;
+    icu::Formattable number{icu::UnicodeString()}; // No number, should ICU leave it alone and report nothing.
     if (!Parse(text, locale, number)) return false;
     UErrorCode status = U_ZERO_ERROR;
     double const result = number.getDouble(status);
@@ -32,7 +34,7 @@ bool StringParser::ParseAsDouble(String8 const& text, Counted<Locale const> cons
 
 bool StringParser::ParseAsLong(String8 const& text, Counted<Locale const> const& locale, long& value)
 {
-    icu::Formattable number;
+    icu::Formattable number{icu::UnicodeString()};
     if (!Parse(text, locale, number)) return false;
     UErrorCode status = U_ZERO_ERROR;
     long const result = number.getLong(status);

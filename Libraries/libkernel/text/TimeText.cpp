@@ -2,6 +2,7 @@
 
 #include "libkernel/core/CharTraits.h"
 #include "libkernel/core/ConvertEnc.h"
+#include "libkernel/core/MemoryHeadroom.h"
 #include "libkernel/text/internal/IcuLocale.h"
 
 #include <cstdio>
@@ -122,6 +123,7 @@ S ToStringWithLocaleT(TimeStamp const& stamp, TimeStampStyle style, TimeStampLoc
                       Counted<Locale const> const& locale)
 {
     if (static_cast<u32>(style) == c_iso8601) return ToStringT<S>(stamp, style, zone);
+    RequireMemory(c_icuHeadroom);
     return Apply<S>(MakeFormat(style, ToIcuLocale(locale)), stamp, zone);
 }
 
@@ -130,6 +132,7 @@ S ToStringWithLocaleT(TimeStamp const& stamp, char const* skeleton, TimeStampLoc
                       Counted<Locale const> const& locale)
 {
     if (!skeleton) return S();
+    RequireMemory(c_icuHeadroom);
     UErrorCode status = U_ZERO_ERROR;
     FormatPtr const format(icu::DateFormat::createInstanceForSkeleton(icu::UnicodeString::fromUTF8(skeleton),
                                                                       ToIcuLocale(locale), status));

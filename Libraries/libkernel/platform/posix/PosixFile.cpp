@@ -357,6 +357,8 @@ int ListFolder(char const* path, std::vector<FolderEntry>& entries)
     entries.clear();
     if (!path) return EINVAL;
     std::unique_ptr<DIR, FolderCloser> const folder(::opendir(path));
+    if (!folder && errno == ENOMEM)
+        throw std::bad_alloc(); // As the list of entries would: a folder is not empty for it.
     if (!folder) return errno;
     for (;;) {
         errno = 0;
