@@ -14,11 +14,13 @@
 #include "libkernel/streams/MemoryStreams.h"
 #include "libkernel/streams/OutStream.h"
 
+#include <chrono>
 #include <condition_variable>
 #include <cstring>
 #include <mutex>
 #include <new>
 #include <sstream>
+#include <thread>
 
 namespace KernelTest {
 
@@ -171,8 +173,21 @@ private:
     char const* m_result = nullptr;
 };
 
+/// The job holds the archive and its files for a moment longer than it takes to tell its end.
+struct JobIsOver
+{
+    explicit JobIsOver(Archive const& archive) : m_archive(archive) {}
+    ~JobIsOver()
+    {
+        auto const end = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+        while (m_archive.GetReferenceCount() > 1 && std::chrono::steady_clock::now() < end) std::this_thread::yield();
+    }
+    Archive const& m_archive;
+};
+
 std::string Offlined(World& world)
 {
+    JobIsOver const over(*world.archive);
     // One that has failed is over, and one that finds no file does not begin: neither calls anybody.
     if (world.archive->GetOffliningState() != Archive::OffliningNotStarted) return "offlining 1";
     auto const waiter = MakeCounted<Waiter>();
@@ -205,6 +220,18 @@ std::string ReadAll(World& world)
     for (auto const& [path, bytes] : GetAll(*world.archive))
         if (bytes == "(unreadable)") return "unreadable";
     return world.archive->LoadThumbnails() ? "ok" : "no thumbnails";
+}
+
+std::string CheckAll(World& world)
+{
+    std::vector<Counted<Archive::Revision const>> revisions;
+    world.archive->GetRevisions(revisions);
+    for (auto const& revision : revisions)
+        for (Archive::FileRevision const& entry : revision->GetEntries())
+            if (auto const check = world.archive->CheckStoredBlock(*revision, entry);
+                !entry.IsDeletion() && check != Archive::BlockCheck::Ok)
+                return Numbered("check", static_cast<int>(check));
+    return "ok";
 }
 
 std::string ReadStream(World& world)
@@ -374,6 +401,7 @@ std::vector<ArchiveOperation> MakeOperations()
          },
          "not restored"},
         {"read all", StartState::Pair, Opened(c_scratch), ReadAll, "unreadable no thumbnails"},
+        {"check all", StartState::Pair, Opened(c_scratch), CheckAll, "check 1"},
         {"read a stream", StartState::Document, Opened(c_doc), ReadStream, "no stream short corrupt file 8"},
         {"save settings", StartState::Settings, Nothing, Settings, "false"},
         {"load settings", StartState::Settings, Nothing, SettingsBack, "false"},

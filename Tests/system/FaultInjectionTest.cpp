@@ -13,7 +13,6 @@
 #include <iostream>
 #include <mutex>
 #include <set>
-#include <thread>
 
 // Every operation on a document, with every call that it makes failing in every way: it ends in a result that it names,
 // leaves nothing open and nothing lying about, the document holds what it held or what was saved, and when the fault
@@ -249,14 +248,10 @@ private:
 
     static bool IsSharedCopy(std::string const& path) { return path.size() > 4 && path.ends_with(".bak"); }
 
-    // A background job may hold its archive for a moment longer.
     std::string FindOpenHandles()
     {
         u64 shared = 0;
         for (auto const& [path, bytes] : m_disk.GetDisk().GetImage()) shared += IsSharedCopy(path) ? 2 : 0;
-        auto const end = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
-        while (m_disk.GetDisk().GetOpenHandles() > shared && std::chrono::steady_clock::now() < end)
-            std::this_thread::yield();
         u64 const open = m_disk.GetDisk().GetOpenHandles();
         return open > shared ? std::to_string(open - shared) + " handles open" : std::string();
     }
