@@ -137,10 +137,12 @@ private:
         MemoryDisk::Recording const recording = m_disk->StopRecording();
         u64 const steps = recording.steps.empty() ? 0 : cut % (recording.steps.size() + 1);
         MemoryDisk::Image image = TestSupport::MakeCrashImage(recording, steps, m_input.Take());
-        // Between the two renames of a streamline the master has another name for a moment.
+        // Between the two renames of a streamline the master has another name for a moment. A backup that was there
+        // before is one that an earlier cut has left.
         if (!image.count(c_masterPath)) {
             for (auto const& [path, content] : image) {
-                if (path == c_scratchPath || TestBytes(*content) != Archive::OpenOk) continue;
+                if (path == c_scratchPath || recording.names.count(path)) continue;
+                if (TestBytes(*content) != Archive::OpenOk) continue;
                 auto const moved = content;
                 image.erase(path);
                 image[c_masterPath] = moved;
