@@ -255,20 +255,23 @@ TEST_F(ArchiveSessionTest, HoldersOfScratchVersionsKeepTheirBytesThroughARollDow
     Reopen(m_scratchPath);
 }
 
-TEST_F(ArchiveSessionTest, ScratchEntryThatNoRecordNamesIsNotRolledDown)
+TEST_F(ArchiveSessionTest, ScratchEntryIsRolledDownIfAPathLeadsToIt)
 {
     ASSERT_TRUE(Save(*m_archive, {{"a", "1"}}));
     Archive::FileState const state = StateOf(*m_archive);
     m_archive = nullptr;
     TestSupport::ArchiveBuilder scratch;
     scratch.link = {state.saveTimeStamp.GetValue(), state.saveCount, m_path};
-    auto const details = scratch.AddBlock("nameless");
-    scratch.AddTable({.records = {{.uid = 77, .kind = 1, .details = details}}});
+    scratch.AddTable({.records = {{77, 1, "", scratch.AddBlock("nameless")},
+                                  {78, 0, "", scratch.AddBlock("empty path")},
+                                  {79, 0, "twice", scratch.AddBlock("old")}}});
+    scratch.AddTable({.records = {{80, 0, "twice", scratch.AddBlock("new")}}});
     WriteWhole(m_scratchPath, scratch.Build());
     Reopen(m_scratchPath);
     ASSERT_TRUE(Save(*m_archive, {{"b", "2"}}));
     Reopen(m_path);
-    EXPECT_EQ(GetAll(*m_archive), (std::map<std::string, std::string>{{"a", "1"}, {"b", "2"}}));
+    EXPECT_EQ(GetAll(*m_archive),
+              (std::map<std::string, std::string>{{"", "empty path"}, {"a", "1"}, {"b", "2"}, {"twice", "new"}}));
 }
 
 TEST_F(ArchiveSessionTest, ManyThreadsMayOfferFiles)

@@ -162,11 +162,14 @@ void ArchiveCommit::RollDownScratch()
     {
         CriticalSectionScope const lock(m_impl.m_stateLock);
         std::set<Archive::FileInfo const*> seen;
+        // A file that no path leads to can't be found in the master either, and might hide the one that it does lead
+        // to.
+        auto const isNamed = [this](Archive::FileInfo const& info) {
+            return m_impl.FindFileInfoCS(info.GetPath()) == &info;
+        };
         for (size_t i = m_impl.m_revisions.size(); i-- > 0 && m_impl.m_revisions[i]->IsScratch();)
             for (Archive::FileRevision const& entry : m_impl.m_revisions[i]->GetEntries())
-                // A file that no record names can't be found in the master either.
-                if (!entry.info->GetPath().IsEmpty() && !m_revision.Find(*entry.info) &&
-                    seen.insert(entry.info.Get()).second)
+                if (isNamed(*entry.info) && !m_revision.Find(*entry.info) && seen.insert(entry.info.Get()).second)
                     sources.push_back({entry});
     }
     Counted<FileInOutStream> const from = m_impl.m_scratch->GetStream();
