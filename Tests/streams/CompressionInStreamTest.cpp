@@ -140,20 +140,21 @@ TEST(ZipInStreamTest, BytesBehindTheEndAreTheEndAndFramesOneBehindTheOtherReadAs
     EXPECT_EQ(ReadAll(*Make(true, MakeCounted<ByteSource>(packed, 3), 0, false, true), 9), (Bytes{1, 2, 3}));
 }
 
-// Of version 0.5: magic, window, a raw block, the end.
-Bytes MakeOldFrame(u8 size)
-{
-    Bytes bytes{0x25, 0xB5, 0x2F, 0xFD, 0x00, 0x40, 0, size};
-    bytes.resize(bytes.size() + size, 'x');
-    bytes.insert(bytes.end(), {0xC0, 0, 0});
-    return bytes;
-}
-
 TEST(ZipInStreamTest, PresetDictionaryWindowsAboveTwoToThe27AndOldFormatsAreDamage)
 {
-    // Magic, descriptor without single segment, window byte, one last raw block of a byte.
-    auto const frame = [](int windowLog) {
-        return Bytes{0x28, 0xB5, 0x2F, 0xFD, 0x00, static_cast<u8>((windowLog - 10) << 3), 0x09, 0, 0, 'x'};
+    // Magic, descriptor without single segment, window byte, with @p isLong no dictionary and the content's size, one
+    // last raw block of a byte.
+    auto const frame = [](int windowLog, bool isLong) {
+        u8 const window = static_cast<u8>((windowLog - 10) << 3);
+        if (isLong) return Bytes{0x28, 0xB5, 0x2F, 0xFD, 0x83, window, 0, 0, 0, 0, 1, 0, 0, 0, 0x09, 0, 0, 'x'};
+        return Bytes{0x28, 0xB5, 0x2F, 0xFD, 0x00, window, 0x09, 0, 0, 'x'};
+    };
+    // Of version 0.5: magic, window, a raw block, the end.
+    auto const oldFrame = [](u8 size) {
+        Bytes bytes{0x25, 0xB5, 0x2F, 0xFD, 0x00, 0x40, 0, size};
+        bytes.resize(bytes.size() + size, 'x');
+        bytes.insert(bytes.end(), {0xC0, 0, 0});
+        return bytes;
     };
     struct Case
     {
@@ -162,15 +163,19 @@ TEST(ZipInStreamTest, PresetDictionaryWindowsAboveTwoToThe27AndOldFormatsAreDama
         bool good;
     };
     for (Case const& c : {Case{false, {0x78, 0xBB, 1, 2, 3, 4, 0x4B, 0x04, 0x00}, false},
-                          {true, frame(10), true},
-                          {true, frame(27), true},
-                          {true, frame(28), false},
-                          {true, frame(41), false},
-                          {true, MakeOldFrame(1), false},
-                          {true, MakeOldFrame(20), false}})
+                          {true, frame(10, false), true},
+                          {true, frame(27, false), true},
+                          {true, frame(28, false), false},
+                          {true, frame(41, false), false},
+                          {true, frame(27, true), true},
+                          {true, frame(28, true), false},
+                          {true, oldFrame(1), false},
+                          {true, oldFrame(20), false}})
     {
         auto const make = [&](bool throws) { return Make(c.zstd, MakeCounted<ByteSource>(c.bytes), 0, false, throws); };
         EXPECT_EQ(ReadAll(*make(false), 4).size(), c.good ? 1u : 0u);
+        u8 byte;
+        EXPECT_EQ(c.zstd && ZStandardDecompressExact(c.bytes.data(), c.bytes.size(), &byte, 1), c.good);
         if (c.good) continue;
         EXPECT_THROW(ReadAll(*make(true), 4), DecompressException);
     }
@@ -204,7 +209,6 @@ TEST(ZStandardDecompressExactTest, GivesWhatTheStreamGives)
         }
     u8 byte;
     EXPECT_FALSE(ZStandardDecompressExact("noise and more", 14, &byte, 1));
-    EXPECT_FALSE(ZStandardDecompressExact(MakeOldFrame(1).data(), 12, &byte, 1));
     EXPECT_FALSE(ZStandardDecompressExact(nullptr, 0, &byte, 1));
     EXPECT_TRUE(ZStandardDecompressExact(nullptr, 0, nullptr, 0));
 }

@@ -1,6 +1,7 @@
 #include "libkernel/streams/ZStandardInStream.h"
 
 #include "libkernel/core/Endian.h"
+#include "libkernel/core/Limits.h"
 #include "libkernel/streams/internal/CodecPools.h"
 
 #include <algorithm>
@@ -14,38 +15,70 @@ namespace Kernel {
 namespace {
 
 // The library below also takes the formats from before RFC 8878, which have no limit on their window, and it looks for
-// their magic numbers at the start of the bytes of a call, even in the middle of a header that it refuses. What a
-// stream gives would then depend on how its bytes arrive. So a header is handed over whole, once its magic number is
-// seen to be right, or else in pieces too small to hold one.
-constexpr u64 c_longestHeader = 18; // Magic number, descriptor, window, dictionary, content size: 4 + 1 + 1 + 4 + 8.
+// their magic numbers at the start of the bytes of a call, even in the middle of a header that it refuses. And a frame
+// that lies whole in one call and fits the output is not asked for its window. What a stream gives would then depend on
+// how its bytes arrive and are asked for. In pieces too small to hold a magic number a header has one outcome only.
 constexpr u64 c_headerPiece = 3;
+constexpr u64 c_longestHeader = 18; // Magic number, descriptor, window, dictionary, content size: 4 + 1 + 1 + 4 + 8.
+constexpr u64 c_atFrameStart = ~u64(0);
 
-bool HasMagic(u8 const* at)
+struct FrameHeader
 {
-    u32 const magic = LoadLittleEndian<u32>(at);
-    return magic == ZSTD_MAGICNUMBER || (magic & ZSTD_MAGIC_SKIPPABLE_MASK) == ZSTD_MAGIC_SKIPPABLE_START;
+    u64 size;
+    u64 window; // With a single segment that is the content size.
+};
+
+// Of the c_longestHeader bytes at @p at, whatever their magic number.
+FrameHeader DecodeHeader(u8 const* at)
+{
+    static constexpr u8 c_dictionarySizes[] = {0, 1, 2, 4};
+    static constexpr u8 c_contentSizes[] = {0, 2, 4, 8};
+    u8 const descriptor = at[4];
+    bool const isSingle = (descriptor & 0x20) != 0;
+    u64 const contentSize = isSingle && descriptor < 0x40 ? 1 : c_contentSizes[descriptor >> 6];
+    u64 const contentAt = (isSingle ? 5 : 6) + c_dictionarySizes[descriptor & 3];
+    u64 window = (u64(8) + (at[5] & 7)) << (7 + (at[5] >> 3));
+    if (isSingle) {
+        u8 content[8] = {};
+        std::memcpy(content, at + contentAt, contentSize);
+        window = LoadLittleEndian<u64>(content) + (contentSize == 2 ? 256 : 0);
+    }
+    return {contentAt + contentSize, window};
 }
 
-// One step. False for damaged data. @p frameTaken counts the bytes of the frame that were taken so far.
-ZSTD_ErrorCode DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, u64& frameTaken)
+// One step. @p headerLeft counts the bytes of the frame's header that are still to come.
+ZSTD_ErrorCode DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, u64& headerLeft)
 {
     size_t const before = input.pos, size = input.size;
-    if (frameTaken == 0 && size - before >= c_longestHeader) {
-        if (!HasMagic(static_cast<u8 const*>(input.src) + before)) return ZSTD_error_prefix_unknown;
-    } else if (frameTaken < c_longestHeader)
-        input.size = before + std::min(size - before, std::min(c_longestHeader - frameTaken, c_headerPiece));
+    u8 const* const at = static_cast<u8 const*>(input.src) + before;
+    if (headerLeft == c_atFrameStart && size != before)
+        headerLeft = size - before >= c_longestHeader ? DecodeHeader(at).size : c_longestHeader;
+    if (headerLeft != 0) input.size = before + std::min({size - before, headerLeft, c_headerPiece});
     size_t const result = ZSTD_decompressStream(context, &output, &input);
     input.size = size;
-    // 0 is the end of a frame.
-    frameTaken = result == 0 ? 0 : frameTaken + (input.pos - before);
+    if (result == 0)
+        headerLeft = c_atFrameStart; // Behind a frame.
+    else if (headerLeft != c_atFrameStart)
+        headerLeft -= std::min(headerLeft, input.pos - before);
     return ZSTD_getErrorCode(result);
+}
+
+// True if the bytes are one frame that a stream would take. What follows a header that is cut counts as zeros.
+bool IsOneFrame(void const* from, u64 size)
+{
+    u8 header[c_longestHeader] = {};
+    if (size == 0) return false;
+    std::memcpy(header, from, std::min(size, c_longestHeader));
+    return LoadLittleEndian<u32>(header) == ZSTD_MAGICNUMBER &&
+           DecodeHeader(header).window <= u64(1) << c_maxZstdWindowLog &&
+           ZSTD_findFrameCompressedSize(from, size) == size;
 }
 
 } // namespace
 
 ZStandardInStream::ZStandardInStream(Counted<InStream> source, CompressionPredictorType type,
                                      CompressionPredictorStripingType striping, bool throwOnError)
-    : CompressionInStream(std::move(source), type, striping, throwOnError)
+    : CompressionInStream(std::move(source), type, striping, throwOnError), m_headerLeft(c_atFrameStart)
 {
 }
 
@@ -73,7 +106,7 @@ bool ZStandardInStream::DecompressFromBuffer(void* to, u64 count, u64& delivered
 {
     ZSTD_inBuffer input{GetInput(), GetInputLeft(), 0};
     ZSTD_outBuffer output{to, count, 0};
-    ZSTD_ErrorCode const error = DecompressStep(m_context, output, input, m_frameTaken);
+    ZSTD_ErrorCode const error = DecompressStep(m_context, output, input, m_headerLeft);
     if (error == ZSTD_error_memory_allocation) SetLacksMemory();
     bool const good = error == ZSTD_error_no_error;
     UseInput(input.pos);
@@ -88,16 +121,16 @@ struct GiveBack
     void operator()(ZSTD_DCtx* context) const { GiveZstdDecompressor(context); }
 };
 
-// For data in several frames, or that goes on behind the bytes that are wanted.
+// For data in several frames, that goes on behind the bytes that are wanted, or that no stream takes.
 bool DecompressBeginning(ZSTD_DCtx* context, void const* from, u64 fromSize, void* to, u64 size)
 {
     ZSTD_DCtx_reset(context, ZSTD_reset_session_only);
     ZSTD_inBuffer input{from, fromSize, 0};
     ZSTD_outBuffer output{to, size, 0};
-    u64 frameTaken = 0;
+    u64 headerLeft = c_atFrameStart;
     while (output.pos < size) {
         size_t const inputBefore = input.pos, outputBefore = output.pos;
-        if (DecompressStep(context, output, input, frameTaken) != ZSTD_error_no_error) return false;
+        if (DecompressStep(context, output, input, headerLeft) != ZSTD_error_no_error) return false;
         if (input.pos == inputBefore && output.pos == outputBefore) return false;
     }
     return true;
@@ -108,9 +141,7 @@ bool DecompressAll(void const* from, u64 fromSize, void* to, u64 size)
     if (size == 0) return true;
     std::unique_ptr<ZSTD_DCtx, GiveBack> const context(TakeZstdDecompressor());
     if (!context) return false;
-    bool const isOneFrame = fromSize >= sizeof(u32) && HasMagic(static_cast<u8 const*>(from)) &&
-                            ZSTD_findFrameCompressedSize(from, fromSize) == fromSize;
-    if (!isOneFrame) return DecompressBeginning(context.get(), from, fromSize, to, size);
+    if (!IsOneFrame(from, fromSize)) return DecompressBeginning(context.get(), from, fromSize, to, size);
     size_t const result = ZSTD_decompressDCtx(context.get(), to, size, from, fromSize);
     if (!ZSTD_isError(result)) return result == size;
     return ZSTD_getErrorCode(result) == ZSTD_error_dstSize_tooSmall &&

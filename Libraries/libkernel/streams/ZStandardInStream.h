@@ -25,7 +25,7 @@ private:
     bool Init();
 
     ZSTD_DCtx_s* m_context = nullptr;
-    u64 m_frameTaken = 0; // Bytes of the frame that were decompressed.
+    u64 m_headerLeft; // Bytes of the frame's header that are still to come.
 };
 
 /// Decompresses a block that lies whole in memory straight to @p to, as a ZStandardInStream would give its first
