@@ -430,7 +430,7 @@ TEST_F(KernelToolTest, RecoverFindsTheNewestStateAndWritesASoundCopy)
     std::string const copy = m_folder / "copy";
     Json const sound = RunJson({"archive", "recover", m_doc});
     EXPECT_EQ(KeysOf(sound), (std::vector<std::string>{"recovered", "path", "openResult", "revisions", "items", "to",
-                                                       "checked", "damaged"}));
+                                                       "lost", "checked", "damaged"}));
     EXPECT_EQ(sound["openResult"], 0);
     std::string file = ReadWhole(m_doc);
     file.replace(12, 52, std::string(52, 'x'));
@@ -445,6 +445,41 @@ TEST_F(KernelToolTest, RecoverFindsTheNewestStateAndWritesASoundCopy)
     EXPECT_EQ(Run({"archive", "recover", m_doc, "--to", copy}).status, 1); // It stands there already.
     WriteWhole(m_doc, file.substr(0, 80));
     ExpectFailure({"archive", "recover", m_doc}, 1, "OpenCorrupt (12)");
+}
+
+TEST_F(KernelToolTest, RecoveredCopyHasAllButTheDamagedItemsWhichAreNamed)
+{
+    std::string const file = ReadWhole(m_doc);
+    std::string const copy = m_folder / "copy";
+    struct
+    {
+        char const* item;
+        u64 at; ///< The byte of its block that is spoiled.
+        char const* problem;
+    } const cases[] = {{"a.txt", 0, "BadTag (2)"},
+                       {"a.txt", 13, "BadCRC (5)"},
+                       {"sub/b.txt", 6, "BadData (4)"},
+                       {"a.txt", 18, nullptr}};
+    for (auto const& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.item << " at " << c.at);
+        WriteWhole(m_doc, file);
+        std::string spoiled = file;
+        Json const history = RunJson({"archive", "history", m_doc});
+        for (Json const& entry : history[0]["entries"])
+            if (entry["path"] == c.item) spoiled[entry["filePos"].get<u64>() + c.at] ^= 1;
+        WriteWhole(m_doc, spoiled);
+        fs::remove(copy);
+        ToolResult const result = Run({"archive", "recover", m_doc, "--to", copy, "--json"});
+        EXPECT_EQ(result.status, c.problem ? 3 : 0);
+        EXPECT_EQ(Json::parse(result.out)["lost"].size(), c.problem ? 1u : 0u);
+        if (c.problem) {
+            EXPECT_THAT(result.err, testing::StartsWith("kerneltool: saving '" + std::string(c.item) +
+                                                        "' failed: " + c.problem + "\n"));
+        }
+        Do({"archive", "verify", copy}); // Its blocks are whole again, the ends too.
+        EXPECT_EQ(RunJson({"archive", "ls", copy}).size(), c.problem ? 2u : 3u);
+        EXPECT_EQ(ReadWhole(m_doc), spoiled);
+    }
 }
 
 TEST_F(KernelToolTest, StreamlineLeavesTheItemsAndDropsTheRest)

@@ -29,12 +29,20 @@ int RunRecover(Arguments const& arguments)
     }
 
     Json damaged = Json::array();
+    Json lost = Json::array();
     u64 checked = 0;
     if (!to.IsEmpty()) {
         Reservation reservation(to);
-        Archive::StreamlineResult const written = archive->StreamlineToNew(to);
+        std::vector<Archive::LostFile> left;
+        Archive::StreamlineResult const written = archive->SalvageToNew(to, left);
         if (written != Archive::StreamlineDone) throw MakeFailure("writing '" + ToStd(to) + "'", written);
         reservation.Use();
+        for (Archive::LostFile const& file : left) {
+            Failure failure = MakeFailure("saving '" + ToStd(file.path) + "'", file.problem);
+            if (&file == &left.back()) failure.advice = "The copy has all other items; look for an older document.";
+            PrintFailure(failure);
+            lost.push_back({{"path", ToStd(file.path)}, {"problem", ProblemText(file.problem)}});
+        }
         Counted<Archive> const copy = Archive::Open(to, Archive::OpenModeReadOnly, IDTag(), result);
         if (!copy) throw MakeFailure("opening '" + ToStd(to) + "'", result);
         damaged = CheckAllBlocks(*copy, arguments, checked);
@@ -53,17 +61,20 @@ int RunRecover(Arguments const& arguments)
                    {"revisions", revisions},
                    {"items", items.size()},
                    {"to", target},
+                   {"lost", lost},
                    {"checked", checked},
                    {"damaged", damaged}});
     } else {
-        std::string text = opened == Archive::OpenOk ? "the document is sound: " : "found: ";
+        std::string text =
+            opened == Archive::OpenOk && damaged.empty() && lost.empty() ? "the document is sound: " : "found: ";
         text += std::to_string(revisions) + " revisions, " + std::to_string(items.size()) + " items\n";
         if (!to.IsEmpty()) text += "compact copy written to " + Printable(ToStd(to)) + "\n";
+        if (!lost.empty()) text += std::to_string(lost.size()) + " of the items damaged and not in the copy\n";
         if (to.IsEmpty() && opened != Archive::OpenOk) text += "nothing was written; --to NEW writes a sound copy\n";
         Print(text);
         if (!damaged.empty()) PrintDamage(damaged, checked);
     }
-    return damaged.empty() ? ExitDone : ExitDamaged;
+    return damaged.empty() && lost.empty() ? ExitDone : ExitDamaged;
 }
 
 } // namespace KernelTool

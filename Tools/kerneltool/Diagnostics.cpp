@@ -122,6 +122,11 @@ constexpr ResultName c_verifyResults[] = {
     {2, "VerifyMismatch", "What lies in the file is not what was saved: check the disk, and go back to a copy."},
 };
 
+constexpr ResultName c_blockChecks[] = {
+    {0, "Ok", nullptr},           {1, "Unreadable", nullptr}, {2, "BadTag", nullptr},
+    {3, "BadStoredCRC", nullptr}, {4, "BadData", nullptr},    {5, "BadCRC", nullptr},
+};
+
 constexpr ResultName c_fileResults[] = {
     {0, "Opened", nullptr},
     {1, "OpenedToo", nullptr},
@@ -196,6 +201,11 @@ Failure MakeFailure(std::string const& what, Archive::StreamlineResult result)
 Failure MakeFailure(std::string const& what, Archive::VerifyResult result)
 {
     return FromTable(c_verifyResults, what, static_cast<int>(result));
+}
+
+Failure MakeFailure(std::string const& what, Archive::BlockCheck result)
+{
+    return FromTable(c_blockChecks, what, static_cast<int>(result));
 }
 
 Failure MakeFailure(std::string const& what, File::OpenUnmanagedResult result)

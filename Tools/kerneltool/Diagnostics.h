@@ -25,6 +25,7 @@ Failure MakeFailure(std::string const& what, Kernel::Archive::CreateResult const
 Failure MakeFailure(std::string const& what, Kernel::Archive::CreateSessionResult result);
 Failure MakeFailure(std::string const& what, Kernel::Archive::StreamlineResult result);
 Failure MakeFailure(std::string const& what, Kernel::Archive::VerifyResult result);
+Failure MakeFailure(std::string const& what, Kernel::Archive::BlockCheck result);
 Failure MakeFailure(std::string const& what, Kernel::File::OpenUnmanagedResult result);
 Failure MakeFailure(std::string const& what, Kernel::FileIOException::Reason reason);
 

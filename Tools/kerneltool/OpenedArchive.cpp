@@ -34,19 +34,6 @@ Counted<Archive> Open(String8 const& path, Archive::OpenMode mode)
     return archive;
 }
 
-char const* ProblemText(Archive::BlockCheck check)
-{
-    static constexpr char const* c_texts[] = {
-        "sound",
-        "the file cannot be read there",
-        "no block lies there, or its end is missing",
-        "the stored bytes are not those that were written (stored CRC)",
-        "the stored bytes do not unpack to the recorded size",
-        "the bytes are not those that were written (CRC)",
-    };
-    return c_texts[static_cast<int>(check)];
-}
-
 } // namespace
 
 Counted<Archive> OpenForReading(Arguments const& arguments)
@@ -115,6 +102,19 @@ void ReadItem(Archive& archive, String8 const& path, std::function<void(void con
     } catch (...) {
         throw DescribeCurrentException(what);
     }
+}
+
+char const* ProblemText(Archive::BlockCheck check)
+{
+    static constexpr char const* c_texts[] = {
+        "sound",
+        "the file cannot be read there",
+        "no block lies there, or its end is missing",
+        "the stored bytes are not those that were written (stored CRC)",
+        "the stored bytes do not unpack to the recorded size",
+        "the bytes are not those that were written (CRC)",
+    };
+    return c_texts[static_cast<int>(check)];
 }
 
 Json CheckAllBlocks(Archive& archive, Arguments const& arguments, u64& checked)

@@ -28,6 +28,9 @@ void RequireItems(Kernel::Archive const& archive, std::vector<std::string> const
 void ReadItem(Kernel::Archive& archive, Kernel::String8 const& path,
               std::function<void(void const* bytes, Kernel::u64 count)> const& take);
 
+/// A person's words for what is wrong with a block.
+char const* ProblemText(Kernel::Archive::BlockCheck check);
+
 /// Reads every stored block of the revisions up to the working one; the entries that are damaged, as verify lists them.
 Json CheckAllBlocks(Kernel::Archive& archive, Arguments const& arguments, Kernel::u64& checked);
 void PrintDamage(Json const& damaged, Kernel::u64 checked);

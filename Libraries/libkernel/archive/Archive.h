@@ -281,6 +281,13 @@ public:
         BadCRC = 5        ///< They unpack, to other bytes than were written.
     };
 
+    /// A file that a salvage had to leave behind.
+    struct LostFile
+    {
+        String8 path;
+        BlockCheck problem = BlockCheck::Ok;
+    };
+
     /// Makes an adorner for each access block; the flags are exclusive and upgradeable.
     using AdornerFactory = std::function<Counted<AccessBlockAdorner>(bool exclusive, bool upgradeable)>;
 
@@ -504,6 +511,9 @@ public:
                                                   MarshalledFileAccess const* marshalled);
     /// Writes a compact copy to @p path, over what stands there; the archive stays as it is.
     StreamlineResult StreamlineToNew(String8 const& path) const;
+    /// Writes a compact copy of a damaged archive: without the files whose data cannot be had as they were written.
+    /// These are given in @p lost, by path; all others read with a good CRC from the copy. Reads every block twice.
+    StreamlineResult SalvageToNew(String8 const& path, std::vector<LostFile>& lost) const;
     /// Writes a compact copy, front to back, without thumbnails. An archive that needs no streamlining is copied as it
     /// stands up to its end.
     StreamlineResult StreamlineToOutStream(OutStream& out) const;

@@ -41,12 +41,15 @@ Result ArchiveCompactWriter::StreamlineToArchiveFileI(ArchiveImpl& impl, Archive
         return Archive::StreamlineNoAccess;
     } catch (std::bad_alloc const&) {
         return Archive::StreamlineFailed;
+    } catch (MemoryException const&) {
+        return Archive::StreamlineFailed;
     }
 }
 
 Result ArchiveCompactWriter::Run(Archive::StreamlineData& data)
 {
     Collect();
+    if (m_options.lost) LeaveOutDamaged();
     if (!LayOut()) return Archive::StreamlineFailed;
     WriteFront();
     if (Result const result = WriteBlocks()) return result;
@@ -76,6 +79,25 @@ void ArchiveCompactWriter::Collect()
     for (auto const& [parts, count] : m_impl.m_pathCounts)
         if (count.counter != 0) m_pathCounts.emplace_back(parts, count.counter);
     m_info.nextFreeUID = m_impl.m_nextFreeUID;
+}
+
+// What counts is that the data come out as they went in. A wrong CRC of the stored bytes, or a block without its end,
+// loses nothing: both are written anew.
+void ArchiveCompactWriter::LeaveOutDamaged()
+{
+    std::erase_if(m_items, [this](Item& item) {
+        Archive::BlockCheck check = Archive::BlockCheck::Unreadable;
+        try {
+            check = m_impl.CheckBlockTag(*item.source, item.entry);
+            if (check == Archive::BlockCheck::Ok) check = m_impl.CheckUnpacked(*item.source, item.entry);
+        } catch (FileIOException const&) {
+        }
+        item.entry.crcCompressed = 0;
+        if (check != Archive::BlockCheck::Ok) m_options.lost->push_back({item.entry.info->GetPath(), check});
+        return check != Archive::BlockCheck::Ok;
+    });
+    std::sort(m_options.lost->begin(), m_options.lost->end(),
+              [](Archive::LostFile const& a, Archive::LostFile const& b) { return a.path < b.path; });
 }
 
 // All sums are checked: sizes come from a file. What does not fit its field is not cut short.

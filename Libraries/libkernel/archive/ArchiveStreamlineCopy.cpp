@@ -30,10 +30,12 @@ bool ArchiveStreamliner::IsOwnFile(String8 const& path) const
 namespace {
 
 /// A new file on the device, or none.
-Result WriteFile(ArchiveImpl& impl, Archive::ArchiveFile& file, bool copyThumbnails, Archive::StreamlineData& data)
+Result WriteFile(ArchiveImpl& impl, Archive::ArchiveFile& file, bool copyThumbnails, Archive::StreamlineData& data,
+                 std::vector<Archive::LostFile>* lost = nullptr)
 {
     ArchiveCompactWriter::Options options;
     options.copyThumbnails = copyThumbnails;
+    options.lost = lost;
     Result const result = ArchiveCompactWriter::StreamlineToArchiveFileI(impl, file, *file.m_stream, options, data);
     if (result != Archive::StreamlineDone) return result;
     bool const flushed = FlushArchiveFile(*file.m_stream) && FlushFolderOf(file.m_path);
@@ -53,7 +55,13 @@ Result Archive::StreamlineToNew(String8 const& path) const
     return ArchiveStreamliner(*m).StreamlineToNew(path);
 }
 
-Result ArchiveStreamliner::StreamlineToNew(String8 const& path)
+Result Archive::SalvageToNew(String8 const& path, std::vector<LostFile>& lost) const
+{
+    lost.clear();
+    return ArchiveStreamliner(*m).StreamlineToNew(path, &lost);
+}
+
+Result ArchiveStreamliner::StreamlineToNew(String8 const& path, std::vector<Archive::LostFile>* lost)
 {
     if (path.IsEmpty()) return Archive::StreamlineFailed;
     return RunInTurn([&](bool& suspended) {
@@ -66,7 +74,7 @@ Result ArchiveStreamliner::StreamlineToNew(String8 const& path)
         file->m_stream = CreateStream(path, false);
         if (!file->m_stream) return Archive::StreamlineNotCreated;
         Archive::StreamlineData data;
-        Result const result = WriteFile(m_impl, *file, true, data);
+        Result const result = WriteFile(m_impl, *file, true, data, lost);
         if (result != Archive::StreamlineDone) Discard(*file);
         return result;
     });

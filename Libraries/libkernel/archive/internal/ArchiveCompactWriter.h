@@ -26,6 +26,7 @@ public:
         bool midStreamline = false; ///< Mark the file as a streamline's temporary.
         bool const* abort = nullptr;
         ArchiveStreamlineProgress* progress = nullptr;
+        std::vector<Archive::LostFile>* lost = nullptr; ///< Takes what is damaged, which otherwise ends the writing.
     };
 
     /// @p file describes the new file: its save time, save count and write counter are given, all else is set. The
@@ -52,6 +53,7 @@ private:
 
     Archive::StreamlineResult Run(Archive::StreamlineData& data);
     void Collect();
+    void LeaveOutDamaged();
     bool LayOut();
     void WriteFront();
     Archive::StreamlineResult WriteBlocks();

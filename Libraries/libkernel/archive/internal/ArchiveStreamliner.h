@@ -31,7 +31,8 @@ public:
     bool RequiresStreamliningCS() const;
 
     // ArchiveStreamlineCopy.cpp
-    Result StreamlineToNew(String8 const& path);
+    /// With @p lost, a salvage.
+    Result StreamlineToNew(String8 const& path, std::vector<Archive::LostFile>* lost = nullptr);
     Result StreamlineToOutStream(OutStream& out);
     Result StreamlineAndSwitchI(String8 const& path, bool asScratch);
     Archive::ConvertToThrowAwayResult ConvertToThrowAway();
