@@ -13,62 +13,62 @@
 #include <filesystem>
 #include <gtest/gtest.h>
 #include <map>
+#include <new>
 #include <optional>
 #include <string>
 
 namespace KernelTest {
 
-constexpr Kernel::IDTag c_documentTag("Docu");
+using namespace Kernel;
+
+constexpr IDTag c_documentTag("Docu");
 
 inline constexpr auto& ReadWhole = TestSupport::ReadWholeFile;
 inline constexpr auto& WriteWhole = TestSupport::WriteWholeFile;
 
-inline Kernel::String8 Str(std::string const& s)
+inline String8 Str(std::string const& s)
 {
-    return Kernel::String8(s.c_str());
+    return String8(s.c_str());
 }
 
-inline Kernel::Counted<Kernel::Archive> CreateDocument(std::string const& path)
+inline Counted<Archive> CreateDocument(std::string const& path)
 {
-    Kernel::Archive::CreateResult result;
-    return Kernel::Archive::Create(Str(path), c_documentTag, result);
+    Archive::CreateResult result;
+    return Archive::Create(Str(path), c_documentTag, result);
 }
 
-inline Kernel::Counted<Kernel::Archive>
-OpenDocument(std::string const& path, Kernel::Archive::OpenMode mode = Kernel::Archive::OpenModeReadWrite)
+inline Counted<Archive> OpenDocument(std::string const& path, Archive::OpenMode mode = Archive::OpenModeReadWrite)
 {
-    Kernel::Archive::OpenResult result{};
-    Kernel::Counted<Kernel::Archive> archive = Kernel::Archive::Open(Str(path), mode, c_documentTag, result);
-    EXPECT_EQ(result, Kernel::Archive::OpenOk) << path;
+    Archive::OpenResult result{};
+    Counted<Archive> archive = Archive::Open(Str(path), mode, c_documentTag, result);
+    EXPECT_EQ(result, Archive::OpenOk) << path;
     return archive;
 }
 
-inline Kernel::Archive::OpenResult ResultOfOpening(std::string const& path,
-                                                   Kernel::Archive::OpenMode mode = Kernel::Archive::OpenModeReadWrite,
-                                                   Kernel::IDTag tag = c_documentTag)
+inline Archive::OpenResult ResultOfOpening(std::string const& path, Archive::OpenMode mode = Archive::OpenModeReadWrite,
+                                           IDTag tag = c_documentTag)
 {
-    Kernel::Archive::OpenResult result{};
-    bool const opened = static_cast<bool>(Kernel::Archive::Open(Str(path), mode, tag, result));
-    EXPECT_EQ(opened, result == Kernel::Archive::OpenOk);
+    Archive::OpenResult result{};
+    bool const opened = static_cast<bool>(Archive::Open(Str(path), mode, tag, result));
+    EXPECT_EQ(opened, result == Archive::OpenOk);
     return result;
 }
 
 /// The bytes of an item, or none.
-inline std::optional<std::string> Get(Kernel::Archive& archive, std::string const& path)
+inline std::optional<std::string> Get(Archive& archive, std::string const& path)
 {
-    Kernel::RawDataBlock data;
+    RawDataBlock data;
     if (!archive.ReadFile(Str(path), data)) return std::nullopt;
     return std::string(static_cast<char const*>(data.GetData()), data.GetSize());
 }
 
 /// All items with their bytes, each read whole.
-inline std::map<std::string, std::string> GetAll(Kernel::Archive& archive)
+inline std::map<std::string, std::string> GetAll(Archive& archive)
 {
     std::map<std::string, std::string> all;
-    std::vector<Kernel::String8> paths;
+    std::vector<String8> paths;
     archive.GetFileList(paths);
-    for (Kernel::String8 const& path : paths)
-        all[path.GetData()] = Get(archive, path.GetData()).value_or("(unreadable)");
+    for (String8 const& path : paths) all[path.GetData()] = Get(archive, path.GetData()).value_or("(unreadable)");
     return all;
 }
 
@@ -76,10 +76,10 @@ using Changes = std::map<std::string, std::optional<std::string>>;
 
 /// One session in which @p work is done; false if it could not be had.
 template <class Work>
-bool InSession(Kernel::Archive& archive, Work&& work, bool scratch = false,
-               Kernel::Archive::SessionType type = Kernel::Archive::SessionTypeFull)
+bool InSession(Archive& archive, Work&& work, bool scratch = false,
+               Archive::SessionType type = Archive::SessionTypeFull)
 {
-    Kernel::ArchiveSessionHandle handle;
+    ArchiveSessionHandle handle;
     if (!(scratch ? archive.CreateScratchSession(handle, type, nullptr) : archive.CreateSession(handle, type, nullptr)))
         return false;
     work(*handle);
@@ -88,73 +88,78 @@ bool InSession(Kernel::Archive& archive, Work&& work, bool scratch = false,
 }
 
 /// One session that writes and deletes.
-inline bool Save(Kernel::Archive& archive, Changes const& changes, bool scratch = false,
-                 Kernel::Archive::SessionType type = Kernel::Archive::SessionTypeFull, bool compress = false)
+inline bool Save(Archive& archive, Changes const& changes, bool scratch = false,
+                 Archive::SessionType type = Archive::SessionTypeFull, bool compress = false)
 {
-    auto const work = [&](Kernel::ArchiveSession& session) {
+    auto const work = [&](ArchiveSession& session) {
         for (auto const& [path, bytes] : changes) {
             if (!bytes)
                 session.DeleteFile(Str(path));
             else
-                session.CreateFile(Str(path), Kernel::MakeCounted<BytesItem>(*bytes),
-                                   compress ? Compressed() : nullptr);
+                session.CreateFile(Str(path), MakeCounted<BytesItem>(*bytes), compress ? Compressed() : nullptr);
         }
     };
     return InSession(archive, work, scratch, type);
 }
 
 /// Adds an item under a path that the session makes up, and gives that path.
-inline std::string CreateGenerated(Kernel::ArchiveSession& session, char const* prefix, char const* suffix,
+inline std::string CreateGenerated(ArchiveSession& session, char const* prefix, char const* suffix,
                                    std::string const& bytes)
 {
-    auto const item = Kernel::MakeCounted<BytesItem>(bytes);
-    Kernel::String8 path;
-    EXPECT_TRUE(session.GenerateIndexedPath({Kernel::String8(prefix), Kernel::String8(suffix)}, item, nullptr, path));
+    auto const item = MakeCounted<BytesItem>(bytes);
+    String8 path;
+    EXPECT_TRUE(session.GenerateIndexedPath({String8(prefix), String8(suffix)}, item, nullptr, path));
     session.CreateFile(path, item);
     return path.GetData();
 }
 
 /// One record that holds these bytes.
-inline Kernel::Counted<Kernel::ArchiveThumbnails> MakeThumbnails(std::string const& picture)
+inline Counted<ArchiveThumbnails> MakeThumbnails(std::string const& picture)
 {
-    auto thumbnails = Kernel::MakeCounted<Kernel::ArchiveThumbnails>();
-    auto const data = Kernel::MakeCounted<Kernel::RawData>(picture.size());
+    auto thumbnails = MakeCounted<ArchiveThumbnails>();
+    auto const data = MakeCounted<RawData>(picture.size());
+    if (!data->GetBytes()) throw std::bad_alloc();
     std::copy(picture.begin(), picture.end(), data->GetBytes());
-    thumbnails->AddFile(Kernel::ArchiveThumbnails::FileType::Picture, data);
+    thumbnails->AddFile(ArchiveThumbnails::FileType::Picture, data);
     return thumbnails;
 }
 
 /// What a session that is asked for now would get.
-inline Kernel::Archive::CreateSessionResult SessionResult(Kernel::Archive& archive)
+inline Archive::CreateSessionResult SessionResult(Archive& archive)
 {
-    Kernel::ArchiveSessionHandle handle;
-    return archive.CreateSessionAdv(handle, Kernel::Archive::SessionTypeFull, nullptr, false);
+    ArchiveSessionHandle handle;
+    return archive.CreateSessionAdv(handle, Archive::SessionTypeFull, nullptr, false);
 }
 
-inline Kernel::Counted<Kernel::DelayLoadHolder> HolderOf(Kernel::Archive& archive, std::string const& path)
+inline Counted<DelayLoadHolder> HolderOf(Archive& archive, std::string const& path)
 {
     return archive.CreateDelayLoadHolderDirect(Str(path), &BytesItem::c_type, nullptr);
 }
 
-inline std::string BytesOf(Kernel::DelayLoadHolder& holder)
+inline std::string BytesOf(DelayLoadHolder& holder)
 {
-    Kernel::JailCounted<Kernel::FileStoreItem> item;
+    JailCounted<FileStoreItem> item;
     return holder.GetItemBase(item) && item ? dynamic_cast<BytesItem&>(*item).bytes : "(nothing)";
 }
 
-inline std::vector<Kernel::Counted<Kernel::Archive::Revision const>> RevisionsOf(Kernel::Archive& archive)
+inline std::vector<Counted<Archive::Revision const>> RevisionsOf(Archive& archive)
 {
-    std::vector<Kernel::Counted<Kernel::Archive::Revision const>> revisions;
+    std::vector<Counted<Archive::Revision const>> revisions;
     archive.GetRevisions(revisions);
     return revisions;
 }
 
-inline Kernel::Archive::FileState StateOf(Kernel::Archive& archive,
-                                          Kernel::Archive::ArchiveChoice which = Kernel::Archive::ChoiceMaster)
+inline Archive::FileState StateOf(Archive& archive, Archive::ArchiveChoice which = Archive::ChoiceMaster)
 {
-    Kernel::Archive::FileState state;
+    Archive::FileState state;
     archive.GetFileState(which, state);
     return state;
+}
+
+inline bool AddScratchFile(Archive& archive, std::string const& path)
+{
+    Archive::CreateResult result;
+    return archive.AddScratchFile(Str(path), result);
 }
 
 /// A folder for one document with its scratch file, and folders for temporaries within it.
@@ -165,34 +170,30 @@ protected:
     {
         std::filesystem::create_directory(m_temporaries);
         std::filesystem::create_directory(m_second);
-        std::vector<Kernel::String8> rescued;
-        Kernel::TempFile::SetTempPath(Str(m_temporaries), Str(m_second), rescued);
+        std::vector<String8> rescued;
+        TempFile::SetTempPath(Str(m_temporaries), Str(m_second), rescued);
     }
     ~DocumentTest() override
     {
         m_archive = nullptr;
-        Kernel::Archive::PostShutdown(); // Copies of bytes that the process shares lie in the folder that goes.
-        Kernel::TempFile::SetTempPath(Kernel::String8());
+        Archive::PostShutdown(); // Copies of bytes that the process shares lie in the folder that goes.
+        TempFile::SetTempPath(String8());
     }
     /// Lets go of the archive first.
-    void Reopen(std::string const& path, Kernel::Archive::OpenMode mode = Kernel::Archive::OpenModeReadWrite)
+    void Reopen(std::string const& path, Archive::OpenMode mode = Archive::OpenModeReadWrite)
     {
         m_archive = nullptr;
         m_archive = OpenDocument(path, mode);
         ASSERT_TRUE(m_archive);
     }
-    void AddScratch()
-    {
-        Kernel::Archive::CreateResult result;
-        ASSERT_TRUE(m_archive->AddScratchFile(Str(m_scratchPath), result));
-    }
+    void AddScratch() { ASSERT_TRUE(AddScratchFile(*m_archive, m_scratchPath)); }
 
     TestSupport::TempFolder const m_folder;
     std::string const m_temporaries = m_folder / "temporaries";
     std::string const m_second = m_folder / "second"; ///< For what overwrites a master.
     std::string const m_path = m_folder / "doc";
     std::string const m_scratchPath = m_folder / "scratch";
-    Kernel::Counted<Kernel::Archive> m_archive;
+    Counted<Archive> m_archive;
 };
 
 /// The document has one item, "a".
@@ -204,12 +205,11 @@ protected:
         ASSERT_TRUE(Save(*CreateDocument(m_path), {{"a", bytes}}));
     }
     /// With a scratch file that has one more.
-    Kernel::Counted<Kernel::Archive> MakePair() const
+    Counted<Archive> MakePair() const
     {
         MakeDocument();
-        Kernel::Counted<Kernel::Archive> archive = OpenDocument(m_path);
-        Kernel::Archive::CreateResult result;
-        EXPECT_TRUE(archive->AddScratchFile(Str(m_scratchPath), result));
+        Counted<Archive> archive = OpenDocument(m_path);
+        EXPECT_TRUE(AddScratchFile(*archive, m_scratchPath));
         EXPECT_TRUE(Save(*archive, {{"s", "scratch"}}, true));
         return archive;
     }

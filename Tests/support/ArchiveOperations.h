@@ -13,10 +13,10 @@ namespace KernelTest {
 /// What one operation works on and leaves behind. Made for each run.
 struct World
 {
-    Kernel::Counted<Kernel::Archive> archive;
-    Kernel::Counted<Kernel::Archive> other;
-    Kernel::Counted<BytesItem> item; ///< What a save is to write; null where nothing is saved.
-    bool abort = false;              ///< What the operation gets as its abort flag.
+    Counted<Archive> archive;
+    Counted<Archive> other;
+    Counted<BytesItem> item; ///< What a save is to write; null where nothing is saved.
+    bool abort = false;      ///< What the operation gets as its abort flag.
 };
 
 /// What an operation finds on the disk.
@@ -37,7 +37,7 @@ struct ArchiveOperation
     StartState start;
     std::function<void(World&)> prepare;    ///< May not fail.
     std::function<std::string(World&)> run; ///< Gives "ok" or what went wrong; may throw.
-    std::string failures;                   ///< The results that may stand for "ok", blanks between. "open *" is any.
+    std::string failures; ///< The results that may stand for "ok", commas between: "open *" is any, "open 1 2" two.
 };
 
 std::vector<ArchiveOperation> const& GetArchiveOperations();
@@ -79,7 +79,6 @@ using DiskView = std::map<std::string, PathView>;
 
 /// Opens each name that operations use, for reading only, and recovers what has to be.
 DiskView LookAtDisk(TestSupport::MemoryDisk& disk);
-std::string DescribeView(DiskView const& view);
 
 /// True if a document with these items stands whole under a temporary's or a backup's name.
 bool HasCopy(TestSupport::MemoryDisk& disk, PathView const& of);

@@ -8,26 +8,28 @@
 
 namespace KernelTest {
 
+using namespace Kernel;
+
 /// An item that is plain bytes.
-class BytesItem : public Kernel::FileStoreItem
+class BytesItem : public FileStoreItem
 {
 public:
-    static Kernel::FileStoreItemType const c_type;
+    static FileStoreItemType const c_type;
 
     explicit BytesItem(std::string b = {}) : bytes(std::move(b)) {}
 
-    void Save(Kernel::OutStream& stream, Kernel::FileStoreOut& out) const override;
-    bool Load(Kernel::InStream& stream, Kernel::FileStore& store) override;
-    Kernel::FileStoreItemType const* GetObjectFileStoreItemType() const override { return &c_type; }
+    void Save(OutStream& stream, FileStoreOut& out) const override;
+    bool Load(InStream& stream, FileStore& store) override;
+    FileStoreItemType const* GetObjectFileStoreItemType() const override { return &c_type; }
 
     std::string bytes;
-    std::function<void(Kernel::FileStoreOut&)> onSave; ///< Called before the bytes are written.
+    std::function<void(FileStoreOut&)> onSave; ///< Called before the bytes are written.
 
 protected:
     ~BytesItem() override;
 };
 
 /// The hint for zstd at the default level.
-Kernel::Counted<Kernel::FileStoreCompressionHint> Compressed();
+Counted<FileStoreCompressionHint> Compressed();
 
 } // namespace KernelTest

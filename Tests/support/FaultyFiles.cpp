@@ -66,16 +66,25 @@ bool Strikes(FileCall call, std::string const& path, Fault& out)
     return strikes;
 }
 
-template <class... Parameters, class... Arguments>
-int Pass(FileCall call, std::string const& path, int (*next)(Parameters...), Arguments&&... arguments)
-{
-    Fault fault;
-    return Strikes(call, path, fault) ? fault.error : next(std::forward<Arguments>(arguments)...);
-}
-
 std::string Text(char const* path)
 {
     return path ? path : "";
+}
+
+// What a call is about, by its first arguments.
+template <class... Rest>
+std::string PlaceOf(FileHandle handle, Rest&&...)
+{
+    return PathOf(handle);
+}
+template <class... Rest>
+std::string PlaceOf(char const* path, Rest&&...)
+{
+    return Text(path);
+}
+std::string PlaceOf(char const* from, char const* to)
+{
+    return Text(from) + "\n" + Text(to);
 }
 
 std::string Content(FileHandle handle)
@@ -94,30 +103,35 @@ u64 PartOf(Fault const& fault, u64 size)
     return fault.part == Fault::Part::AllButOne && size > 0 ? size - 1 : 0;
 }
 
-template <class Data>
-IoResult Move(FileCall call, FileHandle handle, Data* data, u64 size, IoResult (*next)(FileHandle, Data*, u64))
+// A call of the table before, unless a fault strikes.
+template <FileCall c_call, auto Member>
+struct Faulty;
+template <FileCall c_call, class... P, int (*FileCalls::*Member)(P...)>
+struct Faulty<c_call, Member>
 {
-    Fault fault;
-    if (!Strikes(call, PathOf(handle), fault)) return next(handle, data, size);
-    IoResult result = next(handle, data, PartOf(fault, size));
-    result.error = fault.error;
-    return result;
-}
-
-template <class Data>
-IoResult MoveAt(FileCall call, FileHandle handle, Data* data, u64 size, u64 offset,
-                IoResult (*next)(FileHandle, Data*, u64, u64))
+    static int Call(P... p)
+    {
+        Fault fault;
+        return Strikes(c_call, PlaceOf(p...), fault) ? fault.error : (s.next.load()->*Member)(p...);
+    }
+};
+template <FileCall c_call, class Data, class... Offset,
+          IoResult (*FileCalls::*Member)(FileHandle, Data*, u64, Offset...)>
+struct Faulty<c_call, Member>
 {
-    Fault fault;
-    if (!Strikes(call, PathOf(handle), fault)) return next(handle, data, size, offset);
-    IoResult result = next(handle, data, PartOf(fault, size), offset);
-    result.error = fault.error;
-    return result;
-}
+    static IoResult Call(FileHandle handle, Data* data, u64 size, Offset... offset)
+    {
+        Fault fault;
+        bool const strikes = Strikes(c_call, PathOf(handle), fault);
+        IoResult result = (s.next.load()->*Member)(handle, data, strikes ? PartOf(fault, size) : size, offset...);
+        if (strikes) result.error = fault.error;
+        return result;
+    }
+};
 
 int Open(char const* path, OpenFlags const& flags, FileHandle& out)
 {
-    int const error = Pass(FileCall::Open, Text(path), s.next.load()->open, path, flags, out);
+    int const error = Faulty<FileCall::Open, &FileCalls::open>::Call(path, flags, out);
     if (error) {
         out = c_noHandle;
         return error;
@@ -158,60 +172,38 @@ int Flush(FileHandle handle, FlushKind kind)
     return error;
 }
 
+template <FileCall c_call, auto... Members>
+void PutFaulty(FileCalls& table)
+{
+    ((table.*Members = Faulty<c_call, Members>::Call), ...);
+}
+
 // What has no kind here goes straight to the table that was in place.
 FileCalls MakeTable(FileCalls const& next)
 {
     using C = FileCall;
+    using F = FileCalls;
     FileCalls t = next;
     t.open = Open;
     t.close = Close;
-    t.read = [](FileHandle h, void* d, u64 n) { return Move(C::Read, h, d, n, s.next.load()->read); };
-    t.write = [](FileHandle h, void const* d, u64 n) { return Move(C::Write, h, d, n, s.next.load()->write); };
-    t.readAt = [](FileHandle h, void* d, u64 n, u64 o) { return MoveAt(C::Read, h, d, n, o, s.next.load()->readAt); };
-    t.writeAt = [](FileHandle h, void const* d, u64 n, u64 o) {
-        return MoveAt(C::Write, h, d, n, o, s.next.load()->writeAt);
-    };
-    t.seek = [](FileHandle h, i64 o, SeekFrom f, u64& p) {
-        return Pass(C::Seek, PathOf(h), s.next.load()->seek, h, o, f, p);
-    };
-    t.getSize = [](FileHandle h, u64& n) { return Pass(C::GetSize, PathOf(h), s.next.load()->getSize, h, n); };
-    t.setSize = [](FileHandle h, u64 n) { return Pass(C::SetSize, PathOf(h), s.next.load()->setSize, h, n); };
     t.flush = Flush;
-    t.statHandle = [](FileHandle h, FileInfo& i) { return Pass(C::Stat, PathOf(h), s.next.load()->statHandle, h, i); };
-    t.stat = [](char const* p, bool f, FileInfo& i) { return Pass(C::Stat, Text(p), s.next.load()->stat, p, f, i); };
-    t.access = [](char const* p, Access a) { return Pass(C::Access, Text(p), s.next.load()->access, p, a); };
-    t.rename = [](char const* a, char const* b) {
-        return Pass(C::Rename, Text(a) + "\n" + Text(b), s.next.load()->rename, a, b);
-    };
-    t.unlink = [](char const* p) { return Pass(C::Unlink, Text(p), s.next.load()->unlink, p); };
-    t.makeFolder = [](char const* p) { return Pass(C::MakeFolder, Text(p), s.next.load()->makeFolder, p); };
-    t.removeFolder = [](char const* p) { return Pass(C::RemoveFolder, Text(p), s.next.load()->removeFolder, p); };
-    t.readLink = [](char const* p, std::string& o) {
-        return Pass(C::ReadLink, Text(p), s.next.load()->readLink, p, o);
-    };
-    t.listFolder = [](char const* p, std::vector<FolderEntry>& e) {
-        return Pass(C::ListFolder, Text(p), s.next.load()->listFolder, p, e);
-    };
-    t.flushFolder = [](char const* p) { return Pass(C::FlushFolder, Text(p), s.next.load()->flushFolder, p); };
-    t.setTimes = [](char const* p, i64 a, i64 m) {
-        return Pass(C::SetAttributes, Text(p), s.next.load()->setTimes, p, a, m);
-    };
-    t.setTimesHandle = [](FileHandle h, i64 a, i64 m) {
-        return Pass(C::SetAttributes, PathOf(h), s.next.load()->setTimesHandle, h, a, m);
-    };
-    t.setMode = [](char const* p, u32 m) { return Pass(C::SetAttributes, Text(p), s.next.load()->setMode, p, m); };
-    t.setModeHandle = [](FileHandle h, u32 m) {
-        return Pass(C::SetAttributes, PathOf(h), s.next.load()->setModeHandle, h, m);
-    };
-    t.getAttribute = [](char const* p, char const* n, std::string& v) {
-        return Pass(C::GetAttribute, Text(p), s.next.load()->getAttribute, p, n, v);
-    };
-    t.setAttribute = [](char const* p, char const* n, void const* d, u64 z) {
-        return Pass(C::SetAttributes, Text(p), s.next.load()->setAttribute, p, n, d, z);
-    };
-    t.removeAttribute = [](char const* p, char const* n) {
-        return Pass(C::SetAttributes, Text(p), s.next.load()->removeAttribute, p, n);
-    };
+    PutFaulty<C::Read, &F::read, &F::readAt>(t);
+    PutFaulty<C::Write, &F::write, &F::writeAt>(t);
+    PutFaulty<C::Seek, &F::seek>(t);
+    PutFaulty<C::GetSize, &F::getSize>(t);
+    PutFaulty<C::SetSize, &F::setSize>(t);
+    PutFaulty<C::Stat, &F::stat, &F::statHandle>(t);
+    PutFaulty<C::Access, &F::access>(t);
+    PutFaulty<C::Rename, &F::rename>(t);
+    PutFaulty<C::Unlink, &F::unlink>(t);
+    PutFaulty<C::MakeFolder, &F::makeFolder>(t);
+    PutFaulty<C::RemoveFolder, &F::removeFolder>(t);
+    PutFaulty<C::ReadLink, &F::readLink>(t);
+    PutFaulty<C::ListFolder, &F::listFolder>(t);
+    PutFaulty<C::FlushFolder, &F::flushFolder>(t);
+    PutFaulty<C::GetAttribute, &F::getAttribute>(t);
+    PutFaulty<C::SetAttributes, &F::setTimes, &F::setTimesHandle, &F::setMode, &F::setModeHandle, &F::setAttribute,
+              &F::removeAttribute>(t);
     return t;
 }
 

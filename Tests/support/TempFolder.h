@@ -1,5 +1,10 @@
 #pragma once
 
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
 #include <string>
 
 namespace TestSupport {
@@ -8,10 +13,16 @@ namespace TestSupport {
 class TempFolder
 {
 public:
-    TempFolder();
-    ~TempFolder();
+    TempFolder() : m_path((std::filesystem::temp_directory_path() / "kernel-test-XXXXXX").string())
+    {
+        if (!::mkdtemp(m_path.data())) throw std::runtime_error("no temporary folder");
+    }
+    ~TempFolder()
+    {
+        std::error_code ignored;
+        std::filesystem::remove_all(m_path, ignored);
+    }
     TempFolder(TempFolder const&) = delete;
-    TempFolder& operator=(TempFolder const&) = delete;
 
     std::string const& GetPath() const { return m_path; }
     std::string operator/(std::string const& name) const { return m_path + "/" + name; }
@@ -21,7 +32,14 @@ private:
 };
 
 /// Whole files, past the library: a missing file reads as empty.
-std::string ReadWholeFile(std::string const& path);
-void WriteWholeFile(std::string const& path, std::string const& content);
+inline std::string ReadWholeFile(std::string const& path)
+{
+    std::ifstream in(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+}
+inline void WriteWholeFile(std::string const& path, std::string const& content)
+{
+    std::ofstream(path, std::ios::binary).write(content.data(), static_cast<std::streamsize>(content.size()));
+}
 
 } // namespace TestSupport
