@@ -4,13 +4,9 @@
 
 namespace Kernel::Test {
 
-namespace {
-
-bool s_isWatching = false;
-i64 s_inUse = 0;
-i64 s_peak = 0;
-
-} // namespace
+static bool s_isWatching = false;
+static i64 s_inUse = 0;
+static i64 s_peak = 0;
 
 AllocationWatch::AllocationWatch()
 {
@@ -41,42 +37,32 @@ void __libc_free(void*);
 size_t malloc_usable_size(void*);
 }
 
-namespace {
-
-using namespace Kernel::Test;
-
-// What is asked for counts, not what is there: a block that is never touched costs nothing, but nobody promised that.
-void* Enter(void* block)
+// Takes a block into the account, or out of it. What is asked for counts, not what is there: a block that is never
+// touched costs nothing, but nobody promised that.
+static void* Count(void* block, Kernel::i64 sign)
 {
-    if (s_isWatching && block) s_inUse += static_cast<Kernel::i64>(malloc_usable_size(block));
+    using namespace Kernel::Test;
+    if (s_isWatching && block) s_inUse += sign * static_cast<Kernel::i64>(malloc_usable_size(block));
     if (s_inUse > s_peak) s_peak = s_inUse;
     return block;
 }
 
-void* Leave(void* block)
-{
-    if (s_isWatching && block) s_inUse -= static_cast<Kernel::i64>(malloc_usable_size(block));
-    return block;
-}
-
-} // namespace
-
 extern "C" {
 void* malloc(size_t size)
 {
-    return Enter(__libc_malloc(size));
+    return Count(__libc_malloc(size), 1);
 }
 void* calloc(size_t count, size_t size)
 {
-    return Enter(__libc_calloc(count, size));
+    return Count(__libc_calloc(count, size), 1);
 }
 void* realloc(void* old, size_t size)
 {
-    return Enter(__libc_realloc(Leave(old), size));
+    return Count(__libc_realloc(Count(old, -1), size), 1);
 }
 void free(void* block)
 {
-    __libc_free(Leave(block));
+    __libc_free(Count(block, -1));
 }
 }
 

@@ -1,5 +1,6 @@
 #include "libkernel/serialisation/InSerialiser.h"
 
+#include "PropertyChecks.h"
 #include "libkernel/core/Uuid.h"
 #include "libkernel/filestore/DelayLoadHolder.h"
 #include "libkernel/serialisation/EnumSerialiser.h"
@@ -66,55 +67,42 @@ TEST(InSerialiserTest, RefusedLoadLeavesTheOutputUntouched)
     EXPECT_EQ(two[0], 3u);
 }
 
-// Each form alone is read where it is written; here stands what no writer writes, and what hangs together.
+// Each form alone is read where it is written, and both forms of the parse, every delivery and the check of streams are
+// held against each other here; what no writer writes, and what hangs together, is asked for by hand.
 TEST(InSerialiserTest, EveryItemFormLoadsByEveryDelivery)
 {
     PropertyBytes const b = EveryItemForm();
-    for (Delivery delivery : c_deliveries) {
-        SCOPED_TRACE(static_cast<int>(delivery));
-        Counted<InSerialiserFile> const in = Parse(b.bytes, true, delivery);
-        ASSERT_TRUE(in);
-        u8 block[64];
-        EXPECT_TRUE(in->LoadTypeI(IDTag(0x10000 + 30), static_cast<PropType>(30), block, 48));
-        EXPECT_EQ(block[47], 48);
-        EXPECT_TRUE(in->LoadRawStructI(IDTag(0x10000 + 116), block, 64));
-        EXPECT_FALSE(in->LoadRawStructI(IDTag(0x10000 + 116), block, 63));
-        Uuid id;
-        EXPECT_TRUE(id.Load(*in, IDTag(0x10044)));
-        EXPECT_EQ(id, Uuid("04030201-0605-0807-090A-0B0C0D0E0F10"));
-        EXPECT_FALSE(in->LoadTypeCustomI("Cust", block, 2));
-        String16 text;
-        EXPECT_TRUE(in->LoadType("Text", text));
-        EXPECT_EQ(text.GetLength(), 5);
-        EXPECT_FALSE(in->LoadType("Shpd", text));
-        Counted<FragmentedRawData> fragments;
-        ASSERT_TRUE(in->LoadFragmentedRawData("Frag", fragments));
-        EXPECT_EQ(fragments->GetData(3, block, 9), 1u);
-        ClassUID uid;
-        unsigned short version = 0;
-        auto const* const lists = in->LoadClassesI("Clss", uid, version);
-        ASSERT_TRUE(lists && lists->size() == 3);
-        EXPECT_TRUE((*lists)[0] && !(*lists)[1] && (*lists)[2]);
-        EXPECT_TRUE(!in->LoadClassI("ClsN", uid, version) && uid.value == 0);
-        Counted<DelayLoadHolder> holder;
-        EXPECT_TRUE(in->LoadDelayLoadObject("DlyN", holder) && !holder);
-        EXPECT_TRUE(in->LoadDelayLoadObject("DlyZ", holder) && !holder);
-        Counted<ReaderNode> root;
-        ASSERT_TRUE(in->LoadObject("Root", root));
-        EXPECT_EQ(root->number, 100u);
-        EXPECT_EQ(root->name, "default name");
-        EXPECT_FALSE(root->sawUnloaded); // An owner loads after what it owns.
-        ASSERT_EQ(root->kids.size(), 3u);
-        EXPECT_EQ(root->kids[2], root->child);
-        EXPECT_EQ(root->reference.Get(), root->child.Get());
-        Consolidated<ReaderShared> shared;
-        EXPECT_TRUE(in->LoadSharedObject("Shar", shared));
-        EXPECT_TRUE(root->shared && shared->next == root->shared);
-        Counted<ReaderLegacy> legacy;
-        EXPECT_TRUE(in->LoadObject("Lgcy", legacy));
-        EXPECT_EQ(legacy->madeWith, 77u);
-        EXPECT_GT(LoadEverything(*in), 300u);
-    }
+    for (Delivery delivery : c_deliveries) Fuzz::CheckProperties(b.bytes, true, delivery);
+    Counted<InSerialiserFile> const in = Parse(b.bytes);
+    ASSERT_TRUE(in);
+    u8 block[64];
+    EXPECT_FALSE(in->LoadRawStructI(IDTag(0x10000 + 116), block, 63));
+    EXPECT_FALSE(in->LoadTypeCustomI("Cust", block, 2));
+    Uuid id;
+    EXPECT_TRUE(id.Load(*in, IDTag(0x10044)));
+    EXPECT_EQ(id, Uuid("04030201-0605-0807-090A-0B0C0D0E0F10"));
+    String16 text;
+    EXPECT_TRUE(in->LoadType("Text", text));
+    EXPECT_EQ(text.GetLength(), 5);
+    EXPECT_FALSE(in->LoadType("Shpd", text));
+    Counted<DelayLoadHolder> holder;
+    EXPECT_TRUE(in->LoadDelayLoadObject("DlyN", holder) && !holder);
+    EXPECT_TRUE(in->LoadDelayLoadObject("DlyZ", holder) && !holder);
+    Counted<ReaderNode> root;
+    ASSERT_TRUE(in->LoadObject("Root", root));
+    EXPECT_EQ(root->number, 100u);
+    EXPECT_EQ(root->name, "default name");
+    EXPECT_FALSE(root->sawUnloaded); // An owner loads after what it owns.
+    ASSERT_EQ(root->kids.size(), 3u);
+    EXPECT_EQ(root->kids[2], root->child);
+    EXPECT_EQ(root->reference.Get(), root->child.Get());
+    Consolidated<ReaderShared> shared;
+    EXPECT_TRUE(in->LoadSharedObject("Shar", shared));
+    EXPECT_TRUE(root->shared && shared->next == root->shared);
+    Counted<ReaderLegacy> legacy;
+    EXPECT_TRUE(in->LoadObject("Lgcy", legacy));
+    EXPECT_EQ(legacy->madeWith, 77u);
+    EXPECT_GT(LoadEverything(*in), 300u);
 }
 
 // As many as there is room for, and with the number stored more room than needed.
