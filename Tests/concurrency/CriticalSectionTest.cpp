@@ -60,54 +60,40 @@ TEST(CriticalSection, HeldLockSurvivesAMoveOfItsObjectAndLetsNobodyElseIn)
 TEST(Semaphore, EachSignalLetsOneWaiterThrough)
 {
     auto const semaphore = MakeCounted<Semaphore>();
-    std::atomic<int> through{0};
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 4; ++i) {
+    std::vector<std::jthread> threads; // They wait for ever, so every signal is needed.
+    for (int i = 0; i < 4; ++i)
         threads.emplace_back([&] {
-            for (int k = 0; k < 500; ++k) {
-                semaphore->Wait(0); // For ever, so every signal is needed.
-                ++through;
-            }
+            for (int k = 0; k < 500; ++k) semaphore->Wait(0);
         });
-    }
     for (int i = 0; i < 4 * 500; ++i) semaphore->Signal();
-    for (auto& thread : threads) thread.join();
-    EXPECT_EQ(4 * 500, through);
-}
-
-TEST(Semaphore, InitialCountIsTakenFirstAndATimeOutComesBack)
-{
-    auto const semaphore = MakeCounted<Semaphore>(2);
-    semaphore->Wait(0);
-    semaphore->Wait(0);
+    threads.clear();
     auto const start = std::chrono::steady_clock::now();
-    semaphore->Wait(5);
+    semaphore->Wait(5); // Nothing is left.
     EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(5));
     semaphore->Signal(); // The wait that timed out took nothing along.
     semaphore->Wait(0);
+}
+
+TEST(Semaphore, InitialCountIsTakenFirstAndStopsAtItsMaximum)
+{
+    auto const semaphore = MakeCounted<Semaphore>(2);
+    for (int i = 0; i < 2; ++i) semaphore->Wait(0);
     auto const full = MakeCounted<Semaphore>(0x7FFFFFFF);
-    full->Signal(); // The count stops at its maximum.
+    full->Signal();
     full->Wait(1);
 }
 
 TEST(MultiSemaphore, OpensOnceForAllAndStaysOpen)
 {
     auto const gate = MakeCounted<MultiSemaphore>();
-    std::atomic<int> through{0};
-    std::atomic<int> arrived{0};
-    std::vector<std::thread> threads;
-    for (int i = 0; i < 8; ++i) {
-        threads.emplace_back([&] {
-            ++arrived;
-            gate->Wait(0);
-            ++through;
-        });
-    }
+    std::atomic<int> through{0}, arrived{0};
+    std::vector<std::jthread> threads;
+    for (int i = 0; i < 8; ++i) threads.emplace_back([&] { ++arrived, gate->Wait(0), ++through; });
     while (arrived < 4) std::this_thread::yield(); // Some wait, some come late.
     gate->Wait(1);                                 // Times out, and stays counted.
     EXPECT_EQ(0, through);
     gate->Signal();
-    for (auto& thread : threads) thread.join();
+    threads.clear();
     EXPECT_EQ(8, through);
     gate->Wait(0);
     gate->Signal();

@@ -6,8 +6,6 @@ namespace TestNames {
 
 class DiskFull : public Kernel::Notification
 {
-protected:
-    ~DiskFull() override = default;
 };
 
 } // namespace TestNames
