@@ -500,7 +500,7 @@ inline ParseResult ParseProperties(Bytes const& bytes, bool checks, Test::Delive
     } catch (UnknownEnumVersionException const&) {
         result.outcome = ParseOutcome::TooNew; // Out of the Load of one of the library's own classes.
     }
-    result.end = Test::GetTaken(*in);
+    result.end = in->Tell();
     return result;
 }
 

@@ -110,9 +110,9 @@ TEST(FragmentedRawDataTest, CopyFailsAtTheFirstShortWrite)
     Bytes const bytes = Pattern(50000);
     ASSERT_TRUE(data->SetData(0, bytes.data(), bytes.size(), false));
     for (u64 limit : {50000, 49999, 16384, 0}) {
-        KernelTest::BytesOutStream out(limit);
+        Kernel::Test::PlainTarget out(limit);
         EXPECT_EQ(data->CopyToStream(out), limit == bytes.size());
-        EXPECT_EQ(out.m_bytes, std::string(bytes.begin(), bytes.begin() + static_cast<i64>(limit)));
+        EXPECT_EQ(out.bytes, std::string(bytes.begin(), bytes.begin() + static_cast<i64>(limit)));
     }
 }
 

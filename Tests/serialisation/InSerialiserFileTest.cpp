@@ -5,8 +5,8 @@
 #include "libkernel/serialisation/FutureVersionException.h"
 #include "libkernel/serialisation/PropertyStreamDump.h"
 #include "serialisation/ReaderClasses.h"
+#include "support/PlainStreams.h"
 #include "support/Rows.h"
-#include "support/ScriptedInStream.h"
 #include "support/TraceCapture.h"
 
 #include <gtest/gtest.h>
@@ -111,7 +111,7 @@ TEST(InSerialiserFileTest, StreamIsLeftJustBehindTheList)
                                     : way == 1 ? bool(InSerialiserFile::ParseSkipUnknownClasses(*in))
                                                : CheckPropertyStream(*in).offset == b.bytes.size();
                 EXPECT_TRUE(parsed);
-                EXPECT_EQ(GetTaken(*in), end);
+                EXPECT_EQ(in->Tell(), end);
                 EXPECT_EQ(in->ReadBlock(text, 6), 6u);
                 EXPECT_STREQ(text, "behind");
             }
@@ -124,14 +124,13 @@ TEST(InSerialiserFileTest, SmallPropertiesNeedFewReads)
     b.Header();
     for (u32 i = 1; i <= 10000; ++i) b.U8(3).U32(i).U32(i);
     b.End();
-    SeekableScriptedStream* const seekable = new SeekableScriptedStream(b.bytes);
-    Counted<InStream> const keepSeekable(seekable);
+    auto const seekable = MakeCounted<SeekableSource>(b.bytes);
     ASSERT_TRUE(InSerialiserFile::ParseWithChecks(*seekable));
-    EXPECT_LE(seekable->reads, 3u);
-    ScriptedInStream* const plain = new ScriptedInStream(b.bytes, false);
-    Counted<InStream> const keepPlain(plain);
+    EXPECT_LE(seekable->readCount, 3u);
+    auto const plain = MakeCounted<PlainSource>(b.bytes);
+    plain->sized = false;
     ASSERT_TRUE(InSerialiserFile::ParseWithChecks(*plain));
-    EXPECT_LE(plain->reads, 10000u + 5);
+    EXPECT_LE(plain->readCount, 10000u + 5);
 }
 
 // Objects.
@@ -181,12 +180,15 @@ TEST(InSerialiserFileTest, DefaultsComeFromTheFileThroughTheChain)
     EXPECT_EQ(root->number, 31u);
     EXPECT_TRUE(root->numberIsDefault);
     EXPECT_EQ(root->version, 1);
+    EXPECT_TRUE(root->GetObjectClassProperties()->IsPolymorphicType("RdDv"));
+    EXPECT_TRUE(root->GetObjectClassProperties()->IsPolymorphicType("RdNo"));
     Counted<ReaderNode> other;
     ASSERT_TRUE(file->LoadObject("Othr", other));
     EXPECT_EQ(other->name, "base");
     EXPECT_EQ(other->number, 32u);
     EXPECT_FALSE(other->numberIsDefault);
     EXPECT_EQ(other->version, 6);
+    EXPECT_FALSE(other->GetObjectClassProperties()->IsPolymorphicType("RdDv"));
 }
 
 TEST(InSerialiserFileTest, ClassDescribedInsideADefaultObjectStaysKnown)

@@ -100,35 +100,35 @@ TEST(OutSerialiserFailures, ShortWriteAtAnyByteIsReported)
         }
         out.Close();
     };
-    auto const whole = MakeCounted<BytesOutStream>();
+    auto const whole = MakeCounted<PlainTarget>();
     save(*whole);
-    std::string const expected = whole->m_bytes;
+    std::string const expected = whole->bytes;
     for (u64 limit = 0; limit < expected.size(); limit += limit < 200 || limit + 200 > expected.size() ? 1 : 997) {
-        auto const stream = MakeCounted<BytesOutStream>(limit);
+        auto const stream = MakeCounted<PlainTarget>(limit);
         ASSERT_EQ(SaveCode([&] { save(*stream); }), 0) << limit;
-        ASSERT_TRUE(expected.starts_with(stream->m_bytes)) << limit;
+        ASSERT_TRUE(expected.starts_with(stream->bytes)) << limit;
     }
 }
 
 TEST(OutSerialiserFailures, NothingIsWrittenAfterAFailure)
 {
-    auto const stream = MakeCounted<BytesOutStream>(u64{20});
+    auto const stream = MakeCounted<PlainTarget>(u64{20});
     {
         OutSerialiserFile out(*stream, IDTag("Test"), 1);
         std::string const block(20000, 'b');
         EXPECT_EQ(SaveCode([&] { out.SaveRawData("Tag1", block.data(), block.size()); }), 0);
-        stream->m_limit = 1000000;
+        stream->room = 1000000;
         EXPECT_EQ(SaveCode([&] { out.SaveType("Tag2", 1); }), 0);
         EXPECT_EQ(SaveCode([&] { out.Close(); }), 0);
     }
-    EXPECT_EQ(stream->m_bytes.size(), 20u);
+    EXPECT_EQ(stream->bytes.size(), 20u);
 }
 
 TEST(OutSerialiserFailures, AbortEndsTheSaveAtTheNextProperty)
 {
     bool abort = false;
     RecordingOut store(VoidFileStore::GetInstance(), FileStoreOut::PurposeSave, &abort);
-    auto const stream = MakeCounted<BytesOutStream>();
+    auto const stream = MakeCounted<PlainTarget>();
     OutSerialiserFile out(*stream, store, IDTag("Test"), 1);
     OutSerialiserPropertyDataStream values(out, "Strm", 1);
     abort = true;
@@ -145,7 +145,7 @@ TEST(OutSerialiserFailures, AbortEndsTheSaveAtTheNextProperty)
 TEST(OutSerialiserFailures, DelayLoadReferenceNamesTheItemAndQueuesIt)
 {
     RecordingOut store(VoidFileStore::GetInstance());
-    auto const stream = MakeCounted<BytesOutStream>();
+    auto const stream = MakeCounted<PlainTarget>();
     auto const item = MakeCounted<MemoryItem>();
     auto const holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item);
     FileStoreOutIndexedPathGenerator generator(store, "pic/", ".x");
@@ -153,7 +153,7 @@ TEST(OutSerialiserFailures, DelayLoadReferenceNamesTheItemAndQueuesIt)
     out.SaveDelayLoadObject("Pic1", holder, generator, nullptr);
     out.SaveDelayLoadObject("Pic2", nullptr, generator, nullptr);
     out.Close();
-    EXPECT_EQ(Show(stream->m_bytes.substr(16)),
+    EXPECT_EQ(Show(stream->bytes.substr(16)),
               Show(Bytes("33 [Pic1] [TsPl] 07 00 00 00 'pic/1.x' | 33 [Pic2] 00 00 00 00 00 00 00 00 | 00")));
     EXPECT_EQ(store.files, (std::vector<Counted<DelayLoadHolder>>{holder}));
     ASSERT_EQ(store.assigned.size(), 1u);
@@ -170,7 +170,7 @@ TEST(OutSerialiserFailures, EnumeratingPassWalksTheStructureAndWritesNothing)
     for (auto const purpose : {FileStoreOut::PurposeEnumeratePaths, FileStoreOut::PurposeEnumerateHolders}) {
         SCOPED_TRACE(static_cast<u32>(purpose));
         RecordingOut store(VoidFileStore::GetInstance(), purpose);
-        auto const stream = MakeCounted<BytesOutStream>(u64{0});
+        auto const stream = MakeCounted<PlainTarget>(u64{0});
         int saves = 0;
         ClassProperties const description = MakeClass("Albm");
         auto const album = MakeCounted<Thing>(&description);
@@ -189,7 +189,7 @@ TEST(OutSerialiserFailures, EnumeratingPassWalksTheStructureAndWritesNothing)
         EXPECT_FALSE(out.IsFullSave());
         out.SaveObjects("Albm", std::vector<Counted<Thing>>{album, album, nullptr});
         out.Close();
-        EXPECT_EQ(stream->m_writes, 0);
+        EXPECT_TRUE(stream->writes.empty());
         EXPECT_EQ(saves, 1);
         EXPECT_EQ(store.files, (std::vector<Counted<DelayLoadHolder>>{holder}));
         bool const wantsPaths = purpose == FileStoreOut::PurposeEnumeratePaths;

@@ -2,7 +2,7 @@
 
 #include "libkernel/core/Hash.h"
 #include "libkernel/streams/MemoryStreams.h"
-#include "support/ScriptedInStream.h"
+#include "support/PlainStreams.h"
 
 namespace Kernel::Test {
 
@@ -122,19 +122,11 @@ bool ReaderShared::CompareMembers(SharedSerialisable const& other, CompareContex
 
 Counted<InStream> Deliver(std::vector<u8> const& bytes, Delivery delivery)
 {
-    switch (delivery) {
-    case Delivery::Memory: return Counted<InStream>(new MemoryInStream(bytes.data(), bytes.size(), true));
-    case Delivery::Seekable: return Counted<InStream>(new SeekableScriptedStream(bytes));
-    case Delivery::Sized: return Counted<InStream>(new ScriptedInStream(bytes, true));
-    case Delivery::Unsized: break;
-    }
-    return Counted<InStream>(new ScriptedInStream(bytes, false));
-}
-
-u64 GetTaken(InStream const& in)
-{
-    auto const* const scripted = dynamic_cast<ScriptedInStream const*>(&in);
-    return scripted ? scripted->GetPosition() : in.Tell();
+    if (delivery == Delivery::Memory) return Counted<InStream>(new MemoryInStream(bytes.data(), bytes.size(), true));
+    if (delivery == Delivery::Seekable) return Counted<InStream>(new SeekableSource(bytes));
+    auto const source = MakeCounted<PlainSource>(bytes);
+    source->sized = delivery == Delivery::Sized;
+    return source;
 }
 
 Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks, Delivery delivery)

@@ -100,8 +100,6 @@ enum class Delivery
 inline constexpr Delivery c_deliveries[] = {Delivery::Memory, Delivery::Seekable, Delivery::Sized, Delivery::Unsized};
 
 Counted<InStream> Deliver(std::vector<u8> const& bytes, Delivery delivery);
-/// Bytes that have been taken from a stream of Deliver.
-u64 GetTaken(InStream const& in);
 Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks = true, Delivery delivery = Delivery::Memory);
 /// A file with these items, in the notation of Bytes(), behind a header and with an end.
 Counted<InSerialiserFile> ParseItems(std::string_view notation);

@@ -31,9 +31,9 @@ std::string const& OneFile()
 
 TEST(SerialiseToStream, WritesTheWholeFileAndLetsGoOfTheStream)
 {
-    auto const stream = MakeCounted<BytesOutStream>();
+    auto const stream = MakeCounted<PlainTarget>();
     EXPECT_TRUE(SerialiseToStream(stream, "Sett", 9, SaveOne));
-    EXPECT_EQ(Show(stream->m_bytes), Show(OneFile()));
+    EXPECT_EQ(Show(stream->bytes), Show(OneFile()));
     EXPECT_EQ(stream->GetReferenceCount(), 1);
     EXPECT_FALSE(SerialiseToStream(nullptr, "Sett", 9, SaveOne));
 }
@@ -47,9 +47,9 @@ TEST(SerialiseToStream, AnythingThrownIsAFailure)
         [](OutSerialiser& out, IDTag tag) { SaveOne(out, tag), SaveOne(out, tag); },
         nullptr,
     };
-    for (auto const& save : failing) EXPECT_FALSE(SerialiseToStream(MakeCounted<BytesOutStream>(), "Sett", 9, save));
+    for (auto const& save : failing) EXPECT_FALSE(SerialiseToStream(MakeCounted<PlainTarget>(), "Sett", 9, save));
     for (u64 limit = 0; limit < OneFile().size(); ++limit)
-        EXPECT_FALSE(SerialiseToStream(MakeCounted<BytesOutStream>(limit), "Sett", 9, SaveOne)) << limit;
+        EXPECT_FALSE(SerialiseToStream(MakeCounted<PlainTarget>(limit), "Sett", 9, SaveOne)) << limit;
 }
 
 TEST(SerialiseFromStream, KindAndVersionAreCheckedAndWhateverIsThrownGivesFalse)

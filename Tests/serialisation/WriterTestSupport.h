@@ -4,7 +4,7 @@
 #include "libkernel/serialisation/ClassProperties.h"
 #include "libkernel/serialisation/CompareContext.h"
 #include "libkernel/serialisation/OutSerialiserFile.h"
-#include "libkernel/streams/OutStream.h"
+#include "support/PlainStreams.h"
 #include "support/PropertyBytes.h"
 
 #include <atomic>
@@ -18,28 +18,8 @@ namespace KernelTest {
 
 using namespace Kernel;
 using Kernel::Test::Bytes;
+using Kernel::Test::PlainTarget;
 using Kernel::Test::Show;
-
-/// Keeps what it is given, up to a limit of bytes; then its writes come up short.
-class BytesOutStream : public OutStream
-{
-public:
-    explicit BytesOutStream(u64 limit = std::numeric_limits<u64>::max()) : m_limit(limit) {}
-    ~BytesOutStream() override = default;
-    u64 WriteBlock(void const* from, u64 count) override
-    {
-        ++m_writes;
-        u64 const taken = std::min<u64>(count, m_limit - m_bytes.size());
-        m_bytes.append(static_cast<char const*>(from), taken);
-        return taken;
-    }
-    u64 GetSizeOutStream() const override { return m_bytes.size(); }
-    u64 TellOutStream() const override { return m_bytes.size(); }
-
-    std::string m_bytes;
-    u64 m_limit;
-    int m_writes = 0;
-};
 
 using SaveFunction = std::function<void(OutSerialiser&)>;
 
@@ -125,11 +105,11 @@ inline Consolidated<SharedSerialisable> MakeShared(SharedClassProperties const& 
 /// The root list that @p save makes, with its closing 0 and without the file header.
 inline std::string SaveList(SaveFunction const& save)
 {
-    auto const stream = MakeCounted<BytesOutStream>();
+    auto const stream = MakeCounted<PlainTarget>();
     OutSerialiserFile out(*stream, IDTag("Test"), 1);
     save(out);
     out.Close();
-    return stream->m_bytes.substr(16);
+    return stream->bytes.substr(16);
 }
 
 /// The code of the SaveException that @p save throws; -1 if there was none.

@@ -40,7 +40,7 @@ TEST(BufferedOutStreamTest, WhatItCommitsIsWhatAMemoryStreamHolds)
             ASSERT_EQ(out.Tell(), reference->Tell());
         }
         EXPECT_TRUE(out.Commit(CommitErrors::Swallow));
-        EXPECT_TRUE(target.text == Content(*reference));
+        EXPECT_TRUE(target.bytes == Content(*reference));
     }
 }
 
@@ -62,7 +62,7 @@ TEST(BufferedOutStreamTest, ACommitWritesWholeBlocksThenTheTailAndCloses)
     EXPECT_FALSE(out.WriteBlockAtPos(0, "x", 1));
     EXPECT_EQ(out.GetSize(), 0u);
     EXPECT_TRUE(out.Commit(CommitErrors::Rethrow));
-    EXPECT_EQ(target.text, Pattern(5000));
+    EXPECT_EQ(target.bytes, Pattern(5000));
 }
 
 TEST(BufferedOutStreamTest, AShortWriteKeepsTheBytesForAnotherCommitAndTheDestructorSwallows)
@@ -78,9 +78,9 @@ TEST(BufferedOutStreamTest, AShortWriteKeepsTheBytesForAnotherCommitAndTheDestru
     EXPECT_FALSE(out.Commit(CommitErrors::Swallow));
     EXPECT_THROW(out.Commit(CommitErrors::Rethrow), int);
     target.room = ~u64{0};
-    target.text.clear();
+    target.bytes.clear();
     EXPECT_TRUE(out.Commit(CommitErrors::Rethrow));
-    EXPECT_EQ(target.text, Pattern(3000));
+    EXPECT_EQ(target.bytes, Pattern(3000));
 
     PlainTarget good, throwing;
     throwing.room = 0;
@@ -90,7 +90,7 @@ TEST(BufferedOutStreamTest, AShortWriteKeepsTheBytesForAnotherCommitAndTheDestru
         Write(kept, "abc");
         Write(lost, "abc"); // The destructor swallows what it throws.
     }
-    EXPECT_EQ(good.text, "abc");
+    EXPECT_EQ(good.bytes, "abc");
     EXPECT_EQ(good.writes.size(), 1u) << "an empty stream writes nothing";
 }
 

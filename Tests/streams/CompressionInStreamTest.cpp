@@ -12,13 +12,23 @@ using DecompressException = CompressionInStream::DecompressException;
 using Type = CompressionPredictorType;
 using Striping = CompressionPredictorStripingType;
 using Testing::Bytes;
-using Testing::ByteSource;
 
 Counted<CompressionInStream> Make(bool zstd, Counted<InStream> source, u32 type, bool striped, bool throwOnError)
 {
     Striping const striping = striped ? Striping::Striping64k : Striping::None;
     if (zstd) return ZStandardInStream::Create(source, static_cast<Type>(type), striping, throwOnError);
     return ZipInStream::Create(source, static_cast<Type>(type), striping, throwOnError);
+}
+
+// A broken one stops before its end, as after a read error.
+Counted<InStream> Source(Bytes bytes, u64 piece = ~u64{0}, bool isBroken = false)
+{
+    u64 const size = bytes.size();
+    if (isBroken) bytes.push_back(0);
+    auto const source = MakeCounted<Test::PlainSource>(bytes);
+    source->piece = piece;
+    source->silentFrom = size;
+    return source;
 }
 
 // What a peer has packed of what the definition makes of the data.
@@ -51,7 +61,7 @@ TEST_P(CompressionInStreamTest, AnyReadAndSkipSizesGiveTheData)
                 SCOPED_TRACE(testing::Message() << size << " type " << type << " striped " << striped);
                 Bytes const packed = Pack(GetParam(), plain, type, striped);
                 Counted<CompressionInStream> const stream =
-                    Make(GetParam(), MakeCounted<ByteSource>(packed, 1 + random() % 40000), type, striped, true);
+                    Make(GetParam(), Source(packed, 1 + random() % 40000), type, striped, true);
                 // Without striping the sizes must be whole elements, but for the last.
                 u64 const unit = striped || type == 0 ? 1 : u64(1) << (type - 1);
                 for (u64 at = 0, part; at < size; at += part) {
@@ -79,7 +89,7 @@ TEST_P(CompressionInStreamTest, WithoutStripingABrokenElementComesBackUndecoded)
 {
     Bytes const plain{1, 0, 3, 0, 6, 0}; // Differences 1, 2, 3.
     Counted<CompressionInStream> const stream =
-        Make(GetParam(), MakeCounted<ByteSource>(Pack(GetParam(), plain, 2, false)), 2, false, false);
+        Make(GetParam(), Source(Pack(GetParam(), plain, 2, false)), 2, false, false);
     EXPECT_EQ(ReadAll(*stream, 3), (Bytes{1, 0, 2}));
     EXPECT_EQ(ReadAll(*stream, 2), (Bytes{1, 3})); // 0x0300 and 1, as it stands in the bytes of two elements.
 }
@@ -107,7 +117,7 @@ TEST_P(CompressionInStreamTest, CutDataIsAShortReadAndDamageAnExceptionByTheFlag
         {
             SCOPED_TRACE(testing::Message() << c.what << striped);
             auto const make = [&](bool throws) {
-                return Make(GetParam(), MakeCounted<ByteSource>(c.bytes, 5000, c.isBroken), 2, striped, throws);
+                return Make(GetParam(), Source(c.bytes, 5000, c.isBroken), 2, striped, throws);
             };
             Bytes const got = ReadAll(*make(false), plain.size());
             EXPECT_LT(got.size(), plain.size());
@@ -132,12 +142,12 @@ TEST(ZipInStreamTest, BytesBehindTheEndAreTheEndAndFramesOneBehindTheOtherReadAs
     for (bool striped : {false, true}) {
         Bytes packed = Pack(false, plain, 1, striped);
         packed.push_back(0x78);
-        EXPECT_EQ(ReadAll(*Make(false, MakeCounted<ByteSource>(packed), 1, striped, true), 5000), plain);
+        EXPECT_EQ(ReadAll(*Make(false, Source(packed), 1, striped, true), 5000), plain);
     }
     Bytes packed = Testing::PeerCompress(true, {1, 2});
     Bytes const second = Testing::PeerCompress(true, {3});
     packed.insert(packed.end(), second.begin(), second.end());
-    EXPECT_EQ(ReadAll(*Make(true, MakeCounted<ByteSource>(packed, 3), 0, false, true), 9), (Bytes{1, 2, 3}));
+    EXPECT_EQ(ReadAll(*Make(true, Source(packed, 3), 0, false, true), 9), (Bytes{1, 2, 3}));
 }
 
 TEST(ZipInStreamTest, PresetDictionaryWindowsAboveTwoToThe27AndOldFormatsAreDamage)
@@ -172,7 +182,7 @@ TEST(ZipInStreamTest, PresetDictionaryWindowsAboveTwoToThe27AndOldFormatsAreDama
                           {true, oldFrame(1), false},
                           {true, oldFrame(20), false}})
     {
-        auto const make = [&](bool throws) { return Make(c.zstd, MakeCounted<ByteSource>(c.bytes), 0, false, throws); };
+        auto const make = [&](bool throws) { return Make(c.zstd, Source(c.bytes), 0, false, throws); };
         EXPECT_EQ(ReadAll(*make(false), 4).size(), c.good ? 1u : 0u);
         u8 byte;
         EXPECT_EQ(c.zstd && ZStandardDecompressExact(c.bytes.data(), c.bytes.size(), &byte, 1), c.good);

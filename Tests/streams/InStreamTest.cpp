@@ -17,11 +17,11 @@ TEST(InStreamTest, NumbersAreLittleEndianAndOneTransferEach)
     *out << static_cast<signed char>(-2) << static_cast<unsigned char>(0xFE) << static_cast<short>(-2)
          << static_cast<unsigned short>(0x1234) << -3 << 0x12345678u << i64{-4} << u64{0x123456789ABCDEF0};
     EXPECT_EQ(out->writes, (std::vector<u64>{1, 1, 2, 2, 4, 4, 8, 8}));
-    EXPECT_EQ(out->text, std::string("\xFE\xFE\xFE\xFF\x34\x12\xFD\xFF\xFF\xFF\x78\x56\x34\x12"
-                                     "\xFC\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xF0\xDE\xBC\x9A\x78\x56\x34\x12",
-                                     30));
+    EXPECT_EQ(out->bytes, std::string("\xFE\xFE\xFE\xFF\x34\x12\xFD\xFF\xFF\xFF\x78\x56\x34\x12"
+                                      "\xFC\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xF0\xDE\xBC\x9A\x78\x56\x34\x12",
+                                      30));
 
-    auto in = MakeCounted<PlainSource>(out->text);
+    auto in = MakeCounted<PlainSource>(out->bytes);
     signed char a;
     unsigned char b;
     short c;
@@ -37,7 +37,7 @@ TEST(InStreamTest, NumbersAreLittleEndianAndOneTransferEach)
 
     EXPECT_THROW(*MakeCounted<PlainSource>("abc") >> e, InStream::ReadException);
     EXPECT_EQ(e, -3) << "one that comes up short changes nothing";
-    out->room = out->text.size() + 3;
+    out->room = out->bytes.size() + 3;
     EXPECT_THROW(*out << e, OutStream::WriteException);
 }
 
@@ -52,7 +52,7 @@ TEST(InStreamTest, TheGeneralCopyGoesInMebibytesAndReportsEach)
         in->ReadBlock(&first, 1);
         ProgressLog log;
         EXPECT_TRUE(fromTarget ? out->CopyFromStream(*in, &log) : in->CopyToStream(*out, &log));
-        EXPECT_EQ(out->text, text.substr(1));
+        EXPECT_EQ(out->bytes, text.substr(1));
         EXPECT_EQ(out->writes, (std::vector<u64>{c_piece, c_piece, 4}));
         u64 const total = text.size() - 1;
         EXPECT_EQ(log.reports, (Reports{{0, total}, {c_piece, total}, {2 * c_piece, total}, {total, total}}));
@@ -65,7 +65,7 @@ TEST(InStreamTest, TheGeneralCopyFailsWhereASideStopsEarly)
     in->silentFrom = 60;
     auto out = MakeCounted<PlainTarget>();
     EXPECT_FALSE(in->CopyToStream(*out));
-    EXPECT_EQ(out->text, Pattern(100).substr(0, 60)) << "what came must have been written";
+    EXPECT_EQ(out->bytes, Pattern(100).substr(0, 60)) << "what came must have been written";
 
     auto narrow = MakeCounted<PlainTarget>();
     narrow->room = 99;

@@ -45,7 +45,7 @@ TEST(LimitedStreamsTest, AWriterPassesOnWhatIsAllowedAndRemembersTheRest)
     EXPECT_EQ(Write(*borrowed, "0123456789"), 4u);
     EXPECT_TRUE(borrowed->WasExceeded());
     EXPECT_EQ(borrowed->Tell(), 4u);
-    EXPECT_EQ(target->text, "123456abcd0123");
+    EXPECT_EQ(target->bytes, "123456abcd0123");
 }
 
 TEST(ForwardBiasedSeekableInStreamTest, SeeksForwardAlwaysAndBackWhereTheSourceRewinds)

@@ -1,14 +1,11 @@
 #pragma once
 
 #include "libkernel/streams/CompressionPredictor.h"
-#include "libkernel/streams/InStream.h"
-#include "libkernel/streams/OutStream.h"
+#include "support/PlainStreams.h"
 
 #include <algorithm>
-#include <limits>
 #include <optional>
 #include <random>
-#include <string>
 #include <vector>
 #include <zlib.h>
 #include <zstd.h>
@@ -17,55 +14,7 @@ namespace Kernel::Testing {
 
 using Bytes = std::vector<u8>;
 
-/// Keeps what is written; takes no more than its limit.
-class ByteSink : public OutStream
-{
-public:
-    explicit ByteSink(u64 limit = std::numeric_limits<u64>::max()) : m_limit(limit) {}
-    u64 WriteBlock(void const* from, u64 count) override
-    {
-        ++writes;
-        u64 const part = std::min(count, m_limit - bytes.size());
-        u8 const* const p = static_cast<u8 const*>(from);
-        bytes.insert(bytes.end(), p, p + part);
-        return part;
-    }
-    u64 GetSizeOutStream() const override { return bytes.size(); }
-    u64 TellOutStream() const override { return bytes.size(); }
-    std::string GetText() const { return std::string(bytes.begin(), bytes.end()); }
-
-    Bytes bytes;
-    int writes = 0;
-
-private:
-    u64 const m_limit;
-};
-
-/// Gives bytes in pieces of at most @p piece. A broken one stops before its end, as after a read error.
-class ByteSource : public InStream
-{
-public:
-    explicit ByteSource(Bytes bytes, u64 piece = std::numeric_limits<u64>::max(), bool broken = false)
-        : m_bytes(std::move(bytes)), m_piece(piece), m_broken(broken)
-    {
-    }
-    u64 ReadBlock(void* to, u64 count) override
-    {
-        u64 const part = std::min({count, m_piece, m_bytes.size() - m_position});
-        std::copy_n(m_bytes.data() + m_position, part, static_cast<u8*>(to));
-        m_position += part;
-        return part;
-    }
-    bool SkipBlock(u64) override { return false; }
-    u64 GetSizeInStream() const override { return m_bytes.size() + (m_broken ? 1 : 0); }
-    u64 TellInStream() const override { return m_position; }
-
-private:
-    Bytes const m_bytes;
-    u64 const m_piece;
-    bool const m_broken;
-    u64 m_position = 0;
-};
+using Test::ByteSink;
 
 /// Smooth with a little noise, as pixels are, so that both back ends have something to do.
 inline Bytes MakePixels(u64 size, u32 seed)

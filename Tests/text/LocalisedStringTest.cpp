@@ -21,11 +21,11 @@ using KernelTest::Show;
 /// The properties that @p save writes, read back.
 Counted<InSerialiserFile> Parsed(SaveFunction const& save)
 {
-    auto const stream = MakeCounted<KernelTest::BytesOutStream>();
+    auto const stream = MakeCounted<PlainTarget>();
     OutSerialiserFile out(*stream, IDTag("Test"), 1);
     save(out);
     out.Close();
-    auto const in = MakeCounted<MemoryInStream>(stream->m_bytes.data(), stream->m_bytes.size(), true);
+    auto const in = MakeCounted<MemoryInStream>(stream->bytes.data(), stream->bytes.size(), true);
     return InSerialiserFile::ParseWithChecks(*in);
 }
 

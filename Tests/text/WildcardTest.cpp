@@ -187,13 +187,13 @@ TEST_F(WildcardTest, ChildWriterAsksItsParentAndKeepsTheAnswer)
 
 TEST_F(WildcardTest, StreamTargetTellsOfAShortWrite)
 {
-    auto const stream = MakeCounted<KernelTest::BytesOutStream>(4);
+    auto const stream = MakeCounted<PlainTarget>(4);
     WildcardTargetStream target(*stream);
     target.WriteString("abc");
     EXPECT_FALSE(target.HasFailed());
     target.WriteString("de");
     EXPECT_TRUE(target.HasFailed());
-    EXPECT_EQ(stream->m_bytes, "abcd");
+    EXPECT_EQ(stream->bytes, "abcd");
 }
 
 TEST_F(WildcardTest, ManyThreadsReadOneDictionaryAndSequence)
