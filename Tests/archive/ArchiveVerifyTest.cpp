@@ -87,6 +87,30 @@ private:
     u64 const m_at;
 };
 
+/// Writes the table at @p at anew at @p to, as the oldest versions did: 8 bytes a record shorter, and with a FileEnd
+/// that nobody holds against its length. So there is room for a record and a path count more.
+void MakeOlder(Bytes& bytes, u64 at, u64 to, Bytes const& record = {}, Bytes const& pathCount = {})
+{
+    TableView const table(bytes, at);
+    Bytes older = "#FAT" + bytes.substr(at + 4, 55);
+    for (u64 i = 0; i < table.GetRecordCount(); ++i) {
+        Bytes one = bytes.substr(table.GetRecord(i), table.GetRecord(i + 1) - table.GetRecord(i));
+        older += one.size() < 42 ? one : one.erase(34, 8);
+    }
+    u64 const counts = table.GetPathCount();
+    older += record + bytes.substr(counts, at + 59 + Read(bytes, at + 52, 4) - counts) + pathCount;
+    Put(older, 44, table.GetRecordCount() + !record.empty(), 4);
+    Put(older, 52, older.size() - 59, 4);
+    Put(older, 56, Read(older, 56, 2) + !pathCount.empty(), 2);
+    bytes.replace(to, older.size(), older);
+}
+
+/// A table of nothing.
+void PutEmptyTable(Bytes& bytes, u64 at)
+{
+    bytes.replace(at, 59, "#FAT" + Bytes(55, '\0'));
+}
+
 class Spoiler : public FileStorePostSaveInterface
 {
 public:
@@ -97,7 +121,7 @@ private:
     std::function<void()> const m_spoil;
 };
 
-constexpr u32 c_uidA = 1, c_uidB = 2, c_uidTilde = 4, c_uidGap = 7;
+constexpr u32 c_uidA = 1, c_uidB = 2, c_uidTilde = 4, c_uidC = 6, c_uidGap = 7;
 
 class ArchiveVerifyTest : public DocumentTest
 {
@@ -183,6 +207,7 @@ struct SpoiledField
 {
     int code;
     std::function<void(Bytes&)> spoil;
+    std::function<void(Bytes&)> prepare = nullptr; ///< Changes the document before it is opened.
 };
 
 /// Changes of the info block and header, which both tables share: the check that each sets off, from @p first on.
@@ -243,7 +268,7 @@ TEST_F(ArchiveVerifyTest, EachFieldOfTheMasterThatDiffersIsNamed)
              Put(b, record, c_uidGap, 4);
              b[record + 44] = '\x7F';
          }},
-        {27, [&](Bytes& b) { b[view(b, 6).FindRecord(6) + 44] = 'd'; }},
+        {27, [&](Bytes& b) { b[view(b, 6).FindRecord(c_uidC) + 44] = 'd'; }},
         {28, [&](Bytes& b) { Put(b, view(b, 7).FindRecord(c_uidB), c_uidGap, 4); }},
         {29,
          [&](Bytes& b) {
@@ -259,9 +284,27 @@ TEST_F(ArchiveVerifyTest, EachFieldOfTheMasterThatDiffersIsNamed)
         {34, [&](Bytes& b) { Put(b, view(b, 2).GetPosition() + 4, view(b, 4).GetPosition(), 8); }},
         {38, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 12, 8); }},
         {39, [&](Bytes& b) { b[view(b, 6).GetPosition() + 58] = 2; }},
+        {40,
+         [&](Bytes& b) {
+             u64 const oldest = view(b, 7).GetPosition();
+             MakeOlder(b, oldest, oldest + 4);
+             Put(b, view(b, 6).GetPosition() + 4, oldest + 4, 8);
+         }},
+        {41,
+         [&](Bytes& b) {
+             u64 const oldest = view(b, 7).GetPosition();
+             MakeOlder(b, oldest, oldest);
+             Raise(b, oldest + 20, 8);
+         }},
         {42, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 28, 8); }},
         {43, [&](Bytes& b) { Raise(b, view(b, 7).GetPosition() + 36, 8); }},
         {44, [&](Bytes& b) { view(b, 1).GiveToUserData(44, 4, 5); }},
+        // Two files claim one path, and the older one goes.
+        {45,
+         [&](Bytes& b) {
+             for (int n : {1, 2, 4, 6, 7}) Put(b, view(b, n).FindRecord(c_uidB), c_uidGap, 4);
+         },
+         [&](Bytes& b) { b[view(b, 5).FindRecord(c_uidC) + 44] = 'b'; }},
         {46, [&](Bytes& b) { Put(b, view(b, 2).FindRecord(c_uidB), c_uidA, 4); }},
         // Known by its path from an earlier revision, and the only record of its own.
         {52,
@@ -275,6 +318,7 @@ TEST_F(ArchiveVerifyTest, EachFieldOfTheMasterThatDiffersIsNamed)
     for (SpoiledField const& c : cases) {
         SCOPED_TRACE(c.code);
         WriteWhole(m_path, original);
+        if (c.prepare) SpoilFile(m_path, c.prepare);
         Counted<Archive> const archive = OpenDocument(m_path);
         Archive::VerifyResult const result = SaveAndSpoil(*archive, false, m_path, c.spoil);
         EXPECT_EQ(result, c.code == 0 ? Archive::VerifyMatch : Archive::VerifyMismatch);
@@ -288,9 +332,10 @@ TEST_F(ArchiveVerifyTest, EachFieldOfTheScratchFileThatDiffersIsNamed)
     {
         Counted<Archive> const archive = CreateDocument(m_path);
         ASSERT_TRUE(Save(*archive, {{"a", "1"}}));
+        ASSERT_TRUE(Save(*archive, {{"a", "2"}}));
         Archive::CreateResult created;
         ASSERT_TRUE(archive->AddScratchFile(Str(m_scratchPath), created));
-        ASSERT_TRUE(Save(*archive, {{"a", "2"}}, true));
+        ASSERT_TRUE(Save(*archive, {{"a", std::string(59, '3')}}, true));
     }
     Bytes const master = ReadWhole(m_path);
     Bytes const scratch = ReadWhole(m_scratchPath);
@@ -300,6 +345,16 @@ TEST_F(ArchiveVerifyTest, EachFieldOfTheScratchFileThatDiffersIsNamed)
         {2, [](Bytes& b) { b[86] ^= 1; }},
         {7, [](Bytes& b) { Put(b, 16, TableView::FromNewest(b, 1).GetPosition(), 8); }},
         {12, HideThumbnails},
+        // As many revisions as there were, but one more of them in the scratch file.
+        {37,
+         [&](Bytes& b) {
+             u64 const oldest = TableView::FromNewest(b, 1).GetPosition();
+             PutEmptyTable(b, oldest - 63);
+             Put(b, oldest + 4, oldest - 63, 8);
+             SpoilFile(m_path, [](Bytes& m) {
+                 MakeOlder(m, TableView::FromNewest(m, 1).GetPosition(), TableView::FromNewest(m, 0).GetPosition());
+             });
+         }},
     };
     Append(cases, FileFields(7));
     for (SpoiledField const& c : cases) {
@@ -334,16 +389,48 @@ TEST_F(ArchiveVerifyTest, EachFieldOfAStreamlinedFileThatDiffersIsNamedAndTheMas
         {104, [](Bytes& b) { Put(b, 16, 0, 8); }},
         {109, HideThumbnails},
         {113, [&](Bytes& b) { b[table(b).FindRecord(c_uidTilde) + 44] = 'a'; }},
+        {114,
+         [&](Bytes& b) {
+             Bytes const record = TestSupport::Little(c_uidGap, 4) + Bytes(30, '\0') + Bytes("\1\0\x7F", 3);
+             MakeOlder(b, table(b).GetPosition(), table(b).GetPosition(), record);
+         }},
         {115, [&](Bytes& b) { b[table(b).FindRecord(c_uidB) + 44] = 'B'; }},
         {116, [&](Bytes& b) { Put(b, table(b).FindRecord(c_uidB), c_uidGap, 4); }},
         {117, [&](Bytes& b) { table(b).GiveToUserData(56, 2, 16); }},
+        {118,
+         [&](Bytes& b) {
+             Bytes const count = Bytes("\1\0\0\0", 4) + TestSupport::Little(1, 8) + "z";
+             MakeOlder(b, table(b).GetPosition(), table(b).GetPosition(), {}, count);
+         }},
         {119, [&](Bytes& b) { b[table(b).GetPosition() + 58] = 1; }},
         {120, [&](Bytes& b) { b[table(b).GetPathCount() + 12] = 'q'; }},
         {121, [&](Bytes& b) { Raise(b, table(b).GetPathCount() + 4, 8); }},
+        {122,
+         [&](Bytes& b) {
+             PutEmptyTable(b, 72);
+             Put(b, table(b).GetPosition() + 4, 72, 8);
+         }},
         {126, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 12, 8); }},
         {127, [&](Bytes& b) { b[table(b).GetPosition() + 58] = 0; }},
+        {129,
+         [&](Bytes& b) {
+             MakeOlder(b, table(b).GetPosition(), table(b).GetPosition());
+             Raise(b, table(b).GetPosition() + 20, 8);
+         }},
         {130, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 28, 8); }},
         {131, [&](Bytes& b) { Raise(b, table(b).GetPosition() + 36, 8); }},
+        {132,
+         [&](Bytes& b) {
+             Bytes const deletion = TestSupport::Little(c_uidGap, 4) + "\2";
+             MakeOlder(b, table(b).GetPosition(), table(b).GetPosition(), deletion);
+         }},
+        // Of two records for one file the last one counts.
+        {140,
+         [&](Bytes& b) {
+             Bytes const changed =
+                 TestSupport::Little(c_uidA, 4) + "\1" + b.substr(table(b).FindRecord(c_uidA) + 5, 29);
+             MakeOlder(b, table(b).GetPosition(), table(b).GetPosition(), changed);
+         }},
     };
     Append(cases, FileFields(104));
     Append(cases, DetailFields(135, 0, c_uidB));
@@ -377,6 +464,60 @@ TEST_F(ArchiveVerifyTest, EachFieldOfAStreamlinedFileThatDiffersIsNamedAndTheMas
             EXPECT_EQ(Get(*archive, "b"), "7");
             Clear();
         }
+    }
+}
+
+// The file is what was written; here the archive goes back a revision meanwhile, and shows something else.
+TEST_F(ArchiveVerifyTest, StreamlinedFileIsHeldAgainstWhatTheArchiveShows)
+{
+    using Hint = FileStoreCompressionHintGeneral;
+    auto const hint = [](Hint::CompressionLevel level, CompressionPredictorType type) {
+        return MakeCounted<Hint>(level, type, CompressionPredictorStripingType::None);
+    };
+    auto const plain = hint(Hint::CompressionLevelMin, CompressionPredictorType::None);
+    struct Version
+    {
+        char const* bytes; ///< Null where the file is not there.
+        Counted<FileStoreCompressionHint> hint = nullptr;
+    };
+    struct
+    {
+        int code;
+        std::vector<Version> versions;
+    } const cases[] = {
+        {141, {{"1"}, {nullptr}, {"1"}}},
+        {142, {{"1"}, {nullptr}}},
+        {145, {{"1"}, {"22"}}},
+        {146, {{"1"}, {"1", plain}}},
+        {147, {{"1"}, {"2"}}},
+        {148, {{"1", plain}, {"1", hint(Hint::CompressionLevelMin, CompressionPredictorType::UnsignedChar)}}},
+        {150, {{nullptr}, {"1"}}},
+        {151, {{"1", plain}, {"1", hint(Hint::CompressionLevelMax, CompressionPredictorType::None)}}},
+    };
+    for (auto const& c : cases) {
+        SCOPED_TRACE(c.code);
+        std::filesystem::remove(m_path);
+        Counted<Archive> const archive = CreateDocument(m_path);
+        ASSERT_TRUE(Save(*archive, {{"other", "1"}}));
+        for (Version const& version : c.versions) {
+            ASSERT_TRUE(InSession(*archive, [&](ArchiveSession& session) {
+                session.CreateFile(Str("other"), MakeCounted<BytesItem>("1"));
+                if (version.bytes) session.CreateFile(Str("b"), MakeCounted<BytesItem>(version.bytes), version.hint);
+                if (!version.bytes) session.DeleteFile(Str("b"));
+            }));
+        }
+        TestSupport::FaultyFiles files;
+        bool done = false;
+        files.SetObserver([&](TestSupport::FileCall call, std::string const& path) {
+            if (call != TestSupport::FileCall::Flush || path.find("~tmp") == path.npos || done) return;
+            done = true;
+            archive->RewindWorkingRevision();
+        });
+        EXPECT_EQ(archive->StreamlineAndVerifyFileState(m_report, nullptr, nullptr, nullptr),
+                  Archive::StreamlineNotVerified);
+        EXPECT_EQ(Code(), c.code);
+        EXPECT_NE(Log().find(": b\n"), std::string::npos) << Log();
+        Clear();
     }
 }
 
