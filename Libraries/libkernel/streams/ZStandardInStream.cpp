@@ -19,13 +19,17 @@ namespace {
 // that lies whole in one call and fits the output is not asked for its window. What a stream gives would then depend on
 // how its bytes arrive and are asked for. In pieces too small to hold a magic number a header has one outcome only.
 constexpr u64 c_headerPiece = 3;
-constexpr u64 c_longestHeader = 18; // Magic number, descriptor, window, dictionary, content size: 4 + 1 + 1 + 4 + 8.
-constexpr u64 c_atFrameStart = ~u64(0);
+
+// Magic number and descriptor, which says how long the header is; at most window, dictionary and content size follow.
+constexpr u64 c_shortestHeader = 4 + 1;
+constexpr u64 c_longestHeader = c_shortestHeader + 1 + 4 + 8;
+static_assert(sizeof(ZStandardFrame::header) == c_longestHeader);
 
 struct FrameHeader
 {
     u64 size;
-    u64 window; // With a single segment that is the content size.
+    u64 content; // All ones if the header does not say.
+    u64 window;
 };
 
 // Of the c_longestHeader bytes at @p at, whatever their magic number.
@@ -34,33 +38,37 @@ FrameHeader DecodeHeader(u8 const* at)
     static constexpr u8 c_dictionarySizes[] = {0, 1, 2, 4};
     static constexpr u8 c_contentSizes[] = {0, 2, 4, 8};
     u8 const descriptor = at[4];
-    bool const isSingle = (descriptor & 0x20) != 0;
+    bool const isSingle = (descriptor & 0x20) != 0; // Then there is no window byte: the content is the window.
     u64 const contentSize = isSingle && descriptor < 0x40 ? 1 : c_contentSizes[descriptor >> 6];
-    u64 const contentAt = (isSingle ? 5 : 6) + c_dictionarySizes[descriptor & 3];
-    u64 window = (u64(8) + (at[5] & 7)) << (7 + (at[5] >> 3));
-    if (isSingle) {
-        u8 content[8] = {};
-        std::memcpy(content, at + contentAt, contentSize);
-        window = LoadLittleEndian<u64>(content) + (contentSize == 2 ? 256 : 0);
-    }
-    return {contentAt + contentSize, window};
+    u64 const contentAt = c_shortestHeader + (isSingle ? 0 : 1) + c_dictionarySizes[descriptor & 3];
+    u8 bytes[8] = {};
+    std::memcpy(bytes, at + contentAt, contentSize);
+    FrameHeader header;
+    header.size = contentAt + contentSize;
+    header.content = contentSize ? LoadLittleEndian<u64>(bytes) + (contentSize == 2 ? 256 : 0) : ~u64(0);
+    header.window = isSingle ? header.content : (u64(8) + (at[5] & 7)) << (7 + (at[5] >> 3));
+    return header;
 }
 
-// One step. @p headerLeft counts the bytes of the frame's header that are still to come.
-ZSTD_ErrorCode DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, u64& headerLeft)
+// One step. More than the frame says that it holds is damage, which the library below finds only where it has no larger
+// block at hand from before.
+ZSTD_ErrorCode DecompressStep(ZSTD_DCtx* context, ZSTD_outBuffer& output, ZSTD_inBuffer& input, ZStandardFrame& frame)
 {
-    size_t const before = input.pos, size = input.size;
-    u8 const* const at = static_cast<u8 const*>(input.src) + before;
-    if (headerLeft == c_atFrameStart && size != before)
-        headerLeft = size - before >= c_longestHeader ? DecodeHeader(at).size : c_longestHeader;
-    if (headerLeft != 0) input.size = before + std::min({size - before, headerLeft, c_headerPiece});
+    size_t const inputBefore = input.pos, outputBefore = output.pos, size = input.size;
+    u64 const headerLeft =
+        (frame.headerTaken < c_shortestHeader ? c_shortestHeader : DecodeHeader(frame.header).size) - frame.headerTaken;
+    if (headerLeft != 0) input.size = inputBefore + std::min({size - inputBefore, headerLeft, c_headerPiece});
     size_t const result = ZSTD_decompressStream(context, &output, &input);
     input.size = size;
-    if (result == 0)
-        headerLeft = c_atFrameStart; // Behind a frame.
-    else if (headerLeft != c_atFrameStart)
-        headerLeft -= std::min(headerLeft, input.pos - before);
-    return ZSTD_getErrorCode(result);
+    if (headerLeft != 0 && input.pos > inputBefore) {
+        u64 const taken = input.pos - inputBefore;
+        std::memcpy(frame.header + frame.headerTaken, static_cast<u8 const*>(input.src) + inputBefore, taken);
+        frame.headerTaken += taken;
+    }
+    frame.delivered += output.pos - outputBefore;
+    bool const isTooMuch = frame.delivered != 0 && frame.delivered > DecodeHeader(frame.header).content;
+    if (result == 0) frame = ZStandardFrame(); // Behind a frame.
+    return isTooMuch ? ZSTD_error_corruption_detected : ZSTD_getErrorCode(result);
 }
 
 // True if the bytes are one frame that a stream would take. What follows a header that is cut counts as zeros.
@@ -78,7 +86,7 @@ bool IsOneFrame(void const* from, u64 size)
 
 ZStandardInStream::ZStandardInStream(Counted<InStream> source, CompressionPredictorType type,
                                      CompressionPredictorStripingType striping, bool throwOnError)
-    : CompressionInStream(std::move(source), type, striping, throwOnError), m_headerLeft(c_atFrameStart)
+    : CompressionInStream(std::move(source), type, striping, throwOnError)
 {
 }
 
@@ -106,7 +114,7 @@ bool ZStandardInStream::DecompressFromBuffer(void* to, u64 count, u64& delivered
 {
     ZSTD_inBuffer input{GetInput(), GetInputLeft(), 0};
     ZSTD_outBuffer output{to, count, 0};
-    ZSTD_ErrorCode const error = DecompressStep(m_context, output, input, m_headerLeft);
+    ZSTD_ErrorCode const error = DecompressStep(m_context, output, input, m_frame);
     if (error == ZSTD_error_memory_allocation) SetLacksMemory();
     bool const good = error == ZSTD_error_no_error;
     UseInput(input.pos);
@@ -127,10 +135,10 @@ bool DecompressBeginning(ZSTD_DCtx* context, void const* from, u64 fromSize, voi
     ZSTD_DCtx_reset(context, ZSTD_reset_session_only);
     ZSTD_inBuffer input{from, fromSize, 0};
     ZSTD_outBuffer output{to, size, 0};
-    u64 headerLeft = c_atFrameStart;
+    ZStandardFrame frame;
     while (output.pos < size) {
         size_t const inputBefore = input.pos, outputBefore = output.pos;
-        if (DecompressStep(context, output, input, headerLeft) != ZSTD_error_no_error) return false;
+        if (DecompressStep(context, output, input, frame) != ZSTD_error_no_error) return false;
         if (input.pos == inputBefore && output.pos == outputBefore) return false;
     }
     return true;

@@ -6,6 +6,14 @@ struct ZSTD_DCtx_s;
 
 namespace Kernel {
 
+/// Where the decompressor stands in a frame. For ZStandardInStream alone.
+struct ZStandardFrame
+{
+    u8 header[18] = {}; // As far as it was taken, then zeros.
+    u64 headerTaken = 0;
+    u64 delivered = 0;
+};
+
 /// Decompresses Zstandard frames, RFC 8878, one behind the other. A frame that asks for a window above 2^27 bytes
 /// counts as damaged, and so does one of the formats from before that standard.
 class KERNEL_API ZStandardInStream : public CompressionInStream
@@ -25,7 +33,7 @@ private:
     bool Init();
 
     ZSTD_DCtx_s* m_context = nullptr;
-    u64 m_headerLeft; // Bytes of the frame's header that are still to come.
+    ZStandardFrame m_frame;
 };
 
 /// Decompresses a block that lies whole in memory straight to @p to, as a ZStandardInStream would give its first
