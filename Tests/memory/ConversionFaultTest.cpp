@@ -277,6 +277,7 @@ TEST(ConversionFaultTest, MemoryRefusedGivesTheWholeResultOrNone)
             EXPECT_TRUE(isNamed) << result.substr(0, 80);
             long const before = GetLiveBlocks();
             EXPECT_EQ(RunWork(work, in, RefusedStep::c_noStep), whole);
+            RunWork(work, in, RefusedStep::c_noStep);
             RunWork(work, in, step);
             EXPECT_LT(GetLiveBlocks() - before, 2) << "blocks of memory lost";
             if (HasFailure()) break;

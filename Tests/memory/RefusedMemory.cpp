@@ -139,6 +139,12 @@ try {
 } catch (std::bad_alloc const&) {
     return nullptr;
 }
+void* operator new(size_t size, std::align_val_t alignment, std::nothrow_t const&) noexcept
+try {
+    return Allocate(size, static_cast<size_t>(alignment));
+} catch (std::bad_alloc const&) {
+    return nullptr;
+}
 void operator delete(void* block) noexcept
 {
     Free(block);

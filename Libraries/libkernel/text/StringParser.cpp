@@ -24,7 +24,7 @@ bool Parse(String8 const& text, Counted<Locale const> const& locale, icu::Format
 
 bool StringParser::ParseAsDouble(String8 const& text, Counted<Locale const> const& locale, double& value)
 {
-    icu::Formattable number{icu::UnicodeString()}; // No number, should ICU leave it alone and report nothing.
+    icu::Formattable number(0, icu::Formattable::kIsDate); // No number, should ICU leave it alone and report nothing.
     if (!Parse(text, locale, number)) return false;
     UErrorCode status = U_ZERO_ERROR;
     double const result = number.getDouble(status);
@@ -34,7 +34,7 @@ bool StringParser::ParseAsDouble(String8 const& text, Counted<Locale const> cons
 
 bool StringParser::ParseAsLong(String8 const& text, Counted<Locale const> const& locale, long& value)
 {
-    icu::Formattable number{icu::UnicodeString()};
+    icu::Formattable number(0, icu::Formattable::kIsDate);
     if (!Parse(text, locale, number)) return false;
     UErrorCode status = U_ZERO_ERROR;
     long const result = number.getLong(status);
