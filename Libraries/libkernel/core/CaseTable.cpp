@@ -61,6 +61,25 @@ void ThrowIfOutOfMemory(UErrorCode error)
     if (error == U_MEMORY_ALLOCATION_ERROR) throw std::bad_alloc();
 }
 
+// Asked one by one, where there may be any. ICU has a set of them all, but makes that once for the process, and where
+// it lacks the memory the set stays empty.
+std::vector<u32> CodePointsWithCase()
+{
+    constexpr u32 kinds = U_GC_LC_MASK | U_GC_LM_MASK | U_GC_M_MASK | U_GC_NL_MASK | U_GC_SO_MASK;
+    std::vector<u32> all;
+    all.reserve(4096); // More than there are, since nothing ought to be thrown through ICU.
+    std::vector<u32>* const list = &all;
+    u_enumCharTypes(
+        [](void const* context, UChar32 first, UChar32 end, UCharCategory kind) -> UBool {
+            auto& codePoints = **static_cast<std::vector<u32>* const*>(context);
+            for (UChar32 c = first; (U_MASK(kind) & kinds) != 0 && c < end; ++c)
+                if (u_hasBinaryProperty(c, UCHAR_CASE_SENSITIVE)) codePoints.push_back(static_cast<u32>(c));
+            return true;
+        },
+        &list);
+    return all;
+}
+
 } // namespace
 
 CaseTable const& CaseTable::Get(Operation operation, char const* locale)
@@ -78,9 +97,8 @@ CaseTable const& CaseTable::Get(Operation operation, char const* locale)
 
 CaseTable::CaseTable(Operation operation, char const* language) : m_entries(c_block)
 {
-    for (u32 codePoint = 0; codePoint < c_end; ++codePoint) {
-        // Asked one by one: the set of them all is made once for the process, and stays empty if that fails.
-        if (!u_hasBinaryProperty(static_cast<UChar32>(codePoint), UCHAR_CASE_SENSITIVE)) continue;
+    for (u32 const codePoint : CodePointsWithCase()) {
+        if (codePoint >= c_end) break;
         UChar from[2];
         i32 fromLength = 0;
         U16_APPEND_UNSAFE(from, fromLength, codePoint);
