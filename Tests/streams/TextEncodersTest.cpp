@@ -9,8 +9,8 @@ namespace Kernel {
 namespace {
 
 using namespace std::string_literals;
-using Testing::Bytes;
 using Test::PlainTarget;
+using Testing::Bytes;
 
 TEST(Base64Test, TextsEncodeAsPublishedAndDecodingSkipsWhatIsOutside)
 {
