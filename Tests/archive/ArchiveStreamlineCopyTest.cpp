@@ -1,5 +1,6 @@
 #include "archive/ArchiveStreamlineFixture.h"
 #include "libkernel/streams/MemoryStreams.h"
+#include "support/ArchiveBuilder.h"
 
 // Compact copies elsewhere: to a stream, to memory, to a file in which the archive goes on.
 
@@ -52,6 +53,39 @@ TEST_F(ArchiveStreamlineCopyTest, CopiesToStreamsAndMemoryOpenLikeTheDocument)
     handle.Release();
     AddScratch();
     EXPECT_FALSE(m_archive->ExtractToRawData());
+}
+
+// A file is copied as it stands only if a reader of the copy finds in it what the archive shows.
+TEST_F(ArchiveStreamlineCopyTest, FileThatSaysOtherwiseThanTheArchiveIsNotCopiedAsItStands)
+{
+    struct Case
+    {
+        char const* what;
+        std::string info; ///< Over the info block's beginning.
+        bool hasOtherWriter;
+    };
+    for (Case const& c :
+         {Case{"no info block", "xxxx", false}, Case{"torn info block", "#Inf" + TestSupport::Little(80, 8), false},
+          Case{"saved by another", "#Inf", true}})
+    {
+        SCOPED_TRACE(c.what);
+        ASSERT_TRUE(Save(*CreateDocument(m_path), {{"a", "1"}, {"b", "2"}}));
+        WriteWhole(m_path, ReadWhole(m_path).replace(12, c.info.size(), c.info));
+        Archive::OpenResult result{};
+        m_archive = Archive::RecoverArchive(Str(m_path), Archive::OpenModeReadWrite, c_documentTag, result);
+        ASSERT_TRUE(m_archive);
+        m_archive->SetKeepOpen(false);
+        if (c.hasOtherWriter) {
+            ASSERT_TRUE(Save(*OpenDocument(m_path), {{"c", "3"}}));
+        }
+        auto const out = MakeCounted<MemoryInOutStream>();
+        ASSERT_EQ(m_archive->StreamlineToOutStream(*out), Archive::StreamlineDone);
+        WriteWhole(m_folder / "copy", TextOf(*out));
+        EXPECT_EQ(GetAll(*OpenDocument(m_folder / "copy")), (Items{{"a", "1"}, {"b", "2"}}));
+        EXPECT_EQ(static_cast<bool>(m_archive->ExtractToRawData()), !c.hasOtherWriter);
+        m_archive = nullptr;
+        std::filesystem::remove(m_path);
+    }
 }
 
 TEST_F(ArchiveStreamlineCopyTest, TargetThatFillsUpIsToldApart)

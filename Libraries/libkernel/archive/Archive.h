@@ -515,7 +515,7 @@ public:
     /// These are given in @p lost, by path; all others read with a good CRC from the copy. Reads every block twice.
     StreamlineResult SalvageToNew(String8 const& path, std::vector<LostFile>& lost) const;
     /// Writes a compact copy, front to back, without thumbnails. An archive that needs no streamlining is copied as it
-    /// stands up to its end.
+    /// stands up to its end, if its file says what the archive shows.
     StreamlineResult StreamlineToOutStream(OutStream& out) const;
     StreamlineResult StreamlineToFragmentedRawData(FragmentedRawData& data) const;
     /// Writes a compact copy to @p path and goes on with that as master. The old file stays on disk and is no longer
@@ -527,7 +527,7 @@ public:
     /// this before it trusts such a master.
     static bool IsMidStreamlineFile(String8 const& path);
     /// The archive's one file up to its end, byte for byte. Null when there are two, during a session, and when the
-    /// file cannot be read.
+    /// file cannot be read or somebody else has saved into it.
     Counted<RawData> ExtractToRawData() const;
     bool IsDoingStreamline() const;
     /// Off by default. On: Streamline always overwrites the master and never moves a file over it.

@@ -216,6 +216,11 @@ bool ArchiveImpl::HasHeldInfo(Archive::ArchiveFile& file) const
     }
 }
 
+bool ArchiveImpl::ShowsItself(Archive::ArchiveFile& file) const
+{
+    return !file.m_infoDamaged && file.m_rawInfo.firstFAT == file.m_firstFAT && HasHeldInfo(file);
+}
+
 // The guard is tried a second time on a fresh handle: on a network volume the first one may simply have been lost.
 bool ArchiveImpl::OpenForSession(Archive::ArchiveFile& file)
 {

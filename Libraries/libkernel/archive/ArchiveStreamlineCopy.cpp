@@ -210,7 +210,7 @@ Result ArchiveStreamliner::StreamlineToOutStream(OutStream& out)
             if (!headInScratch && m_impl.m_rewindCount == 0) master = m_impl.m_master;
             if (master) size = master->m_fileEnd;
         }
-        if (master && !RequiresStreamliningCS()) {
+        if (master && m_impl.ShowsItself(*master) && !RequiresStreamliningCS()) {
             Counted<FileInOutStream> const stream = master->GetStream();
             try {
                 return stream && CopyPieces(*stream, size, out) ? Archive::StreamlineDone : Archive::StreamlineFailed;
@@ -238,6 +238,8 @@ Counted<RawData> Archive::ExtractToRawData() const
     }
     ArchiveAccessScope const access(*m);
     if (!file || !access.IsOpen()) return nullptr;
+    // What somebody else has saved meanwhile lies behind the end that is known here.
+    if (!m->HasHeldInfo(*file)) return nullptr;
     Counted<FileInOutStream> const stream = file->GetStream();
     try {
         if (!stream || size > stream->GetSizeInStream()) return nullptr;

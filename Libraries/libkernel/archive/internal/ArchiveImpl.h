@@ -336,6 +336,8 @@ struct ArchiveImpl
     bool OpenForSession(Archive::ArchiveFile& file);
     /// The info block on disk is the one this archive read or wrote last.
     bool HasHeldInfo(Archive::ArchiveFile& file) const;
+    /// And it leads to the tables that the archive holds: not where these had to be recovered.
+    bool ShowsItself(Archive::ArchiveFile& file) const;
     /// Compares the guard with what this archive left there, and steps it.
     enum class GuardResult
     {
