@@ -549,6 +549,14 @@ TEST_F(ArchiveVerifyTest, SoundSavesMatchWhateverTheirKind)
             EXPECT_EQ(files.GetOpenHandles(), 0); // Closed between accesses, as was asked for.
         }
     }
+    // A count that counts nothing is none.
+    TestSupport::ArchiveBuilder zero;
+    zero.AddTable({.records = {{1, 0, "a", zero.AddBlock("old")}}, .pathCounts = {{"p", "s", 0}}});
+    WriteWhole(m_folder / "zero", zero.Build());
+    archive = OpenDocument(m_folder / "zero");
+    ASSERT_TRUE(Save(*archive, {{"a", "new"}}));
+    ASSERT_EQ(archive->Streamline(nullptr, nullptr, nullptr), Archive::StreamlineDone);
+    EXPECT_EQ(SaveAndSpoil(*archive, false, m_folder / "zero", [](Bytes&) {}), Archive::VerifyMatch) << Log();
     // A version 7 file has a block where later ones have their guard.
     TestSupport::ArchiveBuilder old(7);
     old.AddFile(1, "a", "old");

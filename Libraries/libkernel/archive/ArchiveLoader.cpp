@@ -350,6 +350,7 @@ Result ArchiveLoader::LoadBody(ArchiveTableCursor& cursor, FATHeader const& head
         u64 const counter = LoadLittleEndian<u64>(fixed + 4);
         u8 const* const text = cursor.Take(u64{prefixLength} + suffixLength);
         if (!text) return Archive::OpenCorrupt;
+        if (counter == 0) continue; // Counts nothing, and is not written again.
         char const* const chars = reinterpret_cast<char const*>(text);
         ArchivePathCount& count =
             data.pathCounts[{String8(chars, prefixLength), String8(chars + prefixLength, suffixLength)}];
