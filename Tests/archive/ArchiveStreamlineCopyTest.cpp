@@ -138,10 +138,13 @@ TEST_F(ArchiveStreamlineCopyTest, SwitchingGoesOnInTheNewFile)
         Items items = GetAll(*m_archive);
         std::string const before = ReadWhole(m_path);
         Counted<DelayLoadHolder> const holder = HolderOf(*m_archive, "b");
+        auto const history = RevisionsOf(*m_archive);
         ASSERT_EQ(c.asScratch ? m_archive->StreamlineAndSwitchAsScratch(Str(newPath))
                               : m_archive->StreamlineAndSwitch(Str(newPath)),
                   Archive::StreamlineDone);
         EXPECT_EQ(ReadWhole(m_path), before);
+        // The old files are free, whoever still looks at what they held.
+        EXPECT_EQ(ResultOfOpening(c.asScratch && c.hasScratch ? m_scratchPath : m_path), Archive::OpenOk);
         EXPECT_TRUE(holder->IsBackedBy(*m_archive));
         EXPECT_EQ(GetAll(*m_archive), items);
         EXPECT_EQ(m_archive->IsJustScratchFile(), c.asScratch);
@@ -163,7 +166,9 @@ TEST_F(ArchiveStreamlineCopyTest, ThrowAwayLeavesTheOldFilesAndTakesItsOwnWithIt
     ASSERT_TRUE(Save(*m_archive, {{"scratched", "1"}}, true));
     Items const items = GetAll(*m_archive);
     std::string const before = ReadWhole(m_path);
+    auto const history = RevisionsOf(*m_archive);
     ASSERT_EQ(m_archive->ConvertToThrowAway(), Archive::ConvertDone);
+    EXPECT_EQ(ResultOfOpening(m_scratchPath), Archive::OpenOk);
     EXPECT_TRUE(m_archive->IsThrowAway());
     EXPECT_FALSE(m_archive->HasScratchFile());
     ExpectCompact(*m_archive, items, 0);

@@ -148,11 +148,6 @@ Archive::ConvertToThrowAwayResult ArchiveStreamliner::ConvertToThrowAway()
             if (!ReleaseHolders(data)) return Archive::StreamlineFailed;
             {
                 CriticalSectionScope const lock(m_impl.m_accessLock);
-                {
-                    // A throw-away archive has one file.
-                    CriticalSectionScope const state(m_impl.m_stateLock);
-                    m_impl.m_scratch = nullptr;
-                }
                 Publish(file, data, false);
             }
             m_impl.m_self.UpdateDelayLoadOwners(m_impl.m_revisions.back().Get());

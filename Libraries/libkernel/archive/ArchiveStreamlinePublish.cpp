@@ -77,11 +77,13 @@ void ArchiveStreamliner::Publish(Counted<File> const& file, Archive::StreamlineD
             oldMaster->m_finalPath = String8();
         }
     }
-    if (asScratch) {
+    Counted<File> droppedScratch;
+    if (asScratch || file->m_throwAway) { // A throw-away archive has one file.
         CriticalSectionScope const lock(m_impl.m_stateLock);
         m_impl.m_scratch = nullptr;
+        std::swap(droppedScratch, oldScratch);
     } else if (oldScratch && !m_impl.ResetScratch(*file, m_impl.m_nextFreeUID)) {
-        oldScratch = nullptr;
+        std::swap(droppedScratch, oldScratch);
     }
     {
         CriticalSectionScope const lock(m_impl.m_stateLock);
@@ -107,9 +109,12 @@ void ArchiveStreamliner::Publish(Counted<File> const& file, Archive::StreamlineD
         if (asScratch) m_impl.m_scratch = file;
     }
     if (m_master) m_master = file;
-    if (!oldMaster) return;
-    CriticalSectionScope const lock(oldMaster->m_lock);
-    oldMaster->m_stream = nullptr;
+    // Whoever holds an old revision keeps the object, but the file on disk is free.
+    for (Counted<File> const& old : {oldMaster, droppedScratch}) {
+        if (!old) continue;
+        CriticalSectionScope const lock(old->m_lock);
+        old->m_stream = nullptr;
+    }
 }
 
 void ArchiveStreamliner::ClearTables()
