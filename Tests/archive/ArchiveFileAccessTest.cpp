@@ -204,6 +204,34 @@ TEST_F(ArchiveFileAccessTest, SuspendedArchiveLeavesItsFileAloneUntilItGoesOn)
     EXPECT_FALSE(Archive::CreateWithTemporary(Str(m_folder / "t"), c_documentTag, result)->Suspend());
 }
 
+// Or a question that whoever suspended it has would not be answered.
+TEST_F(ArchiveFileAccessTest, WhoWaitsForASuspendedArchiveHoldsNoLock)
+{
+    Counted<Archive> const archive = CreateDocument(m_path);
+    std::atomic<bool> stop{false};
+    std::thread saver([&] {
+        for (int n = 0; !stop; ++n) {
+            String8 report;
+            ArchiveSessionHandle handle;
+            ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
+            handle->CreateFile(Str("n"), MakeCounted<BytesItem>(std::to_string(n)));
+            ASSERT_EQ(archive->CloseSessionAndVerifyFileState(handle, report, false), Archive::VerifyMatch);
+        }
+    });
+    std::thread extractor([&] {
+        while (!stop) archive->ExtractToRawData();
+    });
+    for (int n = 0; n < 30; ++n) {
+        ASSERT_TRUE(archive->Suspend());
+        for (int look = 0; look < 20; ++look) std::this_thread::yield();
+        archive->RequiresStreamlining();
+        archive->Unsuspend();
+    }
+    stop = true;
+    saver.join();
+    extractor.join();
+}
+
 TEST_F(ArchiveFileAccessTest, ScratchFileMovesAndComesBack)
 {
     MakeDocument();

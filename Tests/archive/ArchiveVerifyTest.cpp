@@ -568,10 +568,12 @@ TEST_F(ArchiveVerifyTest, SoundSavesMatchWhateverTheirKind)
 TEST_F(ArchiveVerifyTest, FilesThatCannotBeReachedCannotBeChecked)
 {
     Counted<Archive> const archive = CreateDocument(m_path);
-    archive->SetKeepOpen(false);
     ArchiveSessionHandle handle;
     ASSERT_TRUE(archive->CreateSession(handle, Archive::SessionTypeFull, nullptr));
     handle->CreateFile(Str("a"), MakeCounted<BytesItem>("1"));
+    handle->SetThumbnails(MakeThumbnails("lost"));
+    TestSupport::FaultyFiles files;
+    files.Plan({.call = TestSupport::FileCall::Flush, .n = 3, .error = EIO}); // Theirs: the save stands.
     handle->AddPostSaveObject(MakeCounted<Spoiler>([&] { std::filesystem::rename(m_path, m_path + "2"); }));
     EXPECT_EQ(archive->CloseSessionAndVerifyFileState(handle, m_report, false), Archive::VerifyNotRun);
     EXPECT_TRUE(std::filesystem::is_empty(m_shunt));

@@ -248,15 +248,23 @@ bool ArchiveImpl::GuaranteeFileHandle()
 {
     for (;;) {
         WaitWhileSuspended();
-        CriticalSectionScope const lock(m_accessLock);
-        if (m_suspended) continue; // Again, between the wait and the lock.
-        ++m_accessCount;
-        bool reopened = false;
-        if (OpenFileHandleCS(reopened, false, false) == Archive::RestoreOk) return true;
-        --m_accessCount;
-        SignalSuspenderCS();
-        return false;
+        bool suspended = false; // Again, between the wait and the lock.
+        bool const isOpen = TryGuaranteeFileHandle(suspended);
+        if (!suspended) return isOpen;
     }
+}
+
+bool ArchiveImpl::TryGuaranteeFileHandle(bool& suspended)
+{
+    CriticalSectionScope const lock(m_accessLock);
+    suspended = m_suspended;
+    if (suspended) return false;
+    ++m_accessCount;
+    bool reopened = false;
+    if (OpenFileHandleCS(reopened, false, false) == Archive::RestoreOk) return true;
+    --m_accessCount;
+    SignalSuspenderCS();
+    return false;
 }
 
 void ArchiveImpl::DecrementAccessCount()

@@ -222,27 +222,31 @@ Result ArchiveStreamliner::StreamlineToOutStream(OutStream& out)
 
 Counted<RawData> Archive::ExtractToRawData() const
 {
-    CriticalSectionScope const sessionLock(m->m_sessionLock);
-    Counted<ArchiveFile> file;
-    u64 size = 0;
-    {
-        CriticalSectionScope const lock(m->m_stateLock);
-        if (m->m_activeSession || (m->m_master && m->m_scratch)) return nullptr;
-        file = m->m_master ? m->m_master : m->m_scratch;
-        if (file) size = file->m_fileEnd;
-    }
-    ArchiveAccessScope const access(*m);
-    if (!file || !access.IsOpen()) return nullptr;
-    // What somebody else has saved meanwhile lies behind the end that is known here.
-    if (!m->HasHeldInfo(*file)) return nullptr;
-    Counted<FileInOutStream> const stream = file->GetStream();
-    try {
-        if (!stream || size > stream->GetSizeInStream()) return nullptr;
-        auto data = MakeCounted<RawData>(size);
-        if (!data->GetData() || stream->ReadAt(0, data->GetData(), size) != size) return nullptr;
-        return data;
-    } catch (FileIOException const&) {
-        return nullptr;
+    for (;;) {
+        m->WaitWhileSuspended();
+        CriticalSectionScope const sessionLock(m->m_sessionLock);
+        Counted<ArchiveFile> file;
+        u64 size = 0;
+        {
+            CriticalSectionScope const lock(m->m_stateLock);
+            if (m->m_activeSession || (m->m_master && m->m_scratch)) return nullptr;
+            file = m->m_master ? m->m_master : m->m_scratch;
+            if (file) size = file->m_fileEnd;
+        }
+        bool suspended = false;
+        ArchiveAccessScope const access(*m, suspended);
+        if (suspended) continue; // Again, between the wait and the lock.
+        // What somebody else has saved meanwhile lies behind the end that is known here.
+        if (!file || !access.IsOpen() || !m->HasHeldInfo(*file)) return nullptr;
+        Counted<FileInOutStream> const stream = file->GetStream();
+        try {
+            if (!stream || size > stream->GetSizeInStream()) return nullptr;
+            auto data = MakeCounted<RawData>(size);
+            if (!data->GetData() || stream->ReadAt(0, data->GetData(), size) != size) return nullptr;
+            return data;
+        } catch (FileIOException const&) {
+            return nullptr;
+        }
     }
 }
 

@@ -412,7 +412,8 @@ Archive::ArchiveFile const* ArchiveVerifier::FileOf(Archive::Revision const& rev
 // No other thread changes the tables: the caller holds the session lock.
 Result ArchiveVerifier::VerifyFileState(ArchiveImpl& impl, String8& report)
 {
-    ArchiveAccessScope const access(impl);
+    bool suspended = false;
+    ArchiveAccessScope const access(impl, suspended);
     if (!access.IsOpen()) return Archive::VerifyNotRun;
     try {
         ArchiveComparison comparison;
@@ -528,6 +529,17 @@ void ArchiveVerifier::CompareWithHead(ArchiveImpl& impl, ArchiveLoadData const& 
 
 Result Archive::CloseSessionAndVerifyFileState(ArchiveSessionHandle& handle, String8& report, bool updateTimestamps)
 {
+    // Counted on to the end: a suspension that waits for the session would begin before the check.
+    struct Access
+    {
+        explicit Access(ArchiveImpl& i) : impl(i)
+        {
+            CriticalSectionScope const lock(impl.m_accessLock);
+            ++impl.m_accessCount;
+        }
+        ~Access() { impl.DecrementAccessCount(); }
+        ArchiveImpl& impl;
+    } const access(*m);
     CriticalSectionScope const sessionLock(m->m_sessionLock);
     CloseSession(handle, updateTimestamps);
     return ArchiveVerifier::VerifyFileState(*m, report);

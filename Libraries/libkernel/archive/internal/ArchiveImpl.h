@@ -242,6 +242,8 @@ struct ArchiveImpl
     void CloseFilesIfUnusedCS();
     /// Waits while suspended, counts one access and opens the handle. False, with nothing counted, if that fails.
     bool GuaranteeFileHandle();
+    /// The same for who holds a lock, with which nobody may wait: false, and that told, while suspended.
+    bool TryGuaranteeFileHandle(bool& suspended);
     void DecrementAccessCount();
     void WaitWhileSuspended();
     void SignalSuspenderCS();
@@ -359,6 +361,10 @@ class ArchiveAccessScope
 {
 public:
     explicit ArchiveAccessScope(ArchiveImpl& impl) : m_impl(impl), m_open(impl.GuaranteeFileHandle()) {}
+    ArchiveAccessScope(ArchiveImpl& impl, bool& suspended)
+        : m_impl(impl), m_open(impl.TryGuaranteeFileHandle(suspended))
+    {
+    }
     ArchiveAccessScope(ArchiveAccessScope const&) = delete;
     ArchiveAccessScope& operator=(ArchiveAccessScope const&) = delete;
     ~ArchiveAccessScope()
