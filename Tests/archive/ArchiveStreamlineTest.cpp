@@ -437,6 +437,23 @@ TEST_F(ArchiveStreamlineTest, AbortBeforeTheThumbnailsDoesNotLoseThem)
     EXPECT_EQ(Listing(), "doc ");
 }
 
+TEST_F(ArchiveStreamlineTest, ArchiveWhoseTablesWentWithAFailedSwapIsNotTakenForWell)
+{
+    Items const items = Make();
+    {
+        TestSupport::FaultyFiles files;
+        for (char const* name : {"~tmp", "~move"})
+            files.Plan({.call = TestSupport::FileCall::Rename, .forEver = true, .error = EIO, .path = name});
+        EXPECT_EQ(m_archive->Streamline(nullptr, nullptr, nullptr), Archive::StreamlineFailed);
+    }
+    EXPECT_TRUE(m_archive->IsEmpty());
+    EXPECT_EQ(m_archive->RecoverArchive(true), Archive::RestoreNotTheFile);
+    EXPECT_EQ(SessionResult(*m_archive), Archive::SessionFileBad);
+    m_archive = nullptr;
+    EXPECT_EQ(GetAll(*OpenDocument(m_path)), items);
+    EXPECT_EQ(Listing(), "doc ");
+}
+
 TEST_F(ArchiveStreamlineTest, BackupNameOfAHostThatIsInUseIsNotTaken)
 {
     for (std::string const& backup : {m_path, m_scratchPath, m_folder / "host.new"}) {

@@ -369,7 +369,8 @@ public:
     bool IsMainFileDead() const;
     RestoreResult GetLastRestoreResult() const;
     /// Forgets the failure for which the files could not be opened again, and opens them unless they are not kept open
-    /// and @p openAnyway is false. On success the files count as good again. Waits for a suspension to end.
+    /// and @p openAnyway is false. On success the files count as good again. Waits for a suspension to end. What a
+    /// streamline has left half way is not mended so: RestoreNotTheFile.
     RestoreResult RecoverArchive(bool openAnyway);
     /// Outside a session: reads the file's read-only attribute again; true if it changed.
     bool CheckForReadOnlyChange();

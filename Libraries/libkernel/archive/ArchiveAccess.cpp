@@ -282,6 +282,10 @@ Archive::RestoreResult Archive::RecoverArchive(bool openAnyway)
         m->WaitWhileSuspended();
         CriticalSectionScope const lock(m->m_accessLock);
         if (m->m_suspended) continue; // Again, between the wait and the lock.
+        {
+            CriticalSectionScope const state(m->m_stateLock);
+            if (m->m_master && m->m_master->m_lost) return RestoreNotTheFile;
+        }
         m->m_lastRestore = RestoreOk;
         if (!m->m_keepOpen && !openAnyway) return RestoreOk;
         bool reopened = false;

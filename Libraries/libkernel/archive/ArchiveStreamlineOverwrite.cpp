@@ -89,6 +89,7 @@ std::pair<bool, bool> ArchiveStreamliner::StreamlineOverwriteOriginalFile(String
         // The temporary stays: the master may be neither the old document nor the new one.
         m_newFile->m_stream = nullptr;
         m_master->m_bad = true;
+        m_master->m_lost = true;
         m_data = {};
         return {false, noSpace};
     }

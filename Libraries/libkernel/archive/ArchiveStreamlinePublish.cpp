@@ -120,6 +120,7 @@ void ArchiveStreamliner::Publish(Counted<File> const& file, Archive::StreamlineD
 void ArchiveStreamliner::ClearTables()
 {
     m_master->m_bad = true;
+    m_master->m_lost = true;
     CriticalSectionScope const lock(m_impl.m_stateLock);
     for (Counted<Archive::Revision> const& old : m_impl.m_revisions)
         for (Archive::FileRevision const& entry : old->GetEntries())

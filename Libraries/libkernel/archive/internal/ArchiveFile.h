@@ -31,6 +31,7 @@ public:
     bool m_readOnly = false;
     bool m_readOnlyFallback = false;            ///< Opened read-only after read-write was refused.
     std::atomic<bool> m_bad{false};             ///< Gone bad: no session may write to it any more.
+    std::atomic<bool> m_lost{false};            ///< Nor read: the archive's tables are gone, or no longer the file's.
     bool m_throwAway = false;                   ///< Deleted with the archive.
     std::atomic<bool> m_moved{false};           ///< Taken away by MigratePrepare.
     std::atomic<bool> m_closedForUpdate{false}; ///< Kept closed by ExternalUpdatePrepare.
