@@ -516,6 +516,14 @@ TEST_F(KernelToolTest, StreamlineLeavesTheItemsAndDropsTheRest)
     EXPECT_EQ(Run({"archive", "streamline", m_doc, "--to", m_folder / "new", "--overwrite"}).status, 2);
     EXPECT_FALSE(fs::exists(m_folder / "new"));
 
+    // Damage is kept as it is, and told in the one value.
+    std::string spoiled = ReadWhole(m_doc);
+    spoiled[76] ^= 1; // In the first item.
+    WriteWhole(m_folder / "spoiled", spoiled);
+    Json const damaged = RunJson({"archive", "streamline", m_folder / "spoiled", "--to", m_folder / "kept"}, 3);
+    ASSERT_TRUE(damaged.is_object());
+    EXPECT_EQ(damaged["verified"], false);
+
     // A block that is not where the table says stops it, and nothing has changed.
     Do({"archive", "put", m_doc, "--session", "rewrite", "a.txt=in/sub/b.txt"});
     std::string bytes = ReadWhole(m_doc);

@@ -134,9 +134,10 @@ int StreamlineTo(Arguments const& arguments, bool verify)
             {"path", ToStd(to)},
             {"sizeBefore", before},
             {"sizeAfter", after},
-            {"verified", verify}},
+            {"verified", verify && damaged.empty()}},
            "streamlined to " + Printable(ToStd(to)) + ": " + Sizes(before, after) + "\n");
-    if (!damaged.empty()) PrintDamage(damaged, checked);
+    // What is damaged in it, 'archive verify' tells as a value.
+    if (!damaged.empty() && !arguments.Has(Option::Json)) PrintDamage(damaged, checked);
     return damaged.empty() ? ExitDone : ExitDamaged;
 }
 
