@@ -89,7 +89,7 @@ TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
     });
     bits[8] = false;
     auto const other = MakeCounted<Thing>(&description, [&](OutSerialiser& out) {
-        out.SaveTypes("A001", std::vector<u16>{1});
+        out.SaveTypes("A001", std::vector<u16>{1, 2, 3});
         out.SaveType("A002", "aB");
         out.SavePropertyStruct("A004", custom + 1);
         out.SavePropertyStructs("A005", std::vector<u16>{0x0304, 0x0102});
@@ -122,7 +122,8 @@ TEST(OutSerialiserObjects, EqualValuesAreLeftOutForEveryKindOfDefault)
                    "| 31 [A009] 01 01 00 00 00 00 [Shar] 01 00 00 02 01 [Valu] 05 00"
                    "| B1 [A010] 02 00 00 00 02 01 00 00 00 00 | A9 [A011] 09 00 00 00 05 01 | 34 [A012] 'tnoF'"
                    "| 2A [A013] 00 00 00 00 | 75 [A014] 00 00 00 | 00 | 02 | 00"
-                   "| 31 [Othe] 01 02 00 00 00 | 01 [Thng] | 82 [A001] 01 00 00 00 01 00 | 2B [A002] 02 00 00 00 'aB'"
+                   "| 31 [Othe] 01 02 00 00 00 | 01 [Thng] | 82 [A001] 03 00 00 00 01 00 02 00 03 00 | 2B [A002] 02 00 "
+                   "00 00 'aB'"
                    "| 2C [A004] 04 00 05 03 02 01 | AC [A005] 02 00 00 00 02 00 04 03 02 01 | 2A [A006] 00 00 00 00"
                    "| AA [A007] 02 00 00 00 00 00 01 00 01 00 | 75 [A008] 00 00 01 03 | 31 [A009] 00"
                    "| B1 [A010] 02 00 00 00 02 01 00 00 00 02 01 00 00 00 | A9 [A011] 09 00 00 00 05 00 | 2F [A012] "

@@ -1,5 +1,8 @@
 #include "libkernel/text/Separators.h"
 
+#include "libkernel/text/StringParser.h"
+#include "support/Rows.h"
+
 #include <gtest/gtest.h>
 #include <random>
 #include <string>
@@ -69,6 +72,33 @@ TEST_F(SeparatorsTest, LocalTextOfAMachineTextReadsBackAsThat)
         String8 const machine(text.c_str());
         EXPECT_EQ(ConvertFromLocalisedDecimal(ConvertToLocalisedDecimal(machine)), machine) << text << decimal;
     }
+}
+
+TEST(StringParserTest, NumbersReadAsTheLanguageWritesThem)
+{
+    // 99 where nothing is read.
+    for (auto const& [language, text, number, whole] : Rows<char const*, char const*, double, long>{
+             {"en-US", "1,234.5", 1234.5, 1234},
+             {"de-DE", "1.234,5", 1234.5, 1234},
+             {"de-DE", "-7", -7.0, -7},
+             {"ar-EG", "\xD9\xA1\xD9\xA2", 12.0, 12}, // Its own digits.
+             {"en-US", "12 cm", 12.0, 12},
+             {"en-US", "2147483648", 2147483648.0, 99},
+             {"en-US", "cm", 99.0, 99},
+             {"en-US", "", 99.0, 99},
+             {"en-US", "\xFF\xFE", 99.0, 99},
+         })
+    {
+        SCOPED_TRACE(text);
+        Counted<Locale const> const locale = Locale::Create(language);
+        double asDouble = 99.0;
+        long asLong = 99;
+        EXPECT_EQ(StringParser::ParseAsDouble(text, locale, asDouble), number != 99.0);
+        EXPECT_EQ(StringParser::ParseAsLong(text, locale, asLong), whole != 99);
+        EXPECT_TRUE(asDouble == number && asLong == whole);
+    }
+    double number;
+    EXPECT_TRUE(StringParser::ParseAsDouble("5", nullptr, number)) << "the user's own language";
 }
 
 } // namespace
