@@ -91,26 +91,19 @@ TEST_F(FileSystemMovesTest, MoveReplacesTheTargetAndFlushesContentsAndName)
 TEST_F(FileSystemMovesTest, RenameIsTriedAgainOnlyWhereTheFailureMayPass)
 {
     // Retried by a move and a delete, and by a rename.
-    for (auto const& row : Rows<int, bool, bool>{
-             {EMFILE, true, true},
-             {ENFILE, true, true},
-             {EACCES, true, true},
-             {EPERM, true, true},
-             {EBUSY, false, true},
-             {ETXTBSY, false, true},
-             {ENOSPC, false, false},
-             {EIO, false, false},
-             {EROFS, false, false},
-         })
-    {
-        auto const [error, isRetriedByMove, isRetriedByRename] = row;
+    std::vector<std::tuple<int, bool, bool>> cases;
+    for (int const error : {EMFILE, ENFILE, EACCES, EPERM}) cases.emplace_back(error, true, true);
+    for (int const error : {EBUSY, ETXTBSY}) cases.emplace_back(error, false, true);
+    for (int const error : {ENOSPC, EIO, EROFS}) cases.emplace_back(error, false, false);
+    for (auto const& [failure, isRetriedByMove, isRetriedByRename] : cases) {
+        int const error = failure;
         SCOPED_TRACE(error);
         FaultyFiles faults;
         auto const run = [&](FileCall call, bool isRetried, auto const& operation) {
             FakeClock clock;
             faults.Clear();
             faults.ResetCounts();
-            faults.Plan({.call = call, .forEver = true, .error = std::get<0>(row)});
+            faults.Plan({.call = call, .forEver = true, .error = error});
             operation();
             EXPECT_EQ(clock.GetSleeps(), isRetried ? Pauses({1000, 1000}) : Pauses());
             return faults.GetCount(call);

@@ -21,6 +21,19 @@ Counted<ReaderNode> LoadRoot(InSerialiserFile const& file)
     return root;
 }
 
+// RdSc: loads as the test says.
+class Scripted : public ReaderNode
+{
+public:
+    bool Load(InSerialiser const& in, FileStore& store, unsigned short v) override
+    {
+        return s_load(in) && ReaderNode::Load(in, store, v);
+    }
+    static inline std::function<bool(InSerialiser const&)> s_load;
+};
+ClassProperties const s_scripted("RdSc", &ClassProperties::CreateNew<Scripted>, 1, nullptr, nullptr);
+ClassPropertiesBase::Init const s_initScripted(&s_scripted);
+
 // A root object of class RdNo whose properties follow.
 PropertyBytes BeginRoot()
 {
@@ -139,20 +152,13 @@ TEST(InSerialiserFileTest, ListKeptBeyondItsLoadIsEmpty)
 {
     // Held by a class that breaks the rule, as the list of its first object.
     static Counted<InSerialiser const> s_kept;
-    class Keeper : public ReaderNode
-    {
-    public:
-        bool Load(InSerialiser const& in, FileStore& store, unsigned short v) override
-        {
-            if (!s_kept) s_kept = Counted<InSerialiser const>(&in);
-            return ReaderNode::Load(in, store, v);
-        }
+    Scripted::s_load = [](InSerialiser const& in) {
+        if (!s_kept) s_kept = Counted<InSerialiser const>(&in);
+        return true;
     };
-    static ClassProperties const s_class("RdKp", &ClassProperties::CreateNew<Keeper>, 1, nullptr, nullptr);
-    static ClassPropertiesBase::Init const s_init(&s_class);
-    PropertyBytes b;
-    b.Header().Item(0xB1, "Arry").U32(2).Object(0).RootClass("RdKp").TextItem("Name", "one").End();
-    b.Object(1).KnownClass("RdKp").TextItem("Name", "two").End().End();
+    PropertyBytes const b =
+        PropertyBytes().Header().Put("B1 [Arry] 02000000 01 00000000 00 [RdSc] 0100 00 02 2B [Name] 03000000 'one' 00"
+                                     "01 01000000 01 [RdSc] 2B [Name] 03000000 'two' 00 | 00");
     Counted<InSerialiserFile> const file = Parse(b.bytes);
     std::vector<Counted<ReaderNode>> nodes;
     ASSERT_TRUE(file && file->LoadObjects("Arry", nodes));
@@ -297,23 +303,14 @@ TEST(InSerialiserFileTest, ProgressComesOncePerNewObjectAndEndsTheParse)
 
 TEST(InSerialiserFileTest, ReportNamesObjectsThatWereTakenAndDropped)
 {
-    // Loads its child as a reference and keeps nothing.
-    class Dropper : public ReaderNode
-    {
-    public:
-        bool Load(InSerialiser const& in, FileStore&, unsigned short) override
-        {
-            Counted<ReaderNode> dropped;
-            return in.LoadObject("Chld", dropped, false) && dropped->number == 3;
-        }
+    Scripted::s_load = [](InSerialiser const& in) { // Its child as a reference, of which it keeps nothing.
+        Counted<ReaderNode> dropped;
+        return in.LoadObject("Chld", dropped, false) && dropped->number == 3 && !(in.TearDown("Chld"), false);
     };
-    static ClassProperties const s_class("RdDr", &ClassProperties::CreateNew<Dropper>, 1, nullptr, nullptr);
-    static ClassPropertiesBase::Init const s_init(&s_class);
-    PropertyBytes b;
-    b.Header().Item(0x31, "Root").Object(0).RootClass("RdDr");
-    b.Item(0x31, "Chld").Object(1).RootClass("RdNo").U32Item("Numb", 3).End();
-    b.Item(0x31, "Nevr").Object(2).KnownClass("RdNo").U32Item("Numb", 4).End();
-    b.End().Item(0x31, "Shar").Object(3).RootClass("RdSh").U32Item("Numb", 1).End().End();
+    PropertyBytes const b = PropertyBytes().Header().Put(
+        "31 [Root] 01 00000000 00 [RdSc] 0100 00 02 | 31 [Chld] 01 01000000 00 [RdNo] 0100 00 02 03 [Numb] 03000000 00"
+        "31 [Nevr] 01 02000000 01 [RdNo] 03 [Numb] 04000000 00 | 00"
+        "31 [Shar] 01 03000000 00 [RdSh] 0100 00 02 03 [Numb] 01000000 00 | 00");
     std::vector<u32> numbers;
     size_t others = 0;
     auto const end = [&](std::vector<NonCounted<Serialisable>> const& dropped,
