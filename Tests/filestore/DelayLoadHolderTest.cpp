@@ -66,12 +66,12 @@ TEST_F(DelayLoadHolderTest, ItemIsLoadedOnceAndReleasedWhenClean)
 
 TEST_F(DelayLoadHolderTest, NextStoreServesWhereOneFails)
 {
-    using Damage = std::function<void(MemoryFileStore&, char const* path)>;
-    for (Damage const &damage : std::initializer_list<Damage>{
-             [](auto&store, char const*path) { store.UpdateDelayLoadOwners(store.Delete(path)); },
-             [](auto&store, char const*path) { store.UpdateDelayLoadOwners(store.Put(path, "refuse")); },
-             [](auto&store, char const*) { store.onLoad = [] { throw 1; }; }})
-    {
+    using Damage = void (*)(MemoryFileStore&, char const*);
+    static constexpr Damage c_damages[] = {
+        [](MemoryFileStore& store, char const* path) { store.UpdateDelayLoadOwners(store.Delete(path)); },
+        [](MemoryFileStore& store, char const* path) { store.UpdateDelayLoadOwners(store.Put(path, "refuse")); },
+        [](MemoryFileStore& store, char const*) { store.onLoad = [] { throw 1; }; }};
+    for (Damage const damage : c_damages) {
         // Which store is asked first is a matter of addresses, so each of them is the damaged one once.
         for (bool const damageA : {true, false}) {
             a = MemoryFileStore::Create();
