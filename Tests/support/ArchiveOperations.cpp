@@ -15,8 +15,7 @@
 #include "libkernel/streams/OutStream.h"
 
 #include <chrono>
-#include <condition_variable>
-#include <mutex>
+#include <future>
 #include <new>
 #include <sstream>
 #include <thread>
@@ -142,26 +141,13 @@ class Waiter : public Archive::OffliningUpdater
 {
 public:
     void Progress(u64, u64) override {}
-    void Complete() override { Set("ok"); }
-    void Aborted() override { Set("offlining aborted"); }
-    void Failed(int reason) override { Set(reason == 1 ? "offlining 1" : "offlining 2"); }
-    std::string Wait()
-    {
-        std::unique_lock lock(m_mutex);
-        m_changed.wait(lock, [this] { return m_result != nullptr; });
-        return m_result;
-    }
+    void Complete() override { m_result.set_value("ok"); }
+    void Aborted() override { m_result.set_value("offlining aborted"); }
+    void Failed(int reason) override { m_result.set_value(reason == 1 ? "offlining 1" : "offlining 2"); }
+    std::string Wait() { return m_result.get_future().get(); }
 
 private:
-    void Set(char const* result)
-    {
-        std::lock_guard const lock(m_mutex);
-        m_result = result;
-        m_changed.notify_all();
-    }
-    std::mutex m_mutex;
-    std::condition_variable m_changed;
-    char const* m_result = nullptr;
+    std::promise<char const*> m_result;
 };
 
 /// The job holds the archive and its files for a moment longer than it takes to tell its end.
