@@ -20,11 +20,6 @@ protected:
         root->parts = std::move(parts);
         return root;
     }
-    Counted<DelayLoadHolder> Stored(char const* path, char const* bytes)
-    {
-        a->Put(path, bytes);
-        return a->Hold(path);
-    }
 
     Counted<MemoryFileStore> a = MemoryFileStore::Create();
 };
@@ -34,7 +29,7 @@ TEST_F(BackstoreGuarantorTest, NamedItemsAndThePartsOfNestedOnesSurviveTheStore)
     EXPECT_TRUE(BackstoreGuarantor::Process(Counted<FileStoreItem const>()));
     a->Put("x", "X");
     a->Put("nest/inner", "I\nx\nnest/outer");
-    Counted<DelayLoadHolder> const outer = Stored("nest/outer", "O\nnest/inner"), y = Stored("y", "Y");
+    Counted<DelayLoadHolder> const outer = a->Store("nest/outer", "O\nnest/inner"), y = a->Store("y", "Y");
     Counted<MemoryItem> const root = Root({y, y, nullptr, outer});
     EXPECT_TRUE(BackstoreGuarantor::Process(root)) << "items that contain each other end";
     EXPECT_EQ(2, a->copies) << "each holder once";
@@ -54,8 +49,8 @@ TEST_F(BackstoreGuarantorTest, NamedItemsAndThePartsOfNestedOnesSurviveTheStore)
 TEST_F(BackstoreGuarantorTest, WhatCannotBeHadFailsTheRun)
 {
     EXPECT_FALSE(BackstoreGuarantor::Process(Root({a->Hold("opt/missing")})));
-    Counted<DelayLoadHolder> const x = Stored("x", "X");
-    EXPECT_FALSE(BackstoreGuarantor::Process(Root({x, Stored("nest/n", "refuse")})));
+    Counted<DelayLoadHolder> const x = a->Store("x", "X");
+    EXPECT_FALSE(BackstoreGuarantor::Process(Root({x, a->Store("nest/n", "refuse")})));
     EXPECT_FALSE(x->GetBackData()) << "nothing is copied when the walk has failed";
     a->onCreateBackData = [] { throw BackstoreException(true); };
     EXPECT_FALSE(BackstoreGuarantor::Process(Root({x})));
@@ -70,7 +65,7 @@ TEST_F(BackstoreGuarantorTest, WhatAStayingStoreHoldsIsNotCopied)
                                              {"unknown, but in memory", true, false, true}})
     {
         SCOPED_TRACE(what);
-        Counted<DelayLoadHolder> const x = Stored("x", "X");
+        Counted<DelayLoadHolder> const x = a->Store("x", "X");
         if (load) TextOf(x);
         if (dirty) x->GetItemBaseIfLoaded()->MarkAsDirty();
         if (forget) a->RemoveDirtyStates({"x"});
@@ -79,7 +74,7 @@ TEST_F(BackstoreGuarantorTest, WhatAStayingStoreHoldsIsNotCopied)
     }
     // Another store is no reason to leave out the copy of what it does not know.
     Counted<MemoryFileStore> const b = MemoryFileStore::Create();
-    Counted<DelayLoadHolder> const y = Stored("y", "Y");
+    Counted<DelayLoadHolder> const y = a->Store("y", "Y");
     TextOf(y);
     EXPECT_TRUE(y->ReleaseItem());
     EXPECT_TRUE(BackstoreGuarantor::Process(Root({y})));

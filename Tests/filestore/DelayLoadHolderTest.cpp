@@ -24,8 +24,7 @@ protected:
     /// A holder of one item of text "X" that both stores hold.
     Counted<DelayLoadHolder> HoldInBoth()
     {
-        a->Put("x", "X");
-        Counted<DelayLoadHolder> const holder = a->Hold("x");
+        Counted<DelayLoadHolder> const holder = a->Store("x", "X");
         b->SetDelayLoadOwner(holder, b->Put("bx", "X"), "bx");
         return holder;
     }
@@ -43,8 +42,7 @@ protected:
 
 TEST_F(DelayLoadHolderTest, ItemIsLoadedOnceAndReleasedWhenClean)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Counted<DelayLoadHolder> const holder = a->Store("x", "X");
     EXPECT_FALSE(holder->IsLoaded());
     EXPECT_FALSE(holder->GetItemBaseIfLoaded());
     EXPECT_TRUE(holder->ReleaseItem());
@@ -96,8 +94,7 @@ TEST_F(DelayLoadHolderTest, NextStoreServesWhereOneFails)
 
 TEST_F(DelayLoadHolderTest, FailedLoadIsNotTriedAgainUntilRelease)
 {
-    a->Put("x", "refuse");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Counted<DelayLoadHolder> const holder = a->Store("x", "refuse");
     JailCounted<FileStoreItem> item;
     EXPECT_FALSE(holder->GetItemBase(item));
     EXPECT_TRUE(holder->IsLoaded());
@@ -128,8 +125,7 @@ TEST_F(DelayLoadHolderTest, OnlyCopyIsKeptUnlessItsStoreDiedUnseen)
     EXPECT_TRUE(holder->ReleaseItem());
     EXPECT_FALSE(item->GetDelayLoadHolder());
 
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const orphan = a->Hold("x");
+    Counted<DelayLoadHolder> const orphan = a->Store("x", "X");
     TextOf(orphan);
     a->diesSuddenly = true;
     a.Reset();
@@ -140,8 +136,7 @@ TEST_F(DelayLoadHolderTest, OnlyCopyIsKeptUnlessItsStoreDiedUnseen)
 
 TEST_F(DelayLoadHolderTest, ItemHasOneHolderAndKeepsThePathOfTheOneItReplaces)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const old = a->Hold("x");
+    Counted<DelayLoadHolder> const old = a->Store("x", "X");
     Counted<MemoryItem> const item(new MemoryItem("X2"));
     Counted<DelayLoadHolder> holder = DelayLoadHolder::Create(&MemoryItem::c_plain, item, old, *a);
     EXPECT_EQ(holder, DelayLoadHolder::Create(&MemoryItem::c_plain, item));
@@ -173,8 +168,7 @@ TEST_F(DelayLoadHolderTest, TemporaryItemGoesUnlessItWasThereOrWasTouched)
                                                    {"last copy", false, false, true, true}})
     {
         SCOPED_TRACE(what);
-        a->Put("x", "X", true);
-        Counted<DelayLoadHolder> const holder = a->Hold("x");
+        Counted<DelayLoadHolder> const holder = a->Store("x", "X", true);
         if (load) TextOf(holder);
         {
             DelayLoadHolder::TempLoadItem const temp(holder);
@@ -211,8 +205,7 @@ TEST_F(DelayLoadHolderTest, FirstBackDataStaysUntilTheItemChanges)
     holder->SetBackData(first);
     EXPECT_FALSE(holder->GetBackData()) << "its bytes are older than the item";
 
-    a->Put("nest/n", "N");
-    Counted<DelayLoadHolder> const nestable = a->Hold("nest/n");
+    Counted<DelayLoadHolder> const nestable = a->Store("nest/n", "N");
     nestable->SetBackData(first);
     EXPECT_FALSE(nestable->GetBackData());
 }
@@ -228,14 +221,12 @@ TEST_F(DelayLoadHolderTest, BackingTakesTheFirstStoreThatCan)
 
     Counted<DelayLoadHolder> const missing = a->Hold("opt/m");
     EXPECT_FALSE(missing->EnsureItemIsBacked());
-    a->Put("nest/n", "N");
-    Counted<DelayLoadHolder> const nestable = a->Hold("nest/n");
+    Counted<DelayLoadHolder> const nestable = a->Store("nest/n", "N");
     EXPECT_FALSE(nestable->EnsureItemIsBacked());
     TextOf(nestable);
     EXPECT_TRUE(nestable->EnsureItemIsBacked()) << "it is in memory";
 
-    a->Put("y", "Y");
-    Counted<DelayLoadHolder> const y = a->Hold("y");
+    Counted<DelayLoadHolder> const y = a->Store("y", "Y");
     a->onCreateBackData = [] { throw BackstoreException(true); };
     EXPECT_THROW(y->EnsureItemIsBacked(), BackstoreException);
     a->onCreateBackData = nullptr;

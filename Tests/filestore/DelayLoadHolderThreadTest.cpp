@@ -54,8 +54,7 @@ TEST_F(DelayLoadHolderThreadTest, ThreadsThatWantOneItemLoadItOnce)
 
 TEST_F(DelayLoadHolderThreadTest, ReadersAndChangersAgreeOnOneItem)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Counted<DelayLoadHolder> const holder = a->Store("x", "X");
     OnThreads(4, [&](int thread) {
         for (int i = 0; i < 300; ++i) {
             DelayLoadHolder::TempLoadItem const temp(holder);
@@ -73,8 +72,7 @@ TEST_F(DelayLoadHolderThreadTest, ReadersAndChangersAgreeOnOneItem)
 
 TEST_F(DelayLoadHolderThreadTest, StoreGoesOnCommittingWhileALoadRuns)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Counted<DelayLoadHolder> const holder = a->Store("x", "X");
     a->onLoad = [&] {
         a->onLoad = nullptr;
         EXPECT_TRUE(EndsMeanwhile([&] {
@@ -97,8 +95,7 @@ TEST_F(DelayLoadHolderThreadTest, StoreGoesOnCommittingWhileALoadRuns)
 
 TEST_F(DelayLoadHolderThreadTest, StoreDiesInsideALoadFromAnotherStore)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const holder = a->Hold("x");
+    Counted<DelayLoadHolder> const holder = a->Store("x", "X");
     b->SetDelayLoadOwner(holder, b->Put("x", "X"), "x");
     auto const kill = [&](Counted<MemoryFileStore>& other) {
         return [&] { EXPECT_TRUE(EndsMeanwhile([&] { other.Reset(); })); };

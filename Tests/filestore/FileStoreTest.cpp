@@ -30,8 +30,7 @@ protected:
 
 TEST_F(FileStoreTest, OnePathHasOneHolderWhileItLivesWhichTakesItsBackData)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> holder = a->Hold("x");
+    Counted<DelayLoadHolder> holder = a->Store("x", "X");
     EXPECT_EQ(holder, a->Hold("x"));
     EXPECT_EQ("X", TextOf(holder));
     holder.Reset();
@@ -47,8 +46,7 @@ TEST_F(FileStoreTest, OnePathHasOneHolderWhileItLivesWhichTakesItsBackData)
     a->AddBackData("x", RevisionIn(*a, holder), data);
     EXPECT_EQ(data, holder->GetBackData());
     EXPECT_EQ("copy", TextOf(holder));
-    a->Put("y", "Y");
-    Counted<DelayLoadHolder> const y = a->Hold("y");
+    Counted<DelayLoadHolder> const y = a->Store("y", "Y");
     a->AddBackData("y", data);
     EXPECT_EQ(data, y->GetBackData());
 }
@@ -199,10 +197,8 @@ TEST_F(FileStoreTest, PreFileDeleteAsksForEachHolderAndTakesTheChosenOnes)
 
 TEST_F(FileStoreTest, EndOfAStoreLeavesBackDataUnlessAnotherStoreLives)
 {
-    a->Put("x", "X");
-    a->Put("y", "Y");
-    Counted<DelayLoadHolder> const x = a->Hold("x");
-    Counted<DelayLoadHolder> const y = a->Hold("y");
+    Counted<DelayLoadHolder> const x = a->Store("x", "X");
+    Counted<DelayLoadHolder> const y = a->Store("y", "Y");
     b->SetDelayLoadOwner(y, b->Put("y", "Y"), "y");
     Counted<FileStoreLink> const link = a->GetFileStoreLink();
     a.Reset();
@@ -220,8 +216,7 @@ TEST_F(FileStoreTest, EndOfAStoreLeavesBackDataUnlessAnotherStoreLives)
 
 TEST_F(FileStoreTest, StoreThatLetsGoOfItsHoldersLivesOnAndTheirEndLeavesNoTrace)
 {
-    a->Put("x", "X");
-    Counted<DelayLoadHolder> const x = a->Hold("x");
+    Counted<DelayLoadHolder> const x = a->Store("x", "X");
     a->PreDestruction();
     EXPECT_EQ("(unknown)", PathIn(*a, x));
     EXPECT_EQ("X", TextOf(x));

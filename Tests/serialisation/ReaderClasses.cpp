@@ -140,13 +140,13 @@ Counted<InSerialiserFile> ParseItems(std::string_view notation)
     return Parse(PropertyBytes().Header().Put(notation).End().bytes);
 }
 
-PropertyBytes EveryValueForm(bool everySize)
+PropertyBytes EveryValueForm()
 {
     PropertyBytes b;
     // Fixed sizes, alone and as arrays of two.
     for (int type = 1; type <= 116; ++type) {
         u32 const size = c_propSizes[static_cast<size_t>(type)];
-        if (size == 0 || type == 41 || (!everySize && type > 10 && type % 9 != 0)) continue;
+        if (size == 0 || type == 41) continue;
         b.U8(static_cast<u8>(type)).U32(0x10000 + static_cast<u32>(type));
         for (u32 i = 0; i < size; ++i) b.U8(static_cast<u8>(i + 1));
         b.U8(static_cast<u8>(type | 0x80)).U32(0x20000 + static_cast<u32>(type)).U32(2).Zeros(2 * size);
@@ -164,10 +164,10 @@ PropertyBytes EveryValueForm(bool everySize)
                  "33 [DlyN] 00000000 00000000 | 33 [DlyZ] 00000000 04000000 'path'");
 }
 
-PropertyBytes EveryItemForm(bool everySize)
+PropertyBytes EveryItemForm()
 {
     PropertyBytes b;
-    b.Header().Append(EveryValueForm(everySize));
+    b.Header().Append(EveryValueForm());
     // A class with every kind of default, its parent, objects in objects, arrays and references.
     return b.Put(
         "31 [Root] 01 00000000 | 00 [RdDv] 0100 | 03 [DfT1] 0B000000 | 83 [DfT2] 02000000 01000000 02000000"

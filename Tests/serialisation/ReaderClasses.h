@@ -104,8 +104,8 @@ Counted<InSerialiserFile> Parse(std::vector<u8> const& bytes, bool checks = true
 /// A file with these items, in the notation of Bytes(), behind a header and with an end.
 Counted<InSerialiserFile> ParseItems(std::string_view notation);
 /// Items of every form but objects, in every size of the forms that have many, or only in some.
-PropertyBytes EveryValueForm(bool everySize = true);
+PropertyBytes EveryValueForm();
 /// A whole stream with one of every form of item, and objects of the classes above.
-PropertyBytes EveryItemForm(bool everySize = true);
+PropertyBytes EveryItemForm();
 
 } // namespace Kernel::Test

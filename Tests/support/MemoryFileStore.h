@@ -88,6 +88,12 @@ public:
     {
         return CreateDelayLoadHolderDirect(path, MemoryItem::TypeOf(path), context);
     }
+    /// Both: commits the bytes, and holds them.
+    Counted<DelayLoadHolder> Store(char const* path, String8 const& bytes, bool incremental = false)
+    {
+        Put(path, bytes, incremental);
+        return Hold(path);
+    }
 
     bool LoadFile(String8 const& path, Revision revision, FileStoreItem& item, bool reportToCallback) override;
     bool LoadFile(String8 const& path, FileStoreItem& item) override { return LoadFile(path, nullptr, item, false); }
