@@ -318,6 +318,7 @@ public:
     /// state that a search of the file finds. At most what was saved behind that state is lost. Nothing is written; the
     /// next save makes the state lasting. A master that is reached through a scratch file must be in the state that
     /// the scratch file names: one that has to be searched gives OpenCorrupt, and can be recovered by its own path.
+    /// Tables of a later version are no damage: they give OpenTooNew, as the next save would lose them.
     static Counted<Archive> RecoverArchive(String8 const& path, OpenMode mode, IDTag tag, OpenResult& result);
 
     /// Walks header, info block, guard and the chain of tables without making an archive. Both outputs may be null.
