@@ -160,6 +160,7 @@ TEST_F(FileSystemMovesTest, MoveBetweenVolumesKeepsTheFileWholeAndFollowsNoPlant
     namespace fs = std::filesystem;
     std::string big(2'500'000, 'b');
     WriteWholeFile(m_folder / "old", big);
+    bool const hasMarks = FileSystem::SetFileHidden(At("old"), true);
     fs::permissions(m_folder / "old", fs::perms(0640));
     // The names that are tried next for a temporary are all taken by links to a precious file.
     WriteWholeFile(m_folder / "precious", "precious");
@@ -172,6 +173,7 @@ TEST_F(FileSystemMovesTest, MoveBetweenVolumesKeepsTheFileWholeAndFollowsNoPlant
     EXPECT_FALSE(fs::exists(m_folder / "old"));
     EXPECT_EQ(List().size(), 202u);
     EXPECT_EQ(fs::symlink_status(m_folder / "target").permissions(), fs::perms(0640));
+    EXPECT_EQ(FileSystem::GetFileHidden(At("target")).second, hasMarks);
     EXPECT_TRUE(m_log.empty());
     EXPECT_EQ(faults.GetOpenHandles(), 0);
 }

@@ -57,6 +57,9 @@ TEST_F(FileSystemTest, KindsOfEntriesAreToldApart)
     EXPECT_TRUE(FileSystem::IsDirectoryEmpty(At("folder")));
     EXPECT_FALSE(FileSystem::IsDirectoryEmpty(S(m_folder.GetPath())));
     EXPECT_FALSE(FileSystem::IsDirectoryEmpty(At("file")));
+    EXPECT_TRUE(FileSystem::DeleteFilesFromFolder(S(m_folder.GetPath())));
+    EXPECT_FALSE(FileSystem::Exists(At("file")) || FileSystem::DeleteFilesFromFolder(At("missing")));
+    EXPECT_TRUE(FileSystem::IsDirectory(At("folder")));
 }
 
 TEST_F(FileSystemTest, FilenameIsTheLastPartAsTheFileSystemSpellsIt)

@@ -23,7 +23,7 @@ protected:
     }
 };
 
-TEST_F(TimeTextTest, StylesFollowTheCLibrary)
+TEST_F(TimeTextTest, StylesFollowTheCLibraryAndHighResolutionShowsMilliseconds)
 {
     using Row = std::tuple<TimeStampStyle, char const*, char const*>;
     for (auto const& [style, utc, local] :
@@ -39,15 +39,12 @@ TEST_F(TimeTextTest, StylesFollowTheCLibrary)
         }
     }
     EXPECT_EQ(ToStringT<String16>(TimeStamp(0), TimeStampStyle::Iso8601, c_utc), u"1970-01-01T00:00:00Z");
-}
 
-TEST_F(TimeTextTest, HighResolutionShowsMilliseconds)
-{
-    using Row = std::tuple<HighResTimeStamp, char const*>;
-    for (auto const& [stamp, expected] : {Row{HighResTimeStamp(c_noon, 678), "2020-02-29T12:30:45.678Z"},
-                                          Row{HighResTimeStamp(c_noon, 7), "2020-02-29T12:30:45.007Z"},
-                                          Row{HighResTimeStamp(-2, 250), "1969-12-31T23:59:58.250Z"},
-                                          Row{HighResTimeStamp(-1, 0), "1969-12-31T23:59:59.000Z"}})
+    using Precise = std::tuple<HighResTimeStamp, char const*>;
+    for (auto const& [stamp, expected] : {Precise{HighResTimeStamp(c_noon, 678), "2020-02-29T12:30:45.678Z"},
+                                          Precise{HighResTimeStamp(c_noon, 7), "2020-02-29T12:30:45.007Z"},
+                                          Precise{HighResTimeStamp(-2, 250), "1969-12-31T23:59:58.250Z"},
+                                          Precise{HighResTimeStamp(-1, 0), "1969-12-31T23:59:59.000Z"}})
         EXPECT_EQ(ToString(stamp, TimeStampStyle::Iso8601, c_utc), expected);
     EXPECT_EQ(ToString(HighResTimeStamp(c_noon, 5), TimeStampStyle::Iso8601, c_local), "2020-02-29T07:30:45.005-0500");
 }
