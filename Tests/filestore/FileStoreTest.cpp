@@ -1,6 +1,7 @@
 #include "libkernel/filestore/BackstoreException.h"
 #include "libkernel/filestore/VoidFileStore.h"
 #include "support/MemoryFileStore.h"
+#include "support/TraceCapture.h"
 
 #include <gtest/gtest.h>
 
@@ -157,7 +158,9 @@ TEST_F(FileStoreTest, DroppedRevisionsLeaveBackDataWhereNothingElseWould)
     Revision const last = a->Put("last", "L");
     Counted<DelayLoadHolder> const holder = a->Hold("last");
     a->onCreateBackData = [] { throw BackstoreException(true); };
+    Kernel::Test::TraceCapture const capture;
     EXPECT_THROW(a->RemoveDelayLoadLinks({last}), BackstoreException);
+    EXPECT_EQ("== BackstoreException: out of space\n", Kernel::Test::TraceCapture::GetText());
     EXPECT_FALSE(holder->IsBackedBy(*a));
     Counted<DelayLoadHolder> const again = a->Hold("last");
     EXPECT_NE(holder, again);

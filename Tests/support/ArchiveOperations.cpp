@@ -10,7 +10,6 @@
 #include "libkernel/serialisation/InSerialiser.h"
 #include "libkernel/serialisation/SerialiseFrom.h"
 #include "libkernel/serialisation/SerialiseTo.h"
-#include "libkernel/streams/FileIOException.h"
 #include "libkernel/streams/MemoryStreams.h"
 #include "libkernel/streams/OutStream.h"
 
@@ -54,15 +53,13 @@ std::string Kept(Counted<Archive>& place, Counted<Archive> const& archive, Archi
     return Numbered("create", static_cast<int>(result.GetCode()));
 }
 
-void OpenIn(World& world, char const* path)
+std::function<void(World&)> Opened(char const* path, size_t itemSize = 1500, bool overwrites = false)
 {
-    world.archive = OpenDocument(path);
-    world.item = MakeCounted<BytesItem>(std::string(1500, 'n'));
-}
-
-std::function<void(World&)> Opened(char const* path)
-{
-    return [path](World& world) { OpenIn(world, path); };
+    return [=](World& world) {
+        world.archive = OpenDocument(path);
+        world.archive->SetAlwaysStreamlineOverwrite(overwrites);
+        world.item = MakeCounted<BytesItem>(std::string(itemSize, 'n'));
+    };
 }
 
 enum class How
@@ -218,10 +215,10 @@ std::string ReadStream(World& world)
     return !stream ? "no stream" : stream->ReadBlock(bytes, sizeof(bytes)) == sizeof(bytes) ? "ok" : "short";
 }
 
-std::string Settings(World&)
+bool SaveSettings(int value)
 {
-    auto const save = [](OutSerialiser& out, IDTag tag) { out.SaveType(tag, 2); };
-    return SerialiseToFile(c_settings, "Sett", 1, save, 6) ? "ok" : "false";
+    auto const save = [value](OutSerialiser& out, IDTag tag) { out.SaveType(tag, value); };
+    return SerialiseToFile(c_settings, "Sett", 1, save, 6);
 }
 
 std::string SettingsBack(World&)
@@ -233,56 +230,50 @@ std::string SettingsBack(World&)
     return SerialiseFromFile(c_settings, "Sett", 1, load, true) ? "ok" : "false";
 }
 
-void Nothing(World&) {}
-
-void OpenedOther(World& world)
-{
-    world.other = OpenDocument(c_doc);
-}
-
-// What any file of a save may fail with, by name: no session for want of a file, or the session's own exceptions.
-char const* const c_saveFailures = "session 9,no session,file 0 1 2 3 4 5 7 8,write";
+auto const nothing = [](World&) {};
+auto const openedOther = [](World& world) { world.other = OpenDocument(c_doc); };
 
 std::vector<ArchiveOperation> MakeOperations()
 {
     using Type = Archive::SessionType;
-    std::string const save = c_saveFailures;
-    std::vector<ArchiveOperation> list = {
-        {"create", Start::Nothing, Nothing,
+    // What any file of a save may fail with, by name: no session for want of a file, or the session's own exceptions.
+    std::string const save = "session 9,no session,file 0 1 2 3 4 5 7 8,write";
+    return {
+        {"create", Start::Nothing, nothing,
          Creating([](World&, auto& result) { return Archive::Create(Str(c_new), c_documentTag, result); }, false),
          "create *"},
-        {"create as scratch", Start::Nothing, Nothing,
+        {"create as scratch", Start::Nothing, nothing,
          Creating(
              [](World&, auto& result) { return Archive::CreateAsScratch(Str(c_new), c_documentTag, nullptr, result); },
              false),
          "create *"},
-        {"create throw-away and save", Start::Nothing, Nothing,
+        {"create throw-away and save", Start::Nothing, nothing,
          Creating([](World&, auto& result) { return Archive::CreateAsThrowAway(c_documentTag, result); }),
          "create *," + save},
-        {"create with temporary and save", Start::Document, Nothing,
+        {"create with temporary and save", Start::Document, nothing,
          Creating([](World&, auto& result) { return Archive::CreateWithTemporary(Str(c_doc), c_documentTag, result); }),
          "create *," + save},
-        {"create new with temporary and save", Start::Nothing, Nothing,
+        {"create new with temporary and save", Start::Nothing, nothing,
          Creating([](World&, auto& result) { return Archive::CreateWithTemporary(Str(c_new), c_documentTag, result); }),
          "create *," + save},
-        {"create with adjacent temporary and save", Start::Document, Nothing, Creating([](World&, auto& result) {
+        {"create with adjacent temporary and save", Start::Document, nothing, Creating([](World&, auto& result) {
              return Archive::CreateWithAdjacentTemporary(Str(c_doc), c_documentTag, result, {});
          }),
          "create *," + save},
-        {"replace and save", Start::Document, OpenedOther,
+        {"replace and save", Start::Document, openedOther,
          Creating([](World& w, auto& result) { return w.other->CreateReplacementWithTemporary(result, {}); }),
          "create *," + save},
         {"add scratch file", Start::Document, Opened(c_doc),
          Creating([](World& w, auto& r) { return w.archive->AddScratchFile(Str(c_scratch), r) ? w.archive : nullptr; },
                   false),
          "create 2 6"},
-        {"open", Start::Pair, Nothing, Opening(Archive::OpenModeReadWrite, c_scratch), "open *"},
-        {"open read-only", Start::Pair, Nothing, Opening(Archive::OpenModeReadOnly, c_scratch), "open *"},
-        {"open either way", Start::Document, Nothing, Opening(Archive::OpenModeReadWriteOrReadOnly, c_doc), "open *"},
-        {"open coordinated", Start::Document, Nothing, Opening(Archive::OpenModeCoordinated, c_doc), "open *"},
-        {"open as scratch", Start::Alone, Nothing,
+        {"open", Start::Pair, nothing, Opening(Archive::OpenModeReadWrite, c_scratch), "open *"},
+        {"open read-only", Start::Pair, nothing, Opening(Archive::OpenModeReadOnly, c_scratch), "open *"},
+        {"open either way", Start::Document, nothing, Opening(Archive::OpenModeReadWriteOrReadOnly, c_doc), "open *"},
+        {"open coordinated", Start::Document, nothing, Opening(Archive::OpenModeCoordinated, c_doc), "open *"},
+        {"open as scratch", Start::Alone, nothing,
          OpeningBy([](World&, auto& r) { return Archive::OpenAsScratch(Str(c_scratch), c_documentTag, r); }), "open *"},
-        {"open throw-away", Start::Document, OpenedOther,
+        {"open throw-away", Start::Document, openedOther,
          [](World& w) {
              auto const data = MakeCounted<FragmentedRawData>(4096);
              if (int const result = w.other->StreamlineToFragmentedRawData(*data))
@@ -290,14 +281,14 @@ std::vector<ArchiveOperation> MakeOperations()
              return OpeningBy([&](World&, auto& r) { return Archive::OpenAsThrowaway(*data, c_documentTag, r); })(w);
          },
          "open *,streamline 2 4"},
-        {"open migrate", Start::Document, Nothing,
+        {"open migrate", Start::Document, nothing,
          OpeningBy([](World&, auto& r) { return Archive::OpenMigrate(Str(c_doc), Str(c_moved), c_documentTag, r); }),
          "open *"},
-        {"recover", Start::Damaged, Nothing, OpeningBy([](World&, auto& r) {
+        {"recover", Start::Damaged, nothing, OpeningBy([](World&, auto& r) {
              return Archive::RecoverArchive(Str(c_doc), Archive::OpenModeReadWrite, c_documentTag, r);
          }),
          "open *"},
-        {"look at links", Start::Pair, Nothing,
+        {"look at links", Start::Pair, nothing,
          [](World&) {
              IDTag tag;
              Archive::LinkInfo info;
@@ -309,12 +300,8 @@ std::vector<ArchiveOperation> MakeOperations()
          },
          "open *,links differ"},
         {"full save", Start::Document, Opened(c_doc), Saving(Type::SessionTypeFull, false), save},
-        {"save of several buffers", Start::Document,
-         [](World& w) {
-             OpenIn(w, c_doc);
-             w.item = MakeCounted<BytesItem>(std::string(2'000'000, 'n'));
-         },
-         Saving(Type::SessionTypeFull, false), save},
+        {"save of several buffers", Start::Document, Opened(c_doc, 2'000'000), Saving(Type::SessionTypeFull, false),
+         save},
         {"incremental save", Start::Document, Opened(c_doc), Saving(Type::SessionTypeIncremental, false), save},
         {"rewrite save", Start::Document, Opened(c_doc), Saving(Type::SessionTypeRewrite, false), save},
         {"export save", Start::Document, Opened(c_doc), Saving(Type::SessionTypeExport, false), save},
@@ -334,11 +321,7 @@ std::vector<ArchiveOperation> MakeOperations()
              return w.archive->StreamlineAndVerifyFileState(report, &w.abort, nullptr, nullptr);
          }),
          "streamline 2 3 4 6 7 8"},
-        {"streamline by overwriting", Start::Pair,
-         [](World& w) {
-             OpenIn(w, c_scratch);
-             w.archive->SetAlwaysStreamlineOverwrite(true);
-         },
+        {"streamline by overwriting", Start::Pair, Opened(c_scratch, 1500, true),
          Streamlining([](World& w) { return w.archive->Streamline(&w.abort, nullptr, nullptr); }),
          "streamline 2 3 4 7 8"},
         {"streamline to new", Start::Document, Opened(c_doc),
@@ -369,17 +352,16 @@ std::vector<ArchiveOperation> MakeOperations()
         {"read all", Start::Pair, Opened(c_scratch), ReadAll, "unreadable,no thumbnails"},
         {"check all", Start::Pair, Opened(c_scratch), CheckAll, "check 1"},
         {"read a stream", Start::Document, Opened(c_doc), ReadStream, "no stream,short,corrupt,file 8"},
-        {"save settings", Start::Settings, Nothing, Settings, "false"},
-        {"load settings", Start::Settings, Nothing, SettingsBack, "false"},
+        {"save settings", Start::Settings, nothing, [](World&) { return SaveSettings(2) ? "ok" : "false"; }, "false"},
+        {"load settings", Start::Settings, nothing, SettingsBack, "false"},
     };
-    return list;
 }
 
 } // namespace
 
 std::vector<ArchiveOperation> const& GetArchiveOperations()
 {
-    static std::vector<ArchiveOperation> const list = MakeOperations();
+    static auto const list = MakeOperations();
     return list;
 }
 
@@ -397,8 +379,6 @@ std::string RunOperation(ArchiveOperation const& operation, World& world)
         return "corrupt";
     } catch (BackstoreException const&) {
         return "backstore";
-    } catch (FileIOException const&) {
-        return "stray FileIOException";
     } catch (MemoryException const&) {
         return "memory";
     } catch (std::bad_alloc const&) {
@@ -455,8 +435,7 @@ OperationDisk::OperationDisk()
     }
     m_starts[Start::Alone] = m_disk.GetImage();
     m_disk.Load({});
-    SerialiseToFile(
-        c_settings, "Sett", 1, [](OutSerialiser& out, IDTag tag) { out.SaveType(tag, 1); }, 6);
+    SaveSettings(1);
     m_starts[Start::Settings] = m_disk.GetImage();
 }
 
@@ -479,9 +458,8 @@ DiskView LookAtDisk(MemoryDisk& disk)
         one.result = result;
         if (archive) one.items = GetAll(*archive);
     }
-    MemoryDisk::Image const image = disk.GetImage();
-    auto const settings = image.find(c_settings);
-    if (settings != image.end()) view[c_settings].bytes = *settings->second;
+    for (auto const& [path, bytes] : disk.GetImage())
+        if (path == c_settings) view[path].bytes = *bytes;
     return view;
 }
 
