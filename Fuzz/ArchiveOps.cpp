@@ -193,6 +193,14 @@ private:
 
 } // namespace
 
+// A run takes and gives back megabytes, many times over. Of what is given back the sanitizer keeps a part, to see later
+// uses of it; by its own choice that would come near the limit of memory that a target has.
+extern "C" char const* __asan_default_options();
+extern "C" char const* __asan_default_options()
+{
+    return "quarantine_size_mb=64";
+}
+
 // Each step: the operation, whether the power is cut in it, and what the operation takes.
 extern "C" int LLVMFuzzerTestOneInput(uint8_t const* data, size_t size)
 {
