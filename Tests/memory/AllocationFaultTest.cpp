@@ -187,13 +187,13 @@ TEST(AllocationFaultTest, RefusedMemoryLeaksNothing)
             disk.Load(StartState::Nothing);
         };
         for (int warm = 0; warm < 3; ++warm) run(RefusedStep::c_noStep);
-        // What a failed run leaves for good grows with each; a cache that fills grows once, and a job of another thread
-        // may not have let go yet.
+        // What a failed run leaves for good grows with each; a cache that fills grows once, a worker that frees jobs
+        // keeps some dozens, and a job of another thread may not have let go yet.
         for (long step = 0;; ++step) {
             run(step);
             if (!RefusedMemory::HasRefused()) break;
             long grown = 2;
-            for (int attempt = 0; attempt < 5 && grown >= 2; ++attempt) {
+            for (int attempt = 0; attempt < 150 && grown >= 2; ++attempt) {
                 long const before = GetLiveBlocks();
                 run(step);
                 run(step);
