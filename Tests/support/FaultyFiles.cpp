@@ -213,8 +213,11 @@ FaultyFiles::FaultyFiles()
 {
     static FileCalls table;
     std::lock_guard const lock(s.mutex);
-    s.next = &GetFileCalls();
-    table = MakeTable(*s.next);
+    // Where nothing changes nothing is written: a thread may still be within a call from the last time.
+    if (FileCalls const* const next = &GetFileCalls(); s.next != next) {
+        s.next = next;
+        table = MakeTable(*next);
+    }
     s.plans.clear();
     s.files.clear();
     std::fill(std::begin(s.counts), std::end(s.counts), 0);
