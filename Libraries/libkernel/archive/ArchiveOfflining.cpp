@@ -301,12 +301,8 @@ void Archive::StopOffline()
 
 void Archive::AbortOfflining()
 {
-    {
-        CriticalSectionScope const lock(m->m_accessLock);
-        ++m->m_accessCount;
-    }
+    ArchiveAccessCountScope const access(*m);
     m->WaitForOffliningToAbort();
-    m->DecrementAccessCount();
 }
 
 void ArchiveImpl::StopAllOfflining()

@@ -42,6 +42,7 @@ String8 ArchiveImpl::FindBackupName(String8 const& path, int maxFailures)
         int const result = TestName(candidate);
         if (result == c_notFound) return candidate;
         if (result == c_readOnlyVolume) return String8();
+        // Failures of every kind count, or a process without handles would search for ever.
         bool const opened = Kernel::File::IsOpened(static_cast<Kernel::File::OpenUnmanagedResult>(result));
         if (!opened && ++failures == maxFailures) return String8();
     }

@@ -529,17 +529,8 @@ void ArchiveVerifier::CompareWithHead(ArchiveImpl& impl, ArchiveLoadData const& 
 
 Result Archive::CloseSessionAndVerifyFileState(ArchiveSessionHandle& handle, String8& report, bool updateTimestamps)
 {
-    // Counted on to the end: a suspension that waits for the session would begin before the check.
-    struct Access
-    {
-        explicit Access(ArchiveImpl& i) : impl(i)
-        {
-            CriticalSectionScope const lock(impl.m_accessLock);
-            ++impl.m_accessCount;
-        }
-        ~Access() { impl.DecrementAccessCount(); }
-        ArchiveImpl& impl;
-    } const access(*m);
+    // To the end: a suspension that waits for the session would begin before the check.
+    ArchiveAccessCountScope const access(*m);
     CriticalSectionScope const sessionLock(m->m_sessionLock);
     CloseSession(handle, updateTimestamps);
     return ArchiveVerifier::VerifyFileState(*m, report);

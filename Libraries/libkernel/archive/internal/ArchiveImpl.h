@@ -378,6 +378,23 @@ private:
     bool const m_open;
 };
 
+/// One access counted for a scope, whether or not the files are open: no suspension begins and no file is closed.
+class ArchiveAccessCountScope
+{
+public:
+    explicit ArchiveAccessCountScope(ArchiveImpl& impl) : m_impl(impl)
+    {
+        CriticalSectionScope const lock(impl.m_accessLock);
+        ++impl.m_accessCount;
+    }
+    ArchiveAccessCountScope(ArchiveAccessCountScope const&) = delete;
+    ArchiveAccessCountScope& operator=(ArchiveAccessCountScope const&) = delete;
+    ~ArchiveAccessCountScope() { m_impl.DecrementAccessCount(); }
+
+private:
+    ArchiveImpl& m_impl;
+};
+
 /// A reader at work: offlining keeps off the disk while one lives.
 class ArchiveReadCounterScope
 {
