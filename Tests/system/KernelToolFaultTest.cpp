@@ -33,11 +33,6 @@ class KernelToolFaultTest : public testing::Test
 protected:
     using Items = std::map<std::string, std::string>;
 
-    void SetUp() override
-    {
-        if (!*KERNELTOOL) GTEST_SKIP() << "the tool is not built";
-    }
-
     /// Two trees with the same names, and a document that holds the first.
     void MakeTrees(size_t count, size_t size)
     {
